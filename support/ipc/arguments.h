@@ -1,0 +1,84 @@
+// Thread safety: plain values; descriptions are constant after start-up.
+//
+// What travels in calls, independent of the transport: typed arguments, and the descriptions of
+// interfaces from which checking, dispatch and introspection are made.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+#include "support/values/value.h"
+
+namespace spacekeep::ipc {
+
+/// An owned file descriptor, closed with its last holder.
+class Descriptor {
+ public:
+  explicit Descriptor(int fd) : fd_(fd) {}
+  ~Descriptor();
+  Descriptor(const Descriptor&) = delete;
+  Descriptor& operator=(const Descriptor&) = delete;
+  [[nodiscard]] int fd() const { return fd_; }
+
+ private:
+  int fd_;
+};
+using SharedDescriptor = std::shared_ptr<Descriptor>;
+
+using OptionalDictionary = std::optional<Dictionary>;
+using OptionalValue = std::optional<Value>;
+using OptionalString = std::optional<std::string>;
+
+/// In the order of ArgumentKind.
+using Argument = std::variant<std::int32_t, std::string, Dictionary, OptionalDictionary,
+                              OptionalValue, OptionalString, SharedDescriptor>;
+using Arguments = std::vector<Argument>;
+
+/// The kind of an argument and its D-Bus signature. "No dictionary" is an empty array of
+/// dictionaries, so that it stays distinct from an empty dictionary.
+enum class ArgumentKind {
+  kInt32,               ///< i
+  kString,              ///< s
+  kDictionary,          ///< a{sv}
+  kOptionalDictionary,  ///< aa{sv}, zero or one element
+  kOptionalValue,       ///< av, zero or one element
+  kOptionalString,      ///< as, zero or one element
+  kDescriptor,          ///< h
+};
+[[nodiscard]] std::string_view signatureOf(ArgumentKind kind);
+
+struct ArgumentDescription {
+  std::string_view name;
+  ArgumentKind kind;
+};
+
+struct MethodDescription {
+  std::string_view name;
+  std::vector<ArgumentDescription> in;
+  std::vector<ArgumentDescription> out;
+};
+
+struct InterfaceDescription {
+  std::string_view name;
+  std::vector<MethodDescription> methods;
+
+  /// Null when there is no such method.
+  [[nodiscard]] const MethodDescription* method(std::string_view method_name) const;
+};
+
+/// The introspection document of one interface, as D-Bus defines it.
+[[nodiscard]] std::string introspectionXml(const InterfaceDescription& interface);
+
+/// The one object path on every connection.
+inline constexpr const char* kObjectPath = "/com/quorvel/Spacekeep";
+
+/// True when the arguments are of the described kinds, in order.
+[[nodiscard]] bool matches(const std::vector<ArgumentDescription>& described,
+                           const Arguments& arguments);
+
+}  // namespace spacekeep::ipc

@@ -1,0 +1,39 @@
+// Thread safety: a bundle of references that is constant after construction; each thing it refers
+// to states its own.
+//
+// Everything the daemon's own code stands on, handed to it as one constructor argument. Production
+// fills it with the Linux implementations of this folder, the simulation with its world.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "support/access/access.h"
+#include "support/files/directory_reader.h"
+#include "support/ipc/served.h"
+#include "support/preferences/preferences_suite.h"
+#include "support/queues/concurrent_queue.h"
+#include "support/services/call_service.h"
+#include "support/statistics/statistics.h"
+#include "support/volumes/volumes.h"
+
+namespace spacekeep {
+
+struct Platform {
+  ConcurrentQueue& global;
+  Volumes& volumes;
+  Access& access;
+  Statistics& statistics;
+  DirectoryReader& files;
+  ipc::Connector& connector;
+  ServiceCaller& services;
+  /// The suite of that name, null when it cannot be opened (the reason is logged).
+  std::function<std::unique_ptr<PreferencesSuite>(const std::string& name)> openPreferencesSuite;
+  /// A listener on the daemon's socket that serves `interface` once it is resumed.
+  std::function<std::unique_ptr<ipc::Listener>(ipc::ServedInterface interface)> makeListener;
+  /// A fresh token, unique within the process. It compares by value.
+  std::function<Value()> createSpacekeepToken;
+};
+
+}  // namespace spacekeep

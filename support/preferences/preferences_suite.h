@@ -1,0 +1,27 @@
+// Thread safety: confined to one queue at a time; the daemon uses its suite on `defaults_queue` only.
+//
+// A named store of property-list values that survives restarts.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "support/values/value.h"
+
+namespace spacekeep {
+
+class PreferencesSuite {
+ public:
+  virtual ~PreferencesSuite() = default;
+
+  /// Writes out what was set since the last call, durably, and picks up what is on disk. Answers
+  /// none on success, else what went wrong in words.
+  [[nodiscard]] virtual std::optional<std::string> synchronize() = 0;
+  [[nodiscard]] virtual std::optional<Value> get(std::string_view key) = 0;
+  /// Seen by get() at once, on disk after synchronize(). None removes the key.
+  virtual void set(std::string_view key, std::optional<Value> value) = 0;
+};
+
+}  // namespace spacekeep

@@ -1,0 +1,79 @@
+// Thread safety: every member may be called from any thread; destroy it only after the last caller.
+//
+// The global concurrent queue. Tasks start in the order in which they were submitted and run side
+// by side on worker threads. The queue keeps `parallelism` workers runnable: while a worker waits
+// inside one of the blocking primitives of this folder it does not count, and another one is
+// started if work is pending. A task that waits for another task therefore never starves it.
+// Idle workers end after a while, so an idle process keeps no wake-ups.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "support/runtime/runtime.h"
+
+namespace spacekeep {
+
+using Task = std::function<void()>;
+
+class ConcurrentQueue {
+ public:
+  struct Options {
+    std::string name = "global";
+    std::size_t parallelism = 4;                     ///< runnable workers kept at most
+    std::uint64_t idle_worker_ns = 10'000'000'000;  ///< a worker idle for longer ends
+  };
+  struct Counts {
+    std::size_t threads;  ///< workers alive
+    std::size_t blocked;  ///< of these, waiting in a blocking primitive
+    std::size_t pending;  ///< tasks not started yet
+    std::size_t peak_threads;
+  };
+
+  explicit ConcurrentQueue(Options options);
+  /// Waits for the tasks submitted so far, and for what they submit in turn, then ends the workers.
+  ~ConcurrentQueue();
+  ConcurrentQueue(const ConcurrentQueue&) = delete;
+  ConcurrentQueue& operator=(const ConcurrentQueue&) = delete;
+
+  void async(Task task);
+  [[nodiscard]] Counts counts() const;
+
+ private:
+  friend class BlockingRegion;
+  struct Worker;
+  void workerBlocks();
+  void workerUnblocks();
+  void startWorkerIfNeeded();
+  void work(Worker* self);
+
+  const Options options_;
+  mutable rt::Mutex mutex_;
+  // Protected by mutex_.
+  rt::CondVar work_available_;
+  rt::CondVar worker_ended_;
+  std::deque<Task> pending_;
+  std::size_t threads_ = 0;
+  std::size_t idle_ = 0;
+  std::size_t blocked_ = 0;
+  std::size_t peak_threads_ = 0;
+  bool stopping_ = false;
+};
+
+/// Marks the calling thread as waiting for the time of its scope. A no-op outside of a worker.
+class BlockingRegion {
+ public:
+  BlockingRegion();
+  ~BlockingRegion();
+  BlockingRegion(const BlockingRegion&) = delete;
+  BlockingRegion& operator=(const BlockingRegion&) = delete;
+
+ private:
+  ConcurrentQueue* queue_;
+};
+
+}  // namespace spacekeep

@@ -1,0 +1,48 @@
+// Thread safety: every member may be called from any thread.
+//
+// Counting semaphores and task groups, the two things that code of the daemon waits on.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+
+#include "support/queues/concurrent_queue.h"
+#include "support/runtime/runtime.h"
+
+namespace spacekeep {
+
+enum class WaitResult { kSignalled, kTimedOut };
+
+class CountingSemaphore {
+ public:
+  explicit CountingSemaphore(std::uint64_t count) : count_(count) {}
+
+  void signal();
+  /// Waits without any time limit.
+  void wait();
+  /// A signal that is already there wins over a deadline that has already passed.
+  [[nodiscard]] WaitResult waitForNs(std::uint64_t duration_ns);
+
+ private:
+  rt::Mutex mutex_;
+  rt::CondVar signalled_;
+  std::uint64_t count_;
+};
+
+/// Counts tasks that have not ended. One group may be waited on by many threads.
+class TaskGroup {
+ public:
+  void enter();
+  void leave();
+  /// enter(), run on `queue`, leave(). The group must live until the task has ended.
+  void async(ConcurrentQueue& queue, Task task);
+  void wait();
+  [[nodiscard]] WaitResult waitForNs(std::uint64_t duration_ns);
+
+ private:
+  rt::Mutex mutex_;
+  rt::CondVar empty_;
+  std::uint64_t entered_ = 0;
+};
+
+}  // namespace spacekeep

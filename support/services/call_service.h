@@ -1,0 +1,48 @@
+// Thread safety: every function may be called from any thread.
+//
+// The act of calling a registered service.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "support/ipc/connection.h"
+#include "support/queues/concurrent_queue.h"
+
+namespace spacekeep {
+
+/// What it takes to reach a service: its ID, and its open connection when it checked in.
+struct ServiceReference {
+  std::string ID;
+  std::shared_ptr<ipc::Connection> connection;  ///< constant once the record is in the registry
+};
+
+class ServiceCaller {
+ public:
+  using Done = std::function<void()>;
+  /// Calls the service through the proxy, and `done` once it has handled the service's reply.
+  using CallHandler = std::function<void(std::shared_ptr<ipc::RemoteProxy>, Done)>;
+  using FailureHandler = std::function<void()>;
+
+  ServiceCaller(ConcurrentQueue& global, ipc::Connector& connector,
+                const ipc::InterfaceDescription& service_interface);
+
+  /// Returns at once. Later, on another thread, runs `call`; runs `failure` instead (or as well,
+  /// once, when the connection fails before `done`) if there is no record, the service cannot be
+  /// reached or the connection fails. Neither ever runs from within this function: callers may
+  /// hold a queue that the failure handler needs.
+  void CallServiceAsync(std::shared_ptr<const ServiceReference> service, CallHandler call,
+                        FailureHandler failure);
+
+  /// The same, but returns only once `call` has been invoked or `failure` has run.
+  void CallService(std::shared_ptr<const ServiceReference> service, CallHandler call,
+                   FailureHandler failure);
+
+ private:
+  ConcurrentQueue& global_;
+  ipc::Connector& connector_;
+  const ipc::InterfaceDescription& interface_;
+};
+
+}  // namespace spacekeep

@@ -1,0 +1,17 @@
+// Thread safety: may be called from any thread.
+//
+// Asks the kernel who is connected to a unix socket.
+#pragma once
+
+#include <memory>
+
+#include "support/access/peer_identity.h"
+
+namespace spacekeep::access {
+
+/// The identity behind a connected unix stream socket (unix(7): SO_PEERCRED, SO_PEERGROUPS,
+/// SO_PEERSEC, SO_PEERPIDFD). Null when the kernel does not even tell the user: such a peer has to
+/// be refused. Whatever else is unclear is left out of the identity. Does not take over `fd`.
+[[nodiscard]] std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd);
+
+}  // namespace spacekeep::access

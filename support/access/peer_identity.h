@@ -1,0 +1,57 @@
+// Thread safety: immutable after construction; may be read from any thread.
+//
+// Who stands at the other end of an accepted connection, as the kernel vouched for it when the
+// connection was accepted. Taken once and never looked up again: a process number may belong to
+// somebody else by the time a call arrives.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "support/ipc/arguments.h"
+
+namespace spacekeep::access {
+
+/// What an identity is made of. An absent member means that the kernel gave no clear answer, and an
+/// absent member matches no rule.
+struct PeerFacts {
+  std::uint32_t uid = 0;
+  std::uint32_t gid = 0;
+  std::vector<std::uint32_t> groups;  ///< supplementary groups
+  std::optional<std::string> label;   ///< security label (SELinux context, AppArmor profile, ...)
+  std::int32_t pid = 0;               ///< for log lines only, never for a decision
+  ipc::SharedDescriptor pidfd;        ///< of the peer's process, null when the kernel has none
+  /// The system service that the process belongs to ("cache.service"). Only set together with
+  /// `pidfd`, because a unit looked up by process number alone could be somebody else's.
+  std::optional<std::string> unit;
+};
+
+class PeerIdentity {
+ public:
+  explicit PeerIdentity(PeerFacts facts);
+  PeerIdentity(const PeerIdentity&) = delete;
+  PeerIdentity& operator=(const PeerIdentity&) = delete;
+
+  [[nodiscard]] std::uint32_t uid() const { return facts_.uid; }
+  [[nodiscard]] std::uint32_t gid() const { return facts_.gid; }
+  [[nodiscard]] const std::vector<std::uint32_t>& groups() const { return facts_.groups; }
+  [[nodiscard]] const std::optional<std::string>& label() const { return facts_.label; }
+  [[nodiscard]] std::int32_t pid() const { return facts_.pid; }
+  [[nodiscard]] const ipc::SharedDescriptor& pidfd() const { return facts_.pidfd; }
+  [[nodiscard]] const std::optional<std::string>& unit() const { return facts_.unit; }
+
+  /// Primary or supplementary.
+  [[nodiscard]] bool isMemberOf(std::uint32_t group) const;
+  /// Different for every identity of this process, and never used again: what caches are keyed by.
+  [[nodiscard]] std::uint64_t serial() const { return serial_; }
+  /// For log lines: "uid 1000 gid 1000 pid 4711 unit cache.service".
+  [[nodiscard]] std::string describe() const;
+
+ private:
+  const PeerFacts facts_;
+  const std::uint64_t serial_;
+};
+
+}  // namespace spacekeep::access

@@ -11,8 +11,8 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
+#include <mutex>
 #include <string>
-#include <vector>
 
 #include "support/runtime/runtime.h"
 
@@ -24,7 +24,7 @@ class ConcurrentQueue {
  public:
   struct Options {
     std::string name = "global";
-    std::size_t parallelism = 4;                     ///< runnable workers kept at most
+    std::size_t parallelism = 4;                    ///< runnable workers kept at most, at least 1
     std::uint64_t idle_worker_ns = 10'000'000'000;  ///< a worker idle for longer ends
   };
   struct Counts {
@@ -40,16 +40,27 @@ class ConcurrentQueue {
   ConcurrentQueue(const ConcurrentQueue&) = delete;
   ConcurrentQueue& operator=(const ConcurrentQueue&) = delete;
 
+  /// Never waits for other tasks. A task that throws ends the process with the queue's name.
   void async(Task task);
   [[nodiscard]] Counts counts() const;
 
  private:
   friend class BlockingRegion;
-  struct Worker;
+  /// A worker as its own thread sees it, found through ThreadSlot::kPoolWorker.
+  struct Worker {
+    ConcurrentQueue* queue;
+    unsigned open_regions = 0;  ///< nested regions count once
+  };
+  class Membership;
+  using Lock = std::unique_lock<rt::Mutex>;
+
   void workerBlocks();
   void workerUnblocks();
-  void startWorkerIfNeeded();
-  void work(Worker* self);
+  void provideWorker();
+  void startWorker();
+  void work(Worker& self);
+  bool takeTask(Lock& lock, Task& task);
+  [[nodiscard]] bool mayTakeTask() const;
 
   const Options options_;
   mutable rt::Mutex mutex_;
@@ -58,13 +69,14 @@ class ConcurrentQueue {
   rt::CondVar worker_ended_;
   std::deque<Task> pending_;
   std::size_t threads_ = 0;
-  std::size_t idle_ = 0;
+  std::size_t idle_ = 0;  ///< alive without a task: waiting for one or about to look for one
   std::size_t blocked_ = 0;
   std::size_t peak_threads_ = 0;
   bool stopping_ = false;
 };
 
 /// Marks the calling thread as waiting for the time of its scope. A no-op outside of a worker.
+/// Opened before any lock is taken, since it takes the queue's own.
 class BlockingRegion {
  public:
   BlockingRegion();
@@ -73,7 +85,7 @@ class BlockingRegion {
   BlockingRegion& operator=(const BlockingRegion&) = delete;
 
  private:
-  ConcurrentQueue* queue_;
+  ConcurrentQueue::Worker* worker_;
 };
 
 }  // namespace spacekeep

@@ -8,6 +8,7 @@
 #include <deque>
 #include <functional>
 #include <memory>
+#include <mutex>
 #include <string>
 
 #include "support/queues/concurrent_queue.h"
@@ -17,11 +18,13 @@ namespace spacekeep {
 
 class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
  public:
-  [[nodiscard]] static std::shared_ptr<SerialQueue> create(std::string label, ConcurrentQueue& global);
+  [[nodiscard]] static std::shared_ptr<SerialQueue> create(std::string label,
+                                                           ConcurrentQueue& global);
 
   [[nodiscard]] const std::string& label() const { return label_; }
 
-  /// Queues the task and returns at once. Queued tasks keep the queue alive.
+  /// Queues the task and returns at once. Queued tasks keep the queue alive, except while it is
+  /// suspended: a suspended queue that nobody refers to can never be resumed and drops its tasks.
   void async(Task task);
 
   /// Runs `task` in its turn, on the calling thread, and returns when it has run. Calling it from a
@@ -35,7 +38,8 @@ class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
   /// True in a task of this queue, also deep inside a sync() on another queue made from it.
   [[nodiscard]] bool isCurrent() const;
 
-  /// Panics with the queue's label and `where` unless isCurrent(). For objects that live on a queue.
+  /// Panics with the queue's label and `where` unless isCurrent(). For objects that live on a
+  /// queue.
   void assertCurrent(const char* where) const;
 
   /// Tasks waiting, the running one not counted.
@@ -48,17 +52,27 @@ class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
   SerialQueue(Key, std::string label, ConcurrentQueue& global);
 
  private:
-  const std::string label_;
-  ConcurrentQueue& global_;
-  mutable rt::Mutex mutex_;
-  // The rest of the state (protected by mutex_) belongs to the implementation.
+  class Frame;
+  class SyncTurn;
   struct Waiter;
   struct Item {
     Task task;                 ///< set for async items
     Waiter* waiter = nullptr;  ///< set for sync items: the thread that takes the turn
   };
+  using Lock = std::unique_lock<rt::Mutex>;
+
+  void startNext();
+  void passTurn();
+  void drain();
+  bool takeTask(Task& task);
+  void run(const Task& task);
+
+  const std::string label_;
+  ConcurrentQueue& global_;
+  mutable rt::Mutex mutex_;
+  // Protected by mutex_.
   std::deque<Item> items_;
-  bool running_ = false;
+  bool running_ = false;  ///< somebody has the turn, or is on the way to take it
   unsigned suspensions_ = 0;
 };
 

@@ -1,6 +1,7 @@
 // Thread safety: every member may be called from any thread.
 //
-// Counting semaphores and task groups, the two things that code of the daemon waits on.
+// Counting semaphores and task groups, the two things that code of the daemon waits on. Whoever has
+// returned from a wait may destroy the object, also while the one that woke it is still returning.
 #pragma once
 
 #include <cstdint>
@@ -24,7 +25,11 @@ class CountingSemaphore {
   [[nodiscard]] WaitResult waitForNs(std::uint64_t duration_ns);
 
  private:
+  [[nodiscard]] WaitResult waitUntil(std::uint64_t deadline_ticks);
+  [[nodiscard]] bool takeOne();
+
   rt::Mutex mutex_;
+  // Protected by mutex_.
   rt::CondVar signalled_;
   std::uint64_t count_;
 };
@@ -40,7 +45,11 @@ class TaskGroup {
   [[nodiscard]] WaitResult waitForNs(std::uint64_t duration_ns);
 
  private:
+  [[nodiscard]] WaitResult waitUntil(std::uint64_t deadline_ticks);
+  [[nodiscard]] bool isEmpty();
+
   rt::Mutex mutex_;
+  // Protected by mutex_.
   rt::CondVar empty_;
   std::uint64_t entered_ = 0;
 };

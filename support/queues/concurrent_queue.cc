@@ -1,0 +1,153 @@
+#include "support/queues/concurrent_queue.h"
+
+#include <algorithm>
+#include <system_error>
+#include <utility>
+
+#include "support/queues/run_task.h"
+
+namespace spacekeep {
+namespace {
+
+template <typename Options>
+Options withAtLeastOneWorker(Options options) {
+  options.parallelism = std::max<std::size_t>(options.parallelism, 1);
+  return options;
+}
+
+}  // namespace
+
+/// Takes a worker off the books when its thread ends, in whichever way.
+class ConcurrentQueue::Membership {
+ public:
+  explicit Membership(ConcurrentQueue& queue) : queue_(queue) {}
+  ~Membership() {
+    const Lock lock(queue_.mutex_);
+    --queue_.threads_;
+    if (is_idle) --queue_.idle_;
+    // Notified under the lock: the destructor that waits for this frees the queue right after.
+    queue_.worker_ended_.notifyAll();
+  }
+  Membership(const Membership&) = delete;
+  Membership& operator=(const Membership&) = delete;
+
+  bool is_idle = true;
+
+ private:
+  ConcurrentQueue& queue_;
+};
+
+ConcurrentQueue::ConcurrentQueue(Options options)
+    : options_(withAtLeastOneWorker(std::move(options))) {}
+
+ConcurrentQueue::~ConcurrentQueue() {
+  const BlockingRegion region;  // The owner may itself run on a worker of another queue.
+  Lock lock(mutex_);
+  stopping_ = true;
+  work_available_.notifyAll();
+  while (threads_ > 0) worker_ended_.wait(mutex_);
+}
+
+void ConcurrentQueue::async(Task task) {
+  const Lock lock(mutex_);
+  pending_.push_back(std::move(task));
+  provideWorker();
+}
+
+ConcurrentQueue::Counts ConcurrentQueue::counts() const {
+  const Lock lock(mutex_);
+  return {.threads = threads_,
+          .blocked = blocked_,
+          .pending = pending_.size(),
+          .peak_threads = peak_threads_};
+}
+
+bool ConcurrentQueue::mayTakeTask() const {
+  const std::size_t running = threads_ - idle_ - blocked_;
+  return !pending_.empty() && running < options_.parallelism;
+}
+
+/// Keeps the promise on which everything here rests: whenever a task may be taken, some idle worker
+/// is on its way to look. Called wherever mayTakeTask() can become true; the worker that takes a
+/// task passes the call on for the next one.
+void ConcurrentQueue::provideWorker() {
+  if (!mayTakeTask()) return;
+  if (idle_ > 0) {
+    work_available_.notifyOne();
+  } else {
+    startWorker();
+  }
+}
+
+void ConcurrentQueue::startWorker() {
+  ++threads_;
+  ++idle_;
+  try {
+    rt::Thread thread(options_.name, [this] {
+      Worker self{this};
+      work(self);
+    });
+    thread.detach();
+  } catch (const std::system_error& error) {
+    --threads_;
+    --idle_;
+    // With other workers alive the task is only late; alone it would never run.
+    if (threads_ == 0) rt::panic((options_.name + " has no worker: " + error.what()).c_str());
+    return;
+  }
+  peak_threads_ = std::max(peak_threads_, threads_);
+}
+
+void ConcurrentQueue::work(Worker& self) {
+  Membership membership(*this);
+  rt::threadSlot(rt::ThreadSlot::kPoolWorker) = &self;
+  Lock lock(mutex_);
+  Task task;
+  while (takeTask(lock, task)) {
+    membership.is_idle = false;
+    --idle_;
+    provideWorker();
+    lock.unlock();
+    runTask(options_.name, task);
+    task = nullptr;  // What it captured goes before the worker counts as idle.
+    lock.lock();
+    ++idle_;
+    membership.is_idle = true;
+    provideWorker();
+  }
+}
+
+/// Waits for a task; false when the worker should end instead.
+bool ConcurrentQueue::takeTask(Lock& lock, Task& task) {
+  const std::uint64_t deadline = rt::deadlineAfterNs(options_.idle_worker_ns);
+  bool in_time = true;
+  while (!mayTakeTask()) {
+    if (!in_time || (stopping_ && pending_.empty())) return false;
+    in_time = work_available_.waitUntil(*lock.mutex(), deadline);
+  }
+  task = std::move(pending_.front());
+  pending_.pop_front();
+  return true;
+}
+
+void ConcurrentQueue::workerBlocks() {
+  const Lock lock(mutex_);
+  ++blocked_;
+  provideWorker();
+}
+
+void ConcurrentQueue::workerUnblocks() {
+  const Lock lock(mutex_);
+  --blocked_;
+}
+
+BlockingRegion::BlockingRegion()
+    : worker_(static_cast<ConcurrentQueue::Worker*>(rt::threadSlot(rt::ThreadSlot::kPoolWorker))) {
+  if (worker_ != nullptr && worker_->open_regions++ == 0) worker_->queue->workerBlocks();
+}
+
+BlockingRegion::~BlockingRegion() {
+  if (worker_ != nullptr && --worker_->open_regions == 0) worker_->queue->workerUnblocks();
+}
+
+}  // namespace spacekeep

@@ -1,0 +1,58 @@
+// Thread safety: InMemoryDisk may be used from any thread; a suite is confined to one queue at a
+// time, as every suite is.
+//
+// Preferences suites whose disk is a map. What was set and not synchronized is lost with the suite.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "support/preferences/preferences_suite.h"
+#include "support/runtime/runtime.h"
+
+namespace spacekeep::sim {
+
+/// What is on disk, by suite name and key.
+class InMemoryDisk {
+ public:
+  using Contents = std::map<std::string, Value, std::less<>>;
+
+  [[nodiscard]] Contents read(const std::string& suite) const;
+  void write(const std::string& suite, Contents contents);
+  [[nodiscard]] std::uint64_t writes() const;
+  /// From now on opening a suite fails, or works again.
+  void refuseToOpen(bool refuse);
+  /// From now on synchronize() fails with this text; empty: works again.
+  void failSynchronize(std::string reason);
+  [[nodiscard]] bool refusesToOpen() const;
+  [[nodiscard]] std::optional<std::string> synchronizeFailure() const;
+
+ private:
+  mutable rt::Mutex mutex_;
+  // Protected by mutex_.
+  std::map<std::string, Contents> suites_;
+  std::uint64_t writes_ = 0;
+  bool refuse_to_open_ = false;
+  std::string failure_;
+};
+
+class InMemoryPreferencesSuite final : public PreferencesSuite {
+ public:
+  InMemoryPreferencesSuite(InMemoryDisk& disk, std::string name);
+
+  [[nodiscard]] std::optional<std::string> synchronize() override;
+  [[nodiscard]] std::optional<Value> get(std::string_view key) override;
+  void set(std::string_view key, std::optional<Value> value) override;
+
+ private:
+  InMemoryDisk& disk_;
+  const std::string name_;
+  InMemoryDisk::Contents known_;
+  std::map<std::string, std::optional<Value>, std::less<>> unwritten_;
+};
+
+}  // namespace spacekeep::sim

@@ -1,0 +1,52 @@
+#include "sim/world/log_capture.h"
+
+#include <atomic>
+#include <span>
+#include <utility>
+
+#include "support/runtime/runtime.h"
+#include "support/values/text.h"
+
+namespace spacekeep::sim {
+namespace {
+
+std::atomic<Trace*> g_trace = nullptr;
+
+LogField fieldOf(const LogArgument& argument) {
+  struct Visitor {
+    LogField operator()(std::int64_t number) const { return number; }
+    LogField operator()(std::uint64_t number) const { return number; }
+    LogField operator()(double number) const { return number; }
+    LogField operator()(std::string_view text) const { return std::string(text); }
+    LogField operator()(const Value* value) const { return textOf(value); }
+    LogField operator()(const Dictionary* dictionary) const { return textOf(*dictionary); }
+  };
+  return std::visit(Visitor{}, argument);
+}
+
+void captureLine(const LogHandle*, std::int32_t level, const char*, const char* format,
+                 std::span<const LogArgument> arguments) {
+  Trace* trace = g_trace.load(std::memory_order_acquire);
+  if (trace == nullptr) return;
+  LogLine line{level, format, {}};
+  line.fields.reserve(arguments.size());
+  for (const LogArgument& argument : arguments) line.fields.push_back(fieldOf(argument));
+  trace->add(std::move(line));
+}
+
+}  // namespace
+
+LogCapture::LogCapture(Trace& trace) : previous_handle_(getLogHandle()) {
+  if (g_trace.exchange(&trace) != nullptr) rt::panic("two log captures in one process");
+  handle_.level = kLogTrace;
+  previous_write_ = gMOLogWrite.exchange(&captureLine);
+  setLogHandle(&handle_);
+}
+
+LogCapture::~LogCapture() {
+  setLogHandle(previous_handle_);
+  gMOLogWrite.store(previous_write_);
+  g_trace.store(nullptr);
+}
+
+}  // namespace spacekeep::sim

@@ -1,0 +1,38 @@
+// Thread safety: SimulatedPeer is immutable; SimulatedAccess holds no state.
+//
+// A client process as the listener sees it: nothing but a name and the entitlements it holds.
+#pragma once
+
+#include <initializer_list>
+#include <set>
+#include <string>
+#include <string_view>
+
+#include "support/access/access.h"
+#include "support/ipc/served.h"
+
+namespace spacekeep::sim {
+
+class SimulatedPeer final : public ipc::PeerConnection {
+ public:
+  SimulatedPeer(std::string name, std::set<std::string, std::less<>> entitlements);
+
+  [[nodiscard]] const std::string& name() const { return name_; }
+  [[nodiscard]] bool holds(std::string_view entitlement) const;
+  /// There is no process behind a simulated peer, so asking for its identity is a panic.
+  [[nodiscard]] const access::PeerIdentity& identity() const override;
+
+ private:
+  const std::string name_;
+  const std::set<std::string, std::less<>> entitlements_;
+};
+
+/// Grants exactly what a SimulatedPeer holds, and nothing to any other connection.
+class SimulatedAccess final : public Access {
+ public:
+  [[nodiscard]] bool connectionIsEntitled(
+      ipc::PeerConnection* connection,
+      std::initializer_list<std::string_view> entitlements) override;
+};
+
+}  // namespace spacekeep::sim

@@ -1,0 +1,135 @@
+#include "sim/world/trace.h"
+
+#include <cstdio>
+#include <mutex>
+#include <utility>
+
+#include "support/logging/log.h"
+#include "support/timebase.h"
+#include "support/values/text.h"
+
+namespace spacekeep::sim {
+namespace {
+
+std::uint64_t ticksToNs(std::uint64_t ticks) {
+  const auto base = rt::timebase();
+  if (!base) return ticks;
+  return ticks * base->numerator / base->denominator;
+}
+
+std::string numberOrNone(const std::optional<std::uint64_t>& number) {
+  return number ? std::to_string(*number) : "(none)";
+}
+
+struct BodyText {
+  std::string operator()(const LogLine& line) const {
+    return "log " + std::to_string(line.level) + "  " + textOfLine(line);
+  }
+  std::string operator()(const ServiceAsked& asked) const {
+    return "asked " + asked.service + " " + asked.member + " #" + std::to_string(asked.call) +
+           " urgency " + std::to_string(asked.urgency) + " amount " + numberOrNone(asked.amount) +
+           (asked.token.empty() ? "" : " token " + asked.token);
+  }
+  std::string operator()(const ServiceAnswered& answered) const {
+    return "answered " + answered.service + " " + answered.member + " #" +
+           std::to_string(answered.call) + " amount " + numberOrNone(answered.amount) + " freed " +
+           std::to_string(answered.freed);
+  }
+  std::string operator()(const ServiceCallFailed& failed) const {
+    return "failed " + failed.service + " " + failed.member + " #" + std::to_string(failed.call);
+  }
+  std::string operator()(const FreeSpaceIs& space) const {
+    return "free " + space.volume + " " + std::to_string(space.free);
+  }
+  std::string operator()(const StatisticSent& sent) const {
+    const bool distribution = sent.kind == StatisticSent::Kind::kDistribution;
+    return "statistic " + sent.key + " " +
+           (distribution ? std::to_string(sent.value) : std::to_string(sent.count));
+  }
+  std::string operator()(const ClientAsked& asked) const {
+    return "client #" + std::to_string(asked.call) + " calls " + asked.member + " " +
+           (asked.info ? textOf(*asked.info) : "");
+  }
+  std::string operator()(const ClientAnswered& answered) const {
+    return "client #" + std::to_string(answered.call) + " gets " +
+           (answered.answer ? textOf(*answered.answer) : "(no dictionary)");
+  }
+  std::string operator()(const WorldChanged& changed) const { return "world " + changed.what; }
+};
+
+}  // namespace
+
+Trace::Trace() : start_ticks_(rt::ticks()) { events_.reserve(512); }
+
+std::uint64_t Trace::nowNs() const { return ticksToNs(rt::ticks() - start_ticks_); }
+
+void Trace::add(EventBody body) {
+  const std::scoped_lock lock(mutex_);
+  events_.push_back({nowNs(), std::move(body)});
+}
+
+std::vector<Event> Trace::events() const {
+  const std::scoped_lock lock(mutex_);
+  return events_;
+}
+
+std::vector<Event> Trace::take() {
+  const std::scoped_lock lock(mutex_);
+  return std::exchange(events_, {});
+}
+
+std::uint64_t Trace::nextCall() {
+  const std::scoped_lock lock(mutex_);
+  return ++last_call_;
+}
+
+std::vector<std::string> Trace::linesWithFormat(std::string_view format) const {
+  std::vector<std::string> lines;
+  for (const Event& event : events()) {
+    const auto* line = std::get_if<LogLine>(&event.body);
+    if (line != nullptr && line->format == format) lines.push_back(textOfLine(*line));
+  }
+  return lines;
+}
+
+std::vector<std::string> Trace::linesOfLevel(std::int32_t level) const {
+  std::vector<std::string> lines;
+  for (const Event& event : events()) {
+    const auto* line = std::get_if<LogLine>(&event.body);
+    if (line != nullptr && line->level == level) lines.push_back(textOfLine(*line));
+  }
+  return lines;
+}
+
+bool Trace::hasLine(std::string_view filled_text) const {
+  for (const Event& event : events()) {
+    const auto* line = std::get_if<LogLine>(&event.body);
+    if (line != nullptr && textOfLine(*line) == filled_text) return true;
+  }
+  return false;
+}
+
+std::string textOfLine(const LogLine& line) {
+  std::vector<LogArgument> arguments;
+  arguments.reserve(line.fields.size());
+  for (const LogField& field : line.fields) {
+    if (const auto* text = std::get_if<std::string>(&field)) {
+      arguments.emplace_back(std::string_view(*text));
+    } else if (const auto* number = std::get_if<std::int64_t>(&field)) {
+      arguments.emplace_back(*number);
+    } else if (const auto* amount = std::get_if<std::uint64_t>(&field)) {
+      arguments.emplace_back(*amount);
+    } else {
+      arguments.emplace_back(std::get<double>(field));
+    }
+  }
+  return formatLogLine(line.format.c_str(), arguments);
+}
+
+std::string textOfEvent(const Event& event) {
+  char time[32];
+  std::snprintf(time, sizeof time, "%12.6f  ", static_cast<double>(event.at_ns) / 1e9);
+  return time + std::visit(BodyText{}, event.body);
+}
+
+}  // namespace spacekeep::sim

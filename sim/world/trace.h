@@ -1,0 +1,127 @@
+// Thread safety: every member of Trace may be called from any thread; events are plain values.
+//
+// What happened in a simulated world, in one order: log lines, calls, answers, free space,
+// statistics. Invariants are judged on this record alone, after the run.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+#include "support/runtime/runtime.h"
+#include "support/values/value.h"
+
+namespace spacekeep::sim {
+
+using LogField = std::variant<std::int64_t, std::uint64_t, double, std::string>;
+
+/// One line that went through gMOLogWrite. `fields` are its arguments, objects in text form; the
+/// first is the name of the reporting operation.
+struct LogLine {
+  std::int32_t level = 0;
+  std::string format;
+  std::vector<LogField> fields;
+};
+
+/// A service received a call. `token` is the text form of the request's "SPACEKEEP_TOKEN".
+struct ServiceAsked {
+  std::string service;
+  std::string member;
+  std::uint64_t call = 0;  ///< names the call, unique within the world
+  std::int32_t urgency = 0;
+  std::optional<std::uint64_t> amount;
+  std::string token;
+};
+
+/// A service sent its answer. `amount` is what it reported, if that was a number.
+struct ServiceAnswered {
+  std::string service;
+  std::string member;
+  std::uint64_t call = 0;
+  std::optional<std::uint64_t> amount;
+  std::uint64_t freed = 0;
+};
+
+/// A call ended without an answer because its connection failed.
+struct ServiceCallFailed {
+  std::string service;
+  std::string member;
+  std::uint64_t call = 0;
+};
+
+/// The free space of a volume, after it changed or was set up.
+struct FreeSpaceIs {
+  std::string volume;
+  std::uint64_t free = 0;
+};
+
+struct StatisticSent {
+  enum class Kind { kDistribution, kReport };
+  Kind kind = Kind::kReport;
+  std::string domain;
+  std::string key;
+  double value = 0;        ///< of a distribution
+  std::int64_t count = 0;  ///< of a report
+};
+
+struct ClientAsked {
+  std::uint64_t call = 0;
+  std::string member;
+  std::optional<Dictionary> info;
+};
+
+struct ClientAnswered {
+  std::uint64_t call = 0;
+  std::string member;
+  std::optional<Dictionary> answer;  ///< the first dictionary of the answer, if it holds one
+};
+
+/// Something that a scenario did to the world, in words.
+struct WorldChanged {
+  std::string what;
+};
+
+using EventBody =
+    std::variant<LogLine, ServiceAsked, ServiceAnswered, ServiceCallFailed, FreeSpaceIs,
+                 StatisticSent, ClientAsked, ClientAnswered, WorldChanged>;
+
+struct Event {
+  std::uint64_t at_ns = 0;  ///< since the trace was made
+  EventBody body;
+};
+
+class Trace {
+ public:
+  Trace();
+
+  void add(EventBody body);
+  [[nodiscard]] std::vector<Event> events() const;
+  /// Moves the record out and leaves an empty one.
+  [[nodiscard]] std::vector<Event> take();
+  /// A number that was not given out before, from 1.
+  [[nodiscard]] std::uint64_t nextCall();
+  [[nodiscard]] std::uint64_t nowNs() const;
+
+  /// The filled texts of the log lines with exactly this format.
+  [[nodiscard]] std::vector<std::string> linesWithFormat(std::string_view format) const;
+  /// The filled texts of all log lines of this level.
+  [[nodiscard]] std::vector<std::string> linesOfLevel(std::int32_t level) const;
+  [[nodiscard]] bool hasLine(std::string_view filled_text) const;
+
+ private:
+  const std::uint64_t start_ticks_;
+  mutable rt::Mutex mutex_;
+  // Protected by mutex_.
+  std::vector<Event> events_;
+  std::uint64_t last_call_ = 0;
+};
+
+/// The line as a person reads it.
+[[nodiscard]] std::string textOfLine(const LogLine& line);
+/// One event on one line, with its time in seconds.
+[[nodiscard]] std::string textOfEvent(const Event& event);
+
+}  // namespace spacekeep::sim

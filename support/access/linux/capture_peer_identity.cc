@@ -1,0 +1,135 @@
+#include "support/access/linux/capture_peer_identity.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdlib>
+#include <string>
+#include <utility>
+
+#include "support/access/cgroup_unit.h"
+
+namespace spacekeep::access {
+namespace {
+
+#ifdef SO_PEERPIDFD
+constexpr int kPeerPidfd = SO_PEERPIDFD;
+#else
+constexpr int kPeerPidfd = 77;  // Linux 6.5 and newer; asm-generic/socket.h, the same on x86 and ARM
+#endif
+
+constexpr std::size_t kMaxGroups = 65536;  // NGROUPS_MAX of the kernel
+constexpr std::size_t kMaxLabel = 4096;
+constexpr std::size_t kMaxProcFile = 16 * 1024;
+
+/// Reads a socket option of variable length into elements of T, at most `limit`. None on failure.
+template <class T>
+std::optional<std::vector<T>> readOption(int fd, int option, std::size_t limit) {
+  std::vector<T> elements(64);
+  for (;;) {
+    auto bytes = static_cast<socklen_t>(elements.size() * sizeof(T));
+    const int result = ::getsockopt(fd, SOL_SOCKET, option, elements.data(), &bytes);
+    const std::size_t needed = bytes / sizeof(T);
+    if (result == 0) {
+      elements.resize(needed < elements.size() ? needed : elements.size());
+      return elements;
+    }
+    // ERANGE comes with the length that would do.
+    if (errno != ERANGE || needed <= elements.size() || needed > limit) return std::nullopt;
+    elements.resize(needed);
+  }
+}
+
+std::vector<std::uint32_t> readGroups(int fd) {
+  static_assert(sizeof(gid_t) == sizeof(std::uint32_t));
+  return readOption<std::uint32_t>(fd, SO_PEERGROUPS, kMaxGroups).value_or(
+      std::vector<std::uint32_t>{});
+}
+
+std::optional<std::string> readLabel(int fd) {
+  const auto bytes = readOption<char>(fd, SO_PEERSEC, kMaxLabel);
+  if (!bytes) return std::nullopt;
+  std::string label(bytes->begin(), bytes->end());
+  // Some security modules count the terminator in, some end the label with a line break.
+  while (!label.empty() && (label.back() == '\0' || label.back() == '\n')) label.pop_back();
+  if (label.empty() || label.find('\0') != std::string::npos) return std::nullopt;
+  return label;
+}
+
+ipc::SharedDescriptor readPidfd(int fd) {
+  int pidfd = -1;
+  socklen_t bytes = sizeof(pidfd);
+  if (::getsockopt(fd, SOL_SOCKET, kPeerPidfd, &pidfd, &bytes) < 0) return nullptr;
+  if (bytes != sizeof(pidfd) || pidfd < 0) return nullptr;
+  return std::make_shared<ipc::Descriptor>(pidfd);
+}
+
+std::optional<std::string> readProcFile(const std::string& path) {
+  const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (fd < 0) return std::nullopt;
+  const ipc::Descriptor file(fd);
+  std::string text;
+  std::array<char, 4096> buffer{};
+  for (;;) {
+    const ssize_t count = ::read(fd, buffer.data(), buffer.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return std::nullopt;
+    if (count == 0) return text;
+    text.append(buffer.data(), static_cast<std::size_t>(count));
+    if (text.size() > kMaxProcFile) return std::nullopt;
+  }
+}
+
+/// The process number behind a pidfd as this /proc shows it. None once the process is gone.
+std::optional<int> pidOf(int pidfd) {
+  const auto text = readProcFile("/proc/self/fdinfo/" + std::to_string(pidfd));
+  if (!text) return std::nullopt;
+  constexpr std::string_view kField = "\nPid:";
+  const std::size_t at = text->find(kField);
+  if (at == std::string::npos) return std::nullopt;
+  const int pid = std::atoi(text->c_str() + at + kField.size());
+  return pid > 0 ? std::optional<int>(pid) : std::nullopt;
+}
+
+bool stillRuns(int pidfd) {
+  pollfd exit_of_process{.fd = pidfd, .events = POLLIN, .revents = 0};
+  return ::poll(&exit_of_process, 1, 0) == 0;
+}
+
+/// The number is read from the pidfd, and the pidfd is asked afterwards whether its process still
+/// runs: only then cannot the number have passed on to another process while /proc was read.
+std::optional<std::string> unitOf(int pidfd) {
+  const auto pid = pidOf(pidfd);
+  if (!pid) return std::nullopt;
+  const auto cgroup = readProcFile("/proc/" + std::to_string(*pid) + "/cgroup");
+  if (!cgroup || !stillRuns(pidfd)) return std::nullopt;
+  return systemUnitFromCgroup(*cgroup);
+}
+
+}  // namespace
+
+std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd) {
+  ucred credentials{};
+  socklen_t bytes = sizeof(credentials);
+  if (::getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &credentials, &bytes) < 0) return nullptr;
+  if (bytes != sizeof(credentials)) return nullptr;
+  // What a socket without a peer answers.
+  if (credentials.uid == static_cast<uid_t>(-1) || credentials.gid == static_cast<gid_t>(-1)) {
+    return nullptr;
+  }
+  PeerFacts facts{.uid = credentials.uid,
+                  .gid = credentials.gid,
+                  .groups = readGroups(fd),
+                  .label = readLabel(fd),
+                  .pid = credentials.pid,
+                  .pidfd = readPidfd(fd),
+                  .unit = std::nullopt};
+  if (facts.pidfd != nullptr) facts.unit = unitOf(facts.pidfd->fd());
+  return std::make_shared<const PeerIdentity>(std::move(facts));
+}
+
+}  // namespace spacekeep::access

@@ -1,0 +1,109 @@
+#include "client/client_adaptor.h"
+
+#include <string_view>
+#include <utility>
+
+#include "support/logging/log.h"
+
+namespace spacekeep {
+namespace {
+
+using ipc::Arguments;
+using ipc::Responder;
+using ipc::ServeMode;
+
+constexpr std::size_t kPurgeLaneWidth = 64;
+constexpr std::size_t kQueryLaneWidth = 64;
+constexpr std::size_t kCancelLaneWidth = 16;
+
+// Each operation: the decoded arguments in, one call, the reply encoded.
+
+SpacekeepClientProtocol::DictionaryReply takingDictionary(Responder responder) {
+  return [responder = std::move(responder)](ipc::OptionalDictionary result) {
+    responder.reply({std::move(result)});
+  };
+}
+
+SpacekeepClientProtocol::EmptyReply takingNothing(Responder responder) {
+  return [responder = std::move(responder)] { responder.reply({}); };
+}
+
+void checkin(SpacekeepClientProtocol& exported, Arguments in, Responder responder) {
+  exported.clientCheckin(std::get<std::string>(std::move(in[0])),
+                         std::get<ipc::SharedDescriptor>(std::move(in[1])),
+                         std::get<Dictionary>(std::move(in[2])),
+                         [responder = std::move(responder)](ipc::OptionalDictionary result,
+                                                            ipc::OptionalString error) {
+                           responder.reply({std::move(result), std::move(error)});
+                         });
+}
+
+void purge(SpacekeepClientProtocol& exported, Arguments in, Responder responder) {
+  exported.clientPurge(std::get<Dictionary>(std::move(in[0])),
+                       takingDictionary(std::move(responder)));
+}
+
+void cancelPurge(SpacekeepClientProtocol& exported, Arguments in, Responder responder) {
+  exported.clientCancelPurge(std::get<Dictionary>(std::move(in[0])),
+                             takingNothing(std::move(responder)));
+}
+
+// The operations behind these members are still to come; the caller is told so.
+void notSupportedYet(SpacekeepClientProtocol&, Arguments, Responder responder) {
+  logProblem("%s request is not supported yet", "clientAdaptor");
+  responder.fail({"org.freedesktop.DBus.Error.NotSupported", "not supported yet"});
+}
+
+using Serve = void (*)(SpacekeepClientProtocol&, Arguments, Responder);
+
+struct Route {
+  std::string_view member;
+  ServeMode mode;
+  std::string_view lane;
+  std::size_t lane_width;
+  Serve serve;
+};
+
+constexpr Route kRoutes[] = {
+    {"clientCheckin", ServeMode::kInOrder, "", 1, checkin},
+    {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, notSupportedYet},
+    {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, notSupportedYet},
+    {"clientPurge", ServeMode::kLane, "purge", kPurgeLaneWidth, purge},
+    {"clientCancelPurge", ServeMode::kLane, "cancel", kCancelLaneWidth, cancelPurge},
+    {"clientSetState", ServeMode::kInOrder, "", 1, notSupportedYet},
+    {"clientGetState", ServeMode::kInOrder, "", 1, notSupportedYet},
+};
+
+void serveCall(const Route& route, const std::weak_ptr<SpacekeepClientProtocol>& weak, Arguments in,
+               Responder responder) {
+  const auto exported = weak.lock();
+  if (!exported) {
+    responder.fail({"org.freedesktop.DBus.Error.UnknownObject", "the daemon object is gone"});
+    return;
+  }
+  const auto* method = spacekeepClientInterface().method(route.member);
+  if (!ipc::matches(method->in, in)) {
+    responder.fail({"org.freedesktop.DBus.Error.InvalidArgs",
+                    std::string(route.member) + ": arguments do not match the signature"});
+    return;
+  }
+  route.serve(*exported, std::move(in), std::move(responder));
+}
+
+}  // namespace
+
+ipc::ServedInterface makeClientAdaptor(std::weak_ptr<SpacekeepClientProtocol> exported) {
+  ipc::ServedInterface served{.description = &spacekeepClientInterface(), .methods = {}};
+  for (const Route& route : kRoutes) {
+    served.methods.push_back({.name = route.member,
+                              .mode = route.mode,
+                              .lane = route.lane,
+                              .lane_width = route.lane_width,
+                              .serve = [&route, exported](Arguments in, Responder responder) {
+                                serveCall(route, exported, std::move(in), std::move(responder));
+                              }});
+  }
+  return served;
+}
+
+}  // namespace spacekeep

@@ -1,0 +1,89 @@
+// From requests to operations: make it, run it on the queue for its kind of work, wait for it.
+#include <utility>
+
+#include "daemon/spacekeep.h"
+#include "operations/info_keys.h"
+#include "purge/purge_operation.h"
+#include "support/logging/log.h"
+#include "support/queues/waiting.h"
+#include "support/runtime/guarded.h"
+
+namespace spacekeep {
+namespace {
+
+/// Where an operation leaves its outcomes while the serving thread waits. Callbacks that outlive
+/// the wait keep it.
+class OutcomeSlot {
+ public:
+  void set(const Dictionary& outcome) {
+    state_.update([&](State& state) {
+      if (state.is_open) state.outcome = outcome;
+    });
+  }
+  /// What comes later is lost.
+  void close() {
+    state_.update([](State& state) { state.is_open = false; });
+  }
+  [[nodiscard]] std::optional<Dictionary> get() const { return state_.get().outcome; }
+
+ private:
+  struct State {
+    bool is_open = true;
+    std::optional<Dictionary> outcome;
+  };
+  rt::Guarded<State> state_;
+};
+
+}  // namespace
+
+std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletion callback) {
+  struct Waiting {
+    TaskGroup group;
+    OutcomeSlot slot;
+  };
+  const auto waiting = std::make_shared<Waiting>();
+  const Value* asked_token = info.dictionary() ? info.dictionary()->find(keys::kToken) : nullptr;
+  const auto operation = makeOperation<SpacekeepPurgeOperation>(platform_, info, mutableServices());
+  const Value token = asked_token ? *asked_token : platform_.createSpacekeepToken();
+
+  waiting->group.enter();
+  purge_queue_->async(
+      [this, self = shared_from_this(), waiting, operation, token, callback = std::move(callback)] {
+        collection_queue_->sync([&] {
+          if (purge_operations_) purge_operations_->set(token, operation);
+        });
+        if (operation) {
+          operation->startOperation([waiting, callback](const Dictionary& outcome) {
+            if (callback) callback(outcome);
+            waiting->slot.set(outcome);
+          });
+        }
+        collection_queue_->sync([&] {
+          if (purge_operations_) purge_operations_->remove(token);
+        });
+        waiting->slot.close();
+        waiting->group.leave();
+      });
+  waiting->group.wait();
+  return waiting->slot.get();
+}
+
+void Spacekeep::cancelPurgeWithToken(const Value* token) {
+  std::shared_ptr<OperationInterface> operation;
+  collection_queue_->sync([&] {
+    if (purge_operations_ && token != nullptr) operation = purge_operations_->find(*token);
+  });
+  if (operation && operation->implementsCancelOperation()) operation->cancelOperation();
+}
+
+std::uint64_t Spacekeep::requestsInFlight(const Array& collection) const {
+  std::uint64_t count = 0;
+  collection_queue_->sync([&] { count = collection.size(); });
+  return count;
+}
+
+void Spacekeep::performPeriodicsWithInfo(const Value& info) {
+  logProblem("%s periodic work is not supported yet: %@", "performPeriodicsWithInfo", info);
+}
+
+}  // namespace spacekeep

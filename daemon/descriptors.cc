@@ -1,0 +1,103 @@
+#include "daemon/descriptors.h"
+
+#include <set>
+#include <utility>
+#include <variant>
+
+#include "daemon/spacekeep.h"
+#include "operations/info_keys.h"
+#include "support/files/directory_reader.h"
+#include "support/logging/log.h"
+#include "support/values/plist.h"
+
+namespace spacekeep {
+namespace {
+
+bool holds(const Value& list, std::string_view text) {
+  const Array* elements = list.array();
+  if (elements == nullptr) return false;
+  for (const Value& element : *elements) {
+    if (element.string() != nullptr && *element.string() == text) return true;
+  }
+  return false;
+}
+
+/// The strings of `list` as a set: sorted and without doubles.
+Array setOf(const Value& list) {
+  std::set<std::string> names;
+  if (const Array* elements = list.array()) {
+    for (const Value& element : *elements) {
+      if (element.string() != nullptr) names.insert(*element.string());
+    }
+  }
+  return Array(names.begin(), names.end());
+}
+
+void setRoles(SKService& service, const Value* roles) {
+  if (roles == nullptr) {
+    service.setDoesPurge(true);
+    return;
+  }
+  service.setDoesPeriodic(holds(*roles, keys::kRolePeriodic));
+  service.setDoesPurge(holds(*roles, keys::kRolePurge));
+}
+
+void logParseFailure(const std::string* reason) {
+  if (reason != nullptr) {
+    logProblem("%s property list parse failed: %@", "scanPlistsAtPath", *reason);
+  } else {
+    const Value* no_error = nullptr;
+    logProblem("%s property list parse failed: %@", "scanPlistsAtPath", no_error);
+  }
+}
+
+/// None when the entry is no document with a dictionary at the top; says so in the log.
+std::optional<Dictionary> readDescriptor(DirectoryReader& files, const std::string& path) {
+  const auto file = files.readWholeFile(path);
+  if (const auto* error = std::get_if<FileError>(&file)) {
+    logParseFailure(&error->reason);
+    return std::nullopt;
+  }
+  const auto document = parsePlist(std::get<std::vector<std::uint8_t>>(file));
+  if (const auto* error = std::get_if<PlistError>(&document)) {
+    logParseFailure(&error->reason);
+    return std::nullopt;
+  }
+  const Dictionary* top = std::get<Value>(document).dictionary();
+  if (top != nullptr) return *top;
+  logParseFailure(nullptr);
+  return std::nullopt;
+}
+
+}  // namespace
+
+void Spacekeep::scanPlistsAtPath(const std::string& path,
+                                 const std::function<void(const Dictionary&)>& execBlock) const {
+  for (const std::string& entry : platform_.files.entriesBelow(path)) {
+    const std::string full_path = path + "/" + entry;
+    logTrace("%s looking at: %@", "scanPlistsAtPath", full_path);
+    if (const auto descriptor = readDescriptor(platform_.files, full_path)) {
+      execBlock(*descriptor);
+    }
+  }
+}
+
+void collectService(const Dictionary& descriptor, DescribedServices& found) {
+  const std::string* service_id = stringAt(descriptor, keys::kServiceId);
+  if (service_id == nullptr) return;
+  auto service = std::make_shared<SKService>(*service_id);
+  setRoles(*service, descriptor.find(keys::kServiceRoles));
+  if (descriptor.contains(keys::kDoNotQuery)) {
+    logTrace("%s marking %@ as DO_NOT_QUERY", "init", *service_id);
+    service->setDoNotQuery(true);
+  }
+  if (const Value* names = descriptor.find(keys::kNotifications)) {
+    const Value desired = setOf(*names);
+    service->setDesiredNotifications(desired);
+    logTrace("%s %@ desiredNotifications: %@", "init", *service_id, desired);
+  }
+  found.services.insert_or_assign(*service_id, std::move(service));
+  found.service_ids.push_back(*service_id);
+}
+
+}  // namespace spacekeep

@@ -1,0 +1,23 @@
+// Thread safety: pure functions over what they are given.
+//
+// Service descriptor files: property-list documents that declare the services of the system.
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "registry/service.h"
+#include "support/values/value.h"
+
+namespace spacekeep {
+
+/// What a scan has found so far. A later descriptor of the same ID wins.
+struct DescribedServices {
+  ServiceMap services;
+  std::vector<std::string> service_ids;  ///< in the order of the scan, an ID once per descriptor
+};
+
+/// Adds the service that `descriptor` declares. One without "SPACEKEEP_ID" is dropped silently.
+void collectService(const Dictionary& descriptor, DescribedServices& found);
+
+}  // namespace spacekeep

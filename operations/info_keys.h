@@ -1,0 +1,42 @@
+// Thread safety: constants.
+//
+// The keys of requests, answers and service replies, and of what services say about themselves.
+#pragma once
+
+namespace spacekeep::keys {
+
+// Requests and answers.
+inline constexpr const char* kVolume = "SPACEKEEP_VOLUME";    ///< string, mount path
+inline constexpr const char* kAmount = "SPACEKEEP_AMOUNT";    ///< number, bytes
+inline constexpr const char* kUrgency = "SPACEKEEP_URGENCY";  ///< number, wins over the limit
+inline constexpr const char* kUrgencyLimit = "SPACEKEEP_URGENCY_LIMIT";  ///< number
+inline constexpr const char* kError = "SPACEKEEP_ERROR";                 ///< string, why refused
+inline constexpr const char* kPurgeTimeout = "SPACEKEEP_PURGE_TIMEOUT";  ///< number, seconds
+inline constexpr const char* kAsync = "SPACEKEEP_ASYNC";  ///< boolean, read by nobody
+inline constexpr const char* kToken = "SPACEKEEP_TOKEN";  ///< names one purge request
+inline constexpr const char* kFinishEarly =
+    "SPACEKEEP_FINISH_EARLY";  ///< boolean, end when reached
+
+// The outcome of a purge.
+inline constexpr const char* kFreespaceBegin = "SPACEKEEP_FREESPACE_BEGIN";  ///< bytes
+inline constexpr const char* kFreespaceEnd = "SPACEKEEP_FREESPACE_END";      ///< bytes
+inline constexpr const char* kAmountReported = "SPACEKEEP_AMOUNT_REPORTED";  ///< bytes
+/// Seconds in the outcome of a purge, nanoseconds in the answer of one service. Both are intended.
+inline constexpr const char* kElapsedTime = "SPACEKEEP_ELAPSED_TIME";
+inline constexpr const char* kOperationCancelled = "SPACEKEEP_OPERATION_CANCELLED";  ///< boolean
+inline constexpr const char* kReportingServices = "SPACEKEEP_REPORTING_SERVICES";  ///< ID to bytes
+inline constexpr const char* kServicesInFlight = "SPACEKEEP_SERVICES_INFLIGHT";    ///< array of IDs
+
+// Client state.
+inline constexpr const char* kCacheEnabled = "SPACEKEEP_CACHE_ENABLED";  ///< boolean
+
+// Service descriptors and check-in.
+inline constexpr const char* kServiceId = "SPACEKEEP_ID";
+inline constexpr const char* kServiceRoles = "SPACEKEEP_SERVICES";
+inline constexpr const char* kDoNotQuery = "SPACEKEEP_DO_NOT_QUERY";
+inline constexpr const char* kNotifications = "SPACEKEEP_NOTIFICATIONS";
+inline constexpr const char* kRolePurge = "PURGE";
+inline constexpr const char* kRolePeriodic = "PERIODIC";
+inline constexpr const char* kAnonymous = "ANON";
+
+}  // namespace spacekeep::keys

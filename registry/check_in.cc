@@ -1,0 +1,102 @@
+// Services that make themselves known at run time, and the lifetime of their connections.
+#include <utility>
+
+#include "client/entitlements.h"
+#include "daemon/spacekeep.h"
+#include "operations/info_keys.h"
+#include "support/logging/log.h"
+
+namespace spacekeep {
+
+struct Spacekeep::CheckIn {
+  std::string service_id;
+  ipc::SharedDescriptor endpoint;
+  Dictionary info;
+  CheckinReply reply;
+};
+
+void Spacekeep::clientCheckin(std::string service_id, ipc::SharedDescriptor endpoint,
+                              Dictionary info, CheckinReply reply) {
+  bool is_declared = false;
+  daemons_queue_->sync([&] { is_declared = daemons_.contains(service_id); });
+  if (is_declared) {
+    reply(std::nullopt, std::nullopt);
+    return;
+  }
+  // A caller without the right is not answered at all: the reply is dropped.
+  if (!connectionIsEntitled(entitlements::kService)) {
+    logProblem("%s Connection is not entitled!", "clientCheckin");
+    return;
+  }
+  CheckIn check_in{std::move(service_id), std::move(endpoint), std::move(info), std::move(reply)};
+  collection_queue_->async([self = shared_from_this(), check_in = std::move(check_in)] {
+    self->registerService(check_in);
+  });
+}
+
+bool Spacekeep::connectionIsEntitled(std::string_view entitlement) const {
+  return platform_.access.connectionIsEntitled(ipc::currentConnection(), {entitlement});
+}
+
+void Spacekeep::registerService(const CheckIn& check_in) {
+  const auto known = services_.find(check_in.service_id);
+  std::shared_ptr<SKService> service;
+  if (known == services_.end()) {
+    service = openService(check_in);
+  } else {
+    logTrace("%s operating on an existing service", "clientCheckin");
+    service = known->second;
+  }
+  service->setDoesPeriodic(truthAt(check_in.info, keys::kRolePeriodic));
+  service->setDoesPurge(truthAt(check_in.info, keys::kRolePurge));
+  const Value* names = check_in.info.find(keys::kNotifications);
+  service->setDesiredNotifications(names ? std::optional<Value>(*names) : std::nullopt);
+  check_in.reply(Dictionary{{keys::kServiceId, check_in.service_id}, {keys::kAnonymous, true}},
+                 std::nullopt);
+}
+
+// Waits until the service answers a ping, and with it everybody who needs collection_queue. A
+// service that stays silent holds the registry; that order is relied upon and kept.
+std::shared_ptr<SKService> Spacekeep::openService(const CheckIn& check_in) {
+  auto service = std::make_shared<SKService>(check_in.service_id);
+  service->setEndpoint(check_in.endpoint);
+  service->connection = platform_.connector.connectionFromEndpoint(check_in.endpoint);
+  services_[check_in.service_id] = service;
+  ipc::Connection& connection = *service->connection;
+  const auto removal = removalHandler(service);
+  connection.setInvalidationHandler([removal] {
+    logTrace("%s invalidationHandler ENTRY", "clientCheckin");
+    removal();
+  });
+  connection.setInterruptionHandler([removal] {
+    logTrace("%s interruptionHandler ENTRY", "clientCheckin");
+    removal();
+  });
+  connection.setRemoteInterface(spacekeepServiceInterface());
+  const auto proxy = connection.remoteProxy([service](const ipc::Error& error) {
+    logTrace("%s failed to get the remote proxy: %@", "clientCheckin",
+             error.name + ": " + error.text);
+    service->connection->invalidate();
+  });
+  connection.resume();
+  static_cast<void>(pingService(SpacekeepServiceProtocol(proxy)));
+  return service;
+}
+
+// The weak reference keeps a handler from keeping a removed record alive, and from removing a newer
+// record under the same ID.
+std::function<void()> Spacekeep::removalHandler(const std::shared_ptr<SKService>& service) {
+  return [weak_daemon = weak_from_this(), service_id = service->ID,
+          weak_service = std::weak_ptr<SKService>(service)] {
+    const auto daemon = weak_daemon.lock();
+    if (!daemon) return;
+    daemon->collection_queue_->async([daemon, service_id, weak_service] {
+      const auto stored = daemon->services_.find(service_id);
+      const auto ended = weak_service.lock();
+      if (!ended || stored == daemon->services_.end() || stored->second != ended) return;
+      daemon->services_.erase(stored);
+    });
+  };
+}
+
+}  // namespace spacekeep

@@ -1,0 +1,110 @@
+// Two thousand purges waiting at once: everybody is served, and the daemon stays small.
+#include <gtest/gtest.h>
+#include <spacekeep/client.h>
+#include <spacekeep/service.h>
+
+#include <atomic>
+#include <fstream>
+#include <memory>
+#include <regex>
+#include <string>
+#include <vector>
+
+#include "support/runtime/runtime.h"
+#include "tests/linux/system/sandbox.h"
+
+namespace spacekeep::system_test {
+namespace {
+
+constexpr int kConnections = 200;
+constexpr int kPurgesEach = 10;
+
+/// Gives one file of a directory for each request, as a cache of equal items would.
+class OneFileEach : public sdk::Service {
+ public:
+  explicit OneFileEach(std::string directory) : directory_(std::move(directory)) {
+    for (int i = 0; i < kConnections * kPurgesEach + 100; ++i) {
+      std::ofstream(pathOf(i)) << std::string(4096, 'x');
+    }
+  }
+  sdk::Answer purge(const sdk::Job&) override {
+    std::remove(pathOf(next_.fetch_add(1)).c_str());
+    return {.amount = 4096, .more = {}};
+  }
+
+ private:
+  [[nodiscard]] std::string pathOf(int number) const { return directory_ + "/" + std::to_string(number); }
+  std::string directory_;
+  std::atomic<int> next_{0};
+};
+
+struct Footprint {
+  long threads = 0;
+  long resident_kib = 0;
+};
+
+Footprint footprintOf(pid_t pid) {
+  std::ifstream status("/proc/" + std::to_string(pid) + "/status");
+  Footprint footprint;
+  const std::regex field("(Threads|VmRSS):\\s+(\\d+).*");
+  for (std::string line; std::getline(status, line);) {
+    std::smatch match;
+    if (!std::regex_match(line, match, field)) continue;
+    (match[1] == "Threads" ? footprint.threads : footprint.resident_kib) = std::stol(match[2]);
+  }
+  return footprint;
+}
+
+TEST(Flood, TwoThousandPurgesFromTwoHundredConnectionsAreAllAnsweredInBoundedSpace) {
+  Sandbox sandbox;
+  sandbox.addVolume("tmp", "tmpfs", 64);
+  sandbox.start();
+  Process daemon = sandbox.startDaemon();
+
+  sdk::CheckInOptions options;
+  options.socket_path = sandbox.socketPath();
+  auto host = sdk::ServiceHost::checkIn("one-file-each",
+                                        std::make_shared<OneFileEach>(sandbox.volume("tmp")), options);
+  ASSERT_TRUE(host);
+  ASSERT_TRUE(sandbox.waitForText("/tmp/daemon.log", "ping got pong"));
+
+  std::vector<sdk::Client> clients;
+  for (int i = 0; i < kConnections; ++i) {
+    auto client = sdk::Client::connect({.socket_path = sandbox.socketPath(), .on_disconnect = {}});
+    ASSERT_TRUE(client) << client.error().text;
+    clients.push_back(std::move(*client));
+  }
+  // One purge that waits out its urgencies holds the purge queue while the others arrive.
+  std::atomic<int> answered{0};
+  std::atomic<int> reached{0};
+  const auto book = [&](const sdk::Reply& reply) {
+    if (reply.outcome && unsignedAt(*reply.outcome, "SPACEKEEP_AMOUNT") >= 4096U) ++reached;
+    ++answered;
+  };
+  sdk::PurgeRequest slow{.volume = "/volumes/tmp", .amount = 0, .urgency = 1, .timeout_seconds = 2,
+                         .token = {}, .finish_early = false};
+  clients[0].purgeAsync(slow, [&](const sdk::Reply&) { ++answered; });
+  sdk::PurgeRequest one{.volume = "/volumes/tmp", .amount = 4096, .urgency = 1, .timeout_seconds = 5,
+                        .token = {}, .finish_early = true};
+  for (int i = 0; i < kPurgesEach; ++i) {
+    for (sdk::Client& client : clients) client.purgeAsync(one, book);
+  }
+  Footprint peak;
+  const int expected = kConnections * kPurgesEach + 1;
+  for (int i = 0; i < 12000 && answered < expected; ++i) {
+    const Footprint now = footprintOf(daemon.pid());
+    peak.threads = std::max(peak.threads, now.threads);
+    peak.resident_kib = std::max(peak.resident_kib, now.resident_kib);
+    rt::sleepNs(10'000'000);
+  }
+  EXPECT_EQ(answered, expected);
+  EXPECT_EQ(reached, expected - 1);
+  EXPECT_LE(peak.threads, 100);
+  EXPECT_LE(peak.resident_kib, 64 * 1024);
+  RecordProperty("peak_threads", std::to_string(peak.threads));
+  RecordProperty("peak_resident_kib", std::to_string(peak.resident_kib));
+  std::printf("peak threads %ld, peak resident %ld KiB\n", peak.threads, peak.resident_kib);
+}
+
+}  // namespace
+}  // namespace spacekeep::system_test

@@ -5,7 +5,6 @@
 #include <utility>
 
 #include "support/runtime/runtime.h"
-#include "support/values/text.h"
 
 namespace spacekeep::sim {
 namespace {
@@ -18,8 +17,12 @@ LogField fieldOf(const LogArgument& argument) {
     LogField operator()(std::uint64_t number) const { return number; }
     LogField operator()(double number) const { return number; }
     LogField operator()(std::string_view text) const { return std::string(text); }
-    LogField operator()(const Value* value) const { return textOf(value); }
-    LogField operator()(const Dictionary* dictionary) const { return textOf(*dictionary); }
+    LogField operator()(const Value* value) const {
+      return value == nullptr ? LogField() : LogField(*value);
+    }
+    LogField operator()(const Dictionary* dictionary) const {
+      return dictionary == nullptr ? LogField() : LogField(Value(*dictionary));
+    }
   };
   return std::visit(Visitor{}, argument);
 }

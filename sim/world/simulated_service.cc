@@ -216,6 +216,8 @@ Dictionary SimulatedService::answerTo(RecordedCall& record, const CallBehaviour&
   } else if (behaviour.answer == Answer::kRepliesWithText) {
     answer.set("SPACEKEEP_AMOUNT", "plenty");
   }
+  // Log lines show answers, so this tells which call a line is about.
+  answer.set(kCallKey, record.call);
   return answer;
 }
 

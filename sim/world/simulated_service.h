@@ -24,6 +24,9 @@ namespace spacekeep::sim {
 
 class SimulatedConnection;
 
+/// Each answer with a dictionary holds its RecordedCall::call under this key.
+inline constexpr const char* kCallKey = "SIMULATED_CALL";
+
 struct RecordedCall {
   enum class State { kOpen, kAnswered, kFailed };
 

@@ -64,8 +64,12 @@ Trace::Trace() : start_ticks_(rt::ticks()) { events_.reserve(512); }
 std::uint64_t Trace::nowNs() const { return ticksToNs(rt::ticks() - start_ticks_); }
 
 void Trace::add(EventBody body) {
+  // Each thread has slots of its own, so their address tells threads apart.
+  const void* thread = &rt::threadSlot(rt::ThreadSlot::kPoolWorker);
   const std::scoped_lock lock(mutex_);
-  events_.push_back({nowNs(), std::move(body)});
+  const unsigned number =
+      threads_.emplace(thread, static_cast<unsigned>(threads_.size())).first->second;
+  events_.push_back({nowNs(), number, std::move(body)});
 }
 
 std::vector<Event> Trace::events() const {
@@ -113,7 +117,11 @@ std::string textOfLine(const LogLine& line) {
   std::vector<LogArgument> arguments;
   arguments.reserve(line.fields.size());
   for (const LogField& field : line.fields) {
-    if (const auto* text = std::get_if<std::string>(&field)) {
+    if (const auto* value = std::get_if<Value>(&field)) {
+      arguments.emplace_back(value);
+    } else if (std::holds_alternative<std::monostate>(field)) {
+      arguments.emplace_back(static_cast<const Value*>(nullptr));
+    } else if (const auto* text = std::get_if<std::string>(&field)) {
       arguments.emplace_back(std::string_view(*text));
     } else if (const auto* number = std::get_if<std::int64_t>(&field)) {
       arguments.emplace_back(*number);

@@ -5,6 +5,7 @@
 #pragma once
 
 #include <cstdint>
+#include <map>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -16,10 +17,12 @@
 
 namespace spacekeep::sim {
 
-using LogField = std::variant<std::int64_t, std::uint64_t, double, std::string>;
+/// An argument of a log line; a null object is std::monostate.
+using LogField =
+    std::variant<std::monostate, std::int64_t, std::uint64_t, double, std::string, Value>;
 
-/// One line that went through gMOLogWrite. `fields` are its arguments, objects in text form; the
-/// first is the name of the reporting operation.
+/// One line that went through gMOLogWrite. The first of `fields` is the name of the reporting
+/// operation.
 struct LogLine {
   std::int32_t level = 0;
   std::string format;
@@ -90,6 +93,7 @@ using EventBody =
 
 struct Event {
   std::uint64_t at_ns = 0;  ///< since the trace was made
+  unsigned thread = 0;      ///< which thread it happened on; a number is reused after its thread
   EventBody body;
 };
 
@@ -116,6 +120,7 @@ class Trace {
   mutable rt::Mutex mutex_;
   // Protected by mutex_.
   std::vector<Event> events_;
+  std::map<const void*, unsigned> threads_;
   std::uint64_t last_call_ = 0;
 };
 

@@ -5,6 +5,7 @@
 
 #include "registry/service_protocol.h"
 #include "support/access/entitlements.h"
+#include "support/timebase.h"
 
 namespace spacekeep::sim {
 namespace {
@@ -32,13 +33,17 @@ World::World(Options options)
       connector_(*global_),
       listener_(*global_, trace_),
       events_(*global_),
-      caller_(*global_, connector_, spacekeepServiceInterface()) {
+      caller_(*global_, connector_, spacekeepServiceInterface()),
+      platform_(makePlatform()) {
+  if (const auto base = rt::timebase()) {
+    gTimebaseConversion = static_cast<double>(base->numerator) / base->denominator;
+  }
   files_.addDirectory(kDescriptorDirectory);
 }
 
 World::~World() { shutDown(); }
 
-Platform World::platform() {
+Platform World::makePlatform() {
   return Platform{
       .global = *global_,
       .volumes = volumes_,

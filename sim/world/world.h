@@ -6,9 +6,10 @@
 //   World world;
 //   world.volumes().add("/", 1000, 100);
 //   auto cache = world.declareService("cache", ownsBytes("/", 500), {{"PURGE", true}});
-//   Spacekeep daemon(world.platform());
-//   EXPECT_EQ(world.volumes().freeBytes("/"), ...);
-//   world.shutDown();  // before the daemon goes
+//   auto daemon = Spacekeep::create(world.platform());
+//   auto answer = world.call(world.client("c", {"PURGE_ENTITLEMENT"}), "clientPurge",
+//   {...})->wait(); EXPECT_EQ(world.volumes().freeBytes("/"), ...); world.shutDown();  // before
+//   the daemon goes
 #pragma once
 
 #include <cstdint>
@@ -48,7 +49,7 @@ class World {
   World& operator=(const World&) = delete;
 
   /// The daemon's view of this world. The members live as long as the world.
-  [[nodiscard]] Platform platform();
+  [[nodiscard]] Platform& platform() { return platform_; }
 
   [[nodiscard]] ConcurrentQueue& global() { return *global_; }
   [[nodiscard]] Trace& trace() { return trace_; }
@@ -98,7 +99,8 @@ class World {
   void shutDown();
 
  private:
-  std::unique_ptr<PreferencesSuite> openSuite(const std::string& name);
+  [[nodiscard]] Platform makePlatform();
+  [[nodiscard]] std::unique_ptr<PreferencesSuite> openSuite(const std::string& name);
 
   Trace trace_;
   LogCapture log_capture_;
@@ -114,6 +116,7 @@ class World {
   SimulatedEventSources events_;
   CountingKeepAlive keep_alive_;
   ServiceCaller caller_;
+  Platform platform_;
   mutable rt::Mutex mutex_;
   // Protected by mutex_.
   std::vector<std::shared_ptr<SimulatedService>> services_;

@@ -39,9 +39,11 @@ enum class ScheduleEnd {
 struct ScheduleReport {
   ScheduleEnd end = ScheduleEnd::kFinished;
   std::uint64_t steps = 0;
-  std::uint64_t trace_hash = 0;      ///< equal for equal runs
-  std::uint64_t virtual_ns = 0;      ///< virtual time used
-  std::vector<std::string> blocked;  ///< name of each fiber that still waited at the end, and for what
+  std::uint64_t trace_hash = 0;  ///< equal for equal runs
+  std::uint64_t virtual_ns = 0;  ///< virtual time when `body` returned, or when nothing went on
+  /// Each fiber that was left at the end as "name#number: what it waits for", and each that could
+  /// not be unwound.
+  std::vector<std::string> blocked;
 };
 
 /// Runs one schedule. After `body` has returned (or cannot), the fibers that remain are run until

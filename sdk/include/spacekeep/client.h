@@ -1,5 +1,4 @@
-// Thread safety: every member of Client may be called from any thread, also from its callbacks,
-// with one exception: a blocking call must not be made from a callback.
+// Thread safety: every member of Client may be called from any thread, also from its own handlers.
 //
 // To be a client of the Spacekeep daemon: ask for space, ask how much could be had, read and set
 // the daemon's client state. One Client is one connection; requests on it run side by side.
@@ -8,7 +7,7 @@
 #include <spacekeep/error.h>
 #include <spacekeep/value.h>
 
-#include <chrono>
+#include <chrono>  // tidy-allow: durations only, no clock is read
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -27,12 +26,14 @@ struct ClientOptions {
 
 /// A request to free space. What is left empty is not sent, and the daemon's default holds.
 struct PurgeRequest {
-  std::string volume;                            ///< mount point of a local volume
-  std::uint64_t amount = 0;                      ///< bytes to free
-  std::optional<int> urgency;                    ///< highest urgency used, 1 to 4; default 3
-  std::optional<std::uint64_t> timeout_seconds;  ///< wait per urgency; default 2 x urgency, at most 300
-  std::optional<Value> token;                    ///< names the purge in a cancel request
-  std::optional<bool> finish_early;  ///< end once the amount is reached and nobody is being waited for
+  std::string volume;          ///< mount point of a local volume
+  std::uint64_t amount = 0;    ///< bytes to free
+  std::optional<int> urgency;  ///< highest urgency used, 1 to 4; default 3
+  std::optional<std::uint64_t>
+      timeout_seconds;         ///< wait per urgency; default 2 x urgency, at most 300
+  std::optional<Value> token;  ///< names the purge in a cancel request
+  std::optional<bool>
+      finish_early;  ///< end once the amount is reached and nobody is being waited for
 
   /// The request dictionary as the daemon reads it.
   [[nodiscard]] Dictionary info() const;
@@ -74,14 +75,14 @@ class Client {
   using StatusHandler = std::function<void(Status)>;
   using StateHandler = std::function<void(StateReply)>;
 
-  /// Connects, which includes the mutual authentication. Rights are looked at by the daemon when the
-  /// connection opens ("CLIENT_ENTITLEMENT") and again for each operation.
+  /// Opens a connection. The daemon looks at rights when it accepts ("CLIENT_ENTITLEMENT") and
+  /// again for each operation, so a process without any learns it from its first call: kNotAllowed.
   [[nodiscard]] static Result<Client> connect(ClientOptions options = {});
 
   Client(Client&&) noexcept;
   Client& operator=(Client&&) noexcept;
-  /// Ends the connection. Handlers of pending calls run with kDisconnected before this returns; from
-  /// one of its own handlers, the Client must not be destroyed.
+  /// Ends the connection. Handlers of pending calls run with kDisconnected before this returns;
+  /// from one of its own handlers, the Client must not be destroyed.
   ~Client();
 
   [[nodiscard]] bool connected() const;

@@ -12,11 +12,11 @@
 namespace spacekeep::sdk {
 
 enum class ErrorKind {
-  kUnreachable,      ///< nobody listens at the socket, or the path may not be used
-  kNotAllowed,       ///< the peer at the other end refuses this process (or is not who it should be)
-  kDisconnected,     ///< the connection ended before the answer came
-  kTimedOut,         ///< the caller's own deadline passed; the work may go on at the other end
-  kNotSupported,     ///< the daemon does not offer this operation
+  kUnreachable,   ///< nobody listens at the socket, or the path may not be used
+  kNotAllowed,    ///< the peer at the other end refuses this process (or is not who it should be)
+  kDisconnected,  ///< the connection ended before the answer came
+  kTimedOut,      ///< the caller's own deadline passed; the work may go on at the other end
+  kNotSupported,  ///< the daemon does not offer this operation
   kInvalidArgument,  ///< the request cannot be sent as it is; nothing was sent
   kFailed,           ///< the other end, or the operating system, reported a failure of another kind
 };

@@ -11,7 +11,7 @@
 
 #include <sys/types.h>
 
-#include <chrono>
+#include <chrono>  // tidy-allow: durations only, no clock is read
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -41,11 +41,11 @@ class Cancellation {
 
 /// One request to a service.
 struct Job {
-  std::string volume;        ///< the mount point that the request concerns; empty when it names none
-  std::uint64_t amount = 0;  ///< purge: the bytes asked for. Giving more than this costs cached data
-                             ///< for nothing.
-  int urgency = 0;           ///< 1, give what nobody will miss, to 4, give all that can be given
-  Dictionary info;           ///< the whole request
+  std::string volume;  ///< the mount point that the request concerns; empty when it names none
+  std::uint64_t amount = 0;  ///< purge: the bytes asked for. Giving more than this costs cached
+                             ///< data for nothing.
+  int urgency = 0;  ///< 1, give what nobody will miss, to 4, give all that can be given
+  Dictionary info;  ///< the whole request
   Cancellation cancellation;
 };
 
@@ -61,7 +61,8 @@ class Service {
  public:
   virtual ~Service() = default;
 
-  /// How much could be freed on job.volume at job.urgency. Be quick: the daemon waits a few seconds.
+  /// How much could be freed on job.volume at job.urgency. Be quick: the daemon waits a few
+  /// seconds.
   [[nodiscard]] virtual Answer purgeable(const Job& job);
   /// Free about job.amount bytes on job.volume. Look at job.cancellation between files, and answer
   /// what was freed so far when cancelled.
@@ -112,12 +113,15 @@ struct CheckInOptions : ServiceOptions {
   bool does_purge = true;
   bool does_periodic = false;
   std::vector<std::string> notifications;  ///< names of the notifications wanted
+  /// After this long without an answer to the check-in, on_status says so. The host goes on
+  /// waiting, because the daemon may still be about to ping.
+  std::chrono::milliseconds patience{10'000};
 };
 
 /// For a service that a descriptor file declares and the service manager starts.
 struct SocketOptions : ServiceOptions {
-  /// A listening unix stream socket, which becomes the host's. None: the one that the service manager
-  /// handed over (sd_listen_fds(3): LISTEN_PID, LISTEN_FDS).
+  /// A listening unix stream socket, which becomes the host's. None: the one that the service
+  /// manager handed over (sd_listen_fds(3): LISTEN_PID, LISTEN_FDS).
   std::optional<int> listening_fd;
   /// Besides root and the process's own user.
   std::optional<uid_t> allowed_uid;
@@ -128,8 +132,8 @@ struct SocketOptions : ServiceOptions {
 /// Serves one Service until it is stopped.
 class ServiceHost {
  public:
-  /// Checks in under `id`, and again whenever the daemon went away, with a growing, randomised pause
-  /// of 0.1 to 30 seconds. Returns at once; fails only for an empty ID or a missing service.
+  /// Checks in under `id`, and again whenever the daemon went away, with a growing, randomised
+  /// pause of 0.1 to 30 seconds. Returns at once; fails only for an empty ID or a missing service.
   [[nodiscard]] static Result<ServiceHost> checkIn(std::string id, std::shared_ptr<Service> service,
                                                    CheckInOptions options = {});
   /// Serves at a listening socket. Fails when there is no usable socket.
@@ -138,19 +142,20 @@ class ServiceHost {
 
   ServiceHost(ServiceHost&&) noexcept;
   ServiceHost& operator=(ServiceHost&&) noexcept;
-  /// stop(), then waits for the handlers that still run.
+  /// stop(), then waits for the handlers that still run. Not from a handler.
   ~ServiceHost();
 
   [[nodiscard]] HostStatus status() const;
-  /// Cancels what runs and ends the serving. Safe to repeat. Not from a handler.
+  /// Cancels what runs and lets the serving end; returns at once. Safe to repeat, and from
+  /// handlers.
   void stop();
   /// Until the state is kStopped. What a service's main() does after starting.
   void waitUntilStopped();
 
  private:
   class Impl;
-  explicit ServiceHost(std::shared_ptr<Impl> impl);
-  std::shared_ptr<Impl> impl_;
+  explicit ServiceHost(std::unique_ptr<Impl> impl);
+  std::unique_ptr<Impl> impl_;
 };
 
 }  // namespace spacekeep::sdk

@@ -1,0 +1,149 @@
+#include "sdk/client_link.h"
+
+#include <fmt/core.h>
+
+#include <algorithm>
+#include <mutex>
+#include <optional>
+#include <utility>
+
+#include "client/client_protocol.h"
+#include "sdk/deadline_timer.h"
+#include "sdk/failure.h"
+#include "support/ipc/linux/connector.h"
+
+namespace spacekeep::sdk {
+
+/// What the link shares with handlers that may run while it is being destroyed.
+struct ClientLink::Shared {
+  explicit Shared(ClientOptions given) : options(std::move(given)) {}
+
+  const ClientOptions options;
+  TaskGroup pending;  ///< calls, and the disconnect handler, that have not run to their end
+  mutable rt::Mutex mutex;
+  // Protected by mutex.
+  bool answered = false;  ///< the daemon has answered a call of this connection
+  bool ended = false;
+  bool turned_away = false;  ///< ended by a daemon that lives and has never answered anything
+  bool closing = false;      ///< by this side
+
+  void noteAnswer() {
+    const std::scoped_lock lock(mutex);
+    answered = true;
+  }
+
+  void noteEnd(bool daemon_lives) {
+    {
+      const std::scoped_lock lock(mutex);
+      if (ended || closing) return;
+      ended = true;
+      turned_away = daemon_lives && !answered;
+    }
+    if (options.on_disconnect) options.on_disconnect();
+  }
+
+  /// The daemon turns a peer away by closing the connection, which by itself looks like any other
+  /// disconnect. A person needs to hear of the missing right.
+  [[nodiscard]] Error explain(Error error) const {
+    const std::scoped_lock lock(mutex);
+    if (error.kind != ErrorKind::kDisconnected || answered || closing) return error;
+    return {turned_away ? ErrorKind::kNotAllowed : ErrorKind::kDisconnected,
+            fmt::format("the daemon at {} closed the connection without an answer; it does so when "
+                        "this user does not hold \"CLIENT_ENTITLEMENT\", and when it is stopped",
+                        options.socket_path)};
+  }
+};
+
+class ClientLink::Call {
+ public:
+  Call(std::shared_ptr<Shared> shared, EndHandler on_end)
+      : shared_(std::move(shared)), on_end_(std::move(on_end)) {
+    shared_->pending.enter();
+  }
+
+  void setTimer(std::unique_ptr<DeadlineTimer> timer) {
+    const std::scoped_lock lock(mutex_);
+    if (on_end_) timer_ = std::move(timer);
+  }
+
+  /// The first end counts. Runs the program's handler, so never on the IPC thread.
+  void end(End how) {
+    EndHandler on_end;
+    std::unique_ptr<DeadlineTimer> timer;
+    {
+      const std::scoped_lock lock(mutex_);
+      on_end = std::exchange(on_end_, nullptr);
+      timer = std::move(timer_);
+    }
+    if (!on_end) return;
+    timer.reset();
+    on_end(std::move(how));
+    on_end = nullptr;  // what the handler holds is gone before the link may be
+    shared_->pending.leave();
+  }
+
+ private:
+  const std::shared_ptr<Shared> shared_;
+  rt::Mutex mutex_;
+  // Protected by mutex_.
+  EndHandler on_end_;
+  std::unique_ptr<DeadlineTimer> timer_;
+};
+
+ClientLink::ClientLink(ClientOptions options)
+    : shared_(std::make_shared<Shared>(std::move(options))) {}
+
+Result<std::unique_ptr<ClientLink>> ClientLink::open(ClientOptions options) {
+  std::unique_ptr<ClientLink> link(new ClientLink(std::move(options)));
+  const std::string& path = link->shared_->options.socket_path;
+  std::string why;
+  link->connection_ = ipc::connectToPath(link->engine_.loop, link->engine_.queue, path, why);
+  if (!link->connection_) {
+    return Error{ErrorKind::kUnreachable,
+                 fmt::format("cannot connect to the daemon at {}: {}", path, why)};
+  }
+  link->connection_->setRemoteInterface(spacekeepClientInterface());
+  link->connection_->setInvalidationHandler([shared = link->shared_] { shared->noteEnd(true); });
+  link->connection_->setInterruptionHandler([shared = link->shared_] { shared->noteEnd(false); });
+  link->connection_->resume();
+  return link;
+}
+
+ClientLink::~ClientLink() {
+  if (!connection_) return;
+  {
+    const std::scoped_lock lock(shared_->mutex);
+    shared_->closing = true;
+  }
+  connection_->invalidate();
+  shared_->pending.wait();
+}
+
+bool ClientLink::connected() const {
+  const std::scoped_lock lock(shared_->mutex);
+  return !shared_->ended && !shared_->closing;
+}
+
+void ClientLink::call(const std::string& member, ipc::Arguments arguments, Deadline deadline,
+                      EndHandler on_end) {
+  const auto call = std::make_shared<Call>(shared_, std::move(on_end));
+  const auto proxy =
+      connection_->remoteProxy([call, member, shared = shared_](const ipc::Error& e) {
+        call->end(shared->explain(failureOf(e, member)));
+      });
+  proxy->call(member, std::move(arguments), [call, shared = shared_](ipc::Arguments out) {
+    shared->noteAnswer();
+    call->end(std::move(out));
+  });
+  if (!deadline) return;
+  const auto wait_ns = static_cast<std::uint64_t>(std::max<std::int64_t>(
+      0, std::chrono::duration_cast<std::chrono::nanoseconds>(*deadline).count()));
+  call->setTimer(std::make_unique<DeadlineTimer>(engine_.loop, wait_ns, [call, member, this] {
+    engine_.queue.async([call, member] {
+      call->end(
+          Error{ErrorKind::kTimedOut, fmt::format("no answer to {} before the deadline", member)});
+    });
+  }));
+}
+
+}  // namespace spacekeep::sdk

@@ -1,0 +1,205 @@
+#include "services/cachedir/engine/cache_cleaner.h"
+
+#include <limits>
+#include <map>
+
+#include "services/cachedir/engine/ages.h"
+#include "services/cachedir/engine/elapsed.h"
+#include "services/cachedir/engine/link_groups.h"
+#include "services/cachedir/engine/remover.h"
+#include "services/cachedir/engine/space_return.h"
+#include "services/cachedir/engine/tree_walk.h"
+#include "support/runtime/guarded.h"
+
+namespace spacekeep::cachedir {
+namespace {
+
+// Requests follow each other closely when the daemon asks a willing service again.
+constexpr std::uint64_t kScanKeptNs = 1000 * kNsPerMs;
+
+}  // namespace
+
+/// One request, from its roots to its result.
+class CacheCleaner::Run {
+ public:
+  Run(CacheCleaner& cleaner, const FreeRequest& request, const TakenVisitor& taken,
+      const CancelToken& cancel)
+      : request_(request), taken_(taken), cancel_(cancel), bounds_(cleaner.bounds_),
+        open_files_(cleaner.open_files_), opened_(openRoots(cleaner.rules_, request.volume)) {}
+
+  FreeResult result() {
+    result_.problems = opened_.problems;
+    if (!opened_.roots.empty()) work();
+    result_.cancelled = cancel_.cancelled();
+    return std::move(result_);
+  }
+
+ private:
+  void work();
+  bool pass(FileSource& source, Remover& remover, bool first);
+  bool collect(FileSource& source, OldestFiles& oldest, bool first);
+  void removeOldest(Remover& remover, const std::vector<Candidate>& candidates);
+  void book(const Candidate& candidate, const Removal& removal);
+  [[nodiscard]] bool satisfied() const {
+    return !request_.periodic && result_.bytes >= request_.amount;
+  }
+
+  const FreeRequest& request_;
+  const TakenVisitor& taken_;
+  const CancelToken& cancel_;
+  const Bounds bounds_;
+  OpenFiles& open_files_;
+  const OpenedRoots opened_;
+  std::vector<std::int64_t> latest_ns_;            // by root: used later than this stays
+  std::map<std::uint64_t, SpaceReturn> returns_;  // by file system
+  Turn done_;                                     // everything up to here has been dealt with
+  FreeResult result_;
+};
+
+void CacheCleaner::Run::work() {
+  const std::int64_t now_ns = rt::wallClockNs();
+  for (const Root& root : opened_.roots) {
+    latest_ns_.push_back(request_.periodic ? latestForPeriodic(*root.rule, now_ns)
+                                           : latestForUrgency(*root.rule, request_.urgency, now_ns));
+    if (!request_.dry_run) returns_.try_emplace(root.file_system, root.fd.get());
+  }
+  if (!open_files_.ensure(opened_.roots, kScanKeptNs, cancel_)) {
+    if (!cancel_.cancelled()) {
+      result_.problems.push_back("/proc: cannot tell which files are open; nothing was freed");
+    }
+    return;
+  }
+  TreeWalk walk(opened_.roots);
+  Remover remover(opened_.roots, open_files_, {request_.dry_run, request_.periodic});
+  for (bool first = true; pass(walk, remover, first); first = false) {
+  }
+  for (auto& [file_system, space] : returns_) space.wait(cancel_);
+}
+
+/// Whether another pass could find more.
+bool CacheCleaner::Run::pass(FileSource& source, Remover& remover, bool first) {
+  OldestFiles oldest(bounds_.max_files, bounds_.max_text_bytes);
+  if (!collect(source, oldest, first)) return false;
+  const bool more = oldest.overflowed();
+  removeOldest(remover, oldest.takeInOrder());
+  return more && !satisfied() && !cancel_.cancelled();
+}
+
+bool CacheCleaner::Run::collect(FileSource& source, OldestFiles& oldest, bool first) {
+  LinkGroups groups;
+  Tally repeated;  // later passes meet the same obstacles again
+  const auto visit = [&](const FoundFile& found) {
+    if (found.used_ns > latest_ns_[found.folder->root]) return;
+    if (found.bytes == 0 && !request_.periodic) return;
+    if (found.links > 1) {
+      auto whole = groups.offer(found, 0);
+      if (whole && whole->turn > done_) oldest.offer(std::move(*whole));
+      return;
+    }
+    const Turn turn{found.used_ns, found.inode};
+    if (turn > done_ && oldest.wants(turn)) oldest.offer(candidateOf(found, 0));
+  };
+  const bool whole = source.forEachFile(visit, cancel_, first ? result_.left : repeated);
+  if (first && whole) {
+    for (std::uint64_t i = 0; i < groups.incomplete(); ++i) result_.left.add(Left::kLinked);
+  }
+  return whole;
+}
+
+void CacheCleaner::Run::removeOldest(Remover& remover, const std::vector<Candidate>& candidates) {
+  for (const Candidate& candidate : candidates) {
+    if (satisfied() || cancel_.cancelled()) return;
+    done_ = candidate.turn;
+    const auto outcome = remover.take(candidate, cancel_);
+    if (const auto* why = std::get_if<Left>(&outcome)) {
+      result_.left.add(*why);
+    } else {
+      book(candidate, std::get<Removal>(outcome));
+    }
+  }
+}
+
+void CacheCleaner::Run::book(const Candidate& candidate, const Removal& removal) {
+  const Root& root = opened_.roots[candidate.first.folder->root];
+  result_.bytes += removal.bytes;
+  result_.directories += removal.directories;
+  ++result_.files;
+  const auto space = returns_.find(root.file_system);
+  if (space != returns_.end()) space->second.add(removal.bytes);
+  if (taken_) {
+    taken_({root.rule->path + "/" + joined(candidate.first.folder->path, candidate.first.name),
+            removal.bytes});
+  }
+}
+
+/// Waits for its turn. False when cancelled before it came.
+bool CacheCleaner::begin(const CancelToken& cancel) {
+  std::unique_lock lock(mutex_);
+  // The caller's own question cannot wake us, so it is asked now and then.
+  while (busy_ && !cancel.cancelled()) {
+    changed_.waitUntil(mutex_, rt::deadlineAfterNs(20 * kNsPerMs));
+  }
+  if (cancel.cancelled()) return false;
+  busy_ = true;
+  return true;
+}
+
+void CacheCleaner::end() {
+  const std::scoped_lock lock(mutex_);
+  busy_ = false;
+  changed_.notifyAll();
+}
+
+void CacheCleaner::cancel() {
+  const std::scoped_lock lock(mutex_);
+  cancels_.fetch_add(1, std::memory_order_acq_rel);
+  changed_.notifyAll();
+}
+
+FreeResult CacheCleaner::free(const FreeRequest& request, const TakenVisitor& taken) {
+  const bool sensible = request.amount > 0 && request.urgency >= 1 && request.urgency <= kUrgencies;
+  if (!request.periodic && !sensible) return {};
+  const CancelToken cancel(cancels_, request.cancelled);
+  if (!begin(cancel)) {
+    FreeResult nothing;
+    nothing.cancelled = true;
+    return nothing;
+  }
+  FreeResult result = Run(*this, request, taken, cancel).result();
+  end();
+  return result;
+}
+
+Estimate CacheCleaner::estimate(const std::optional<std::string>& volume,
+                                const CancelToken& cancel) const {
+  const OpenedRoots opened = openRoots(rules_, volume);
+  Estimate sum;
+  sum.problems = opened.problems;
+  OpenFiles open_files;
+  if (opened.roots.empty() || !open_files.scan(opened.roots, cancel)) {
+    sum.cancelled = cancel.cancelled();
+    return sum;
+  }
+  const std::int64_t now_ns = rt::wallClockNs();
+  const auto count = [&](const Inode& inode, std::size_t root, std::uint64_t bytes, int mildest) {
+    if (mildest > kUrgencies || open_files.holds(inode, opened.roots[root].file_system)) return;
+    for (auto i = static_cast<std::size_t>(mildest - 1); i < kUrgencies; ++i) {
+      sum.bytes[i] += bytes;
+      ++sum.files[i];
+    }
+  };
+  LinkGroups groups;
+  Tally left;
+  const auto visit = [&](const FoundFile& found) {
+    const std::size_t root = found.folder->root;
+    const int mildest = mildestUrgency(*opened.roots[root].rule, found.used_ns, now_ns);
+    if (found.bytes == 0) return;
+    if (found.links == 1) return count(found.inode, root, found.bytes, mildest);
+    const auto whole = groups.offer(found, mildest);
+    if (whole) count(whole->turn.inode, root, whole->bytes, whole->level);
+  };
+  sum.cancelled = !TreeWalk(opened.roots).forEachFile(visit, cancel, left);
+  return sum;
+}
+
+}  // namespace spacekeep::cachedir

@@ -1,0 +1,52 @@
+// Thread safety: one thread at a time.
+//
+// Which files are held by processes, as far as /proc shows it: open descriptors (/proc/PID/fd),
+// mappings (/proc/PID/maps) and locks and leases (/proc/locks). One scan serves a whole request; only
+// inodes on the file systems of the caches are remembered.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "services/cachedir/engine/cancel_token.h"
+#include "services/cachedir/engine/file_facts.h"
+#include "services/cachedir/engine/roots.h"
+
+namespace spacekeep::cachedir {
+
+/// Held inodes that are remembered, 16 bytes each. With more the scan counts as failed.
+inline constexpr std::size_t kMaxHeldFiles = 1 << 20;
+
+class OpenFiles {
+ public:
+  explicit OpenFiles(std::string proc = "/proc") : proc_(std::move(proc)) {}
+
+  /// Scans unless the last scan saw the same file systems and is at most `max_age_ns` old.
+  [[nodiscard]] bool ensure(const std::vector<Root>& roots, std::uint64_t max_age_ns,
+                            const CancelToken& cancel);
+  /// Scans. False when it was cancelled or the answer is not to be relied on: then nothing may go.
+  [[nodiscard]] bool scan(const std::vector<Root>& roots, const CancelToken& cancel);
+  /// Nanoseconds since the last good scan; the largest number without one.
+  [[nodiscard]] std::uint64_t ageNs() const;
+  /// Whether somebody held `inode` (of the file system `file_system`) at the scan.
+  [[nodiscard]] bool holds(const Inode& inode, std::uint64_t file_system) const;
+  /// Processes whose descriptors could not be read.
+  [[nodiscard]] std::uint64_t hiddenProcesses() const { return hidden_; }
+
+ private:
+  void scanProcess(const std::string& process);
+  void scanDescriptors(const std::string& process);
+  void scanMappings(const std::string& process);
+  void scanLocks();
+  void remember(const Inode& inode);
+
+  const std::string proc_;
+  std::vector<std::uint64_t> devices_;  // sorted
+  std::vector<Inode> held_;             // sorted after a scan
+  std::uint64_t hidden_ = 0;
+  std::uint64_t scanned_ticks_ = 0;
+  bool good_ = false;
+};
+
+}  // namespace spacekeep::cachedir

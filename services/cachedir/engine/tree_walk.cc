@@ -1,0 +1,124 @@
+#include "services/cachedir/engine/tree_walk.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+
+#include <cstring>
+
+#include "services/cachedir/engine/beneath.h"
+
+namespace spacekeep::cachedir {
+namespace {
+
+struct DirectoryCloser {
+  void operator()(DIR* directory) const { ::closedir(directory); }
+};
+
+std::int64_t nsOfStatx(const statx_timestamp& time) {
+  return time.tv_sec * kNsPerSecond + static_cast<std::int64_t>(time.tv_nsec);
+}
+
+bool isDotName(const char* name) {
+  return name[0] == '.' && (name[1] == '\0' || (name[1] == '.' && name[2] == '\0'));
+}
+
+}  // namespace
+
+struct TreeWalk::Level {
+  std::unique_ptr<DIR, DirectoryCloser> directory;
+  std::shared_ptr<const Folder> folder;
+
+  [[nodiscard]] int fd() const { return ::dirfd(directory.get()); }
+};
+
+bool TreeWalk::forEachFile(const std::function<void(const FoundFile&)>& visit,
+                           const CancelToken& cancel, Tally& tally) {
+  for (std::size_t i = 0; i < roots_.size(); ++i) {
+    if (!walkRoot(i, visit, cancel, tally)) return false;
+  }
+  return true;
+}
+
+void TreeWalk::enter(std::vector<Level>& levels, UniqueFd fd, Folder folder, Tally& tally) {
+  std::unique_ptr<DIR, DirectoryCloser> directory(::fdopendir(fd.get()));
+  if (!directory) {
+    tally.add(Left::kFailed);
+    return;
+  }
+  static_cast<void>(fd.release());
+  levels.push_back({std::move(directory), std::make_shared<const Folder>(std::move(folder))});
+}
+
+bool TreeWalk::walkRoot(std::size_t index, const std::function<void(const FoundFile&)>& visit,
+                        const CancelToken& cancel, Tally& tally) {
+  std::vector<Level> levels;
+  // A description of its own: the root's would share its reading position with other walks.
+  enter(levels, openBeneath(roots_[index].fd.get(), ".", O_RDONLY | O_DIRECTORY), {index, ""},
+        tally);
+  while (!levels.empty()) {
+    if (cancel.cancelled()) return false;
+    const dirent* entry = ::readdir(levels.back().directory.get());
+    if (entry == nullptr) {
+      levels.pop_back();
+    } else if (isDotName(entry->d_name)) {
+      continue;
+    } else if (entry->d_type == DT_DIR) {
+      descend(levels, entry->d_name, tally);
+    } else if (entry->d_type == DT_REG) {
+      meet(levels.back(), entry->d_name, visit, tally);
+    } else if (entry->d_type == DT_UNKNOWN) {
+      struct stat facts {};
+      if (::fstatat(levels.back().fd(), entry->d_name, &facts, AT_SYMLINK_NOFOLLOW) != 0) continue;
+      if (S_ISDIR(facts.st_mode)) descend(levels, entry->d_name, tally);
+      if (S_ISREG(facts.st_mode)) meet(levels.back(), entry->d_name, visit, tally);
+    }
+  }
+  return true;
+}
+
+void TreeWalk::descend(std::vector<Level>& levels, const char* name, Tally& tally) {
+  const Level& above = levels.back();
+  const Root& root = roots_[above.folder->root];
+  std::string path = joined(above.folder->path, name);
+  if (isKept(*root.rule, path)) return;
+  if (levels.size() > kMaxDepth || path.size() + NAME_MAX > kMaxPathBytes) {
+    tally.add(Left::kTooDeep);
+    return;
+  }
+  UniqueFd fd = openBeneath(above.fd(), name, O_RDONLY | O_DIRECTORY);
+  struct stat facts {};
+  if (!fd || ::fstat(fd.get(), &facts) != 0) {
+    // EXDEV is another mount, ELOOP a link put there meanwhile: both are none of ours.
+    if (errno == EACCES) tally.add(Left::kUnreadable);
+    return;
+  }
+  // A subvolume inside is a file system of its own in all that counts here, snapshots above all.
+  if (inodeOf(facts).device == root.inode.device) {
+    enter(levels, std::move(fd), {above.folder->root, std::move(path)}, tally);
+  }
+}
+
+void TreeWalk::meet(const Level& level, const char* name,
+                    const std::function<void(const FoundFile&)>& visit, Tally& tally) {
+  const Root& root = roots_[level.folder->root];
+  if (!root.rule->keep.empty() && isKept(*root.rule, joined(level.folder->path, name))) return;
+  struct statx facts {};
+  if (::statx(level.fd(), name, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT,
+              STATX_BASIC_STATS | STATX_MNT_ID, &facts) != 0) {
+    if (errno != ENOENT) tally.add(Left::kFailed);
+    return;
+  }
+  if (!S_ISREG(facts.stx_mode) || facts.stx_mnt_id != root.mount_id) return;
+  const std::int64_t accessed = nsOfStatx(facts.stx_atime);
+  const std::int64_t modified = nsOfStatx(facts.stx_mtime);
+  visit(FoundFile{.folder = level.folder,
+                  .name = name,
+                  .inode = {makedev(facts.stx_dev_major, facts.stx_dev_minor), facts.stx_ino},
+                  .used_ns = accessed > modified ? accessed : modified,
+                  .bytes = facts.stx_blocks * 512,
+                  .links = facts.stx_nlink});
+}
+
+}  // namespace spacekeep::cachedir

@@ -1,0 +1,28 @@
+// Thread safety: every member may be called from any thread.
+//
+// A look at the space of all local volumes at once, for whoever watches them.
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "support/volumes/low_space.h"
+
+namespace spacekeep {
+
+struct VolumeSample {
+  std::string volume;           ///< mount point
+  std::uint64_t file_system = 0;  ///< tells apart what was mounted there one after another
+  VolumeSpace space;
+  SpaceLevel level = SpaceLevel::kEnough;
+};
+
+class SpaceSource {
+ public:
+  virtual ~SpaceSource() = default;
+  /// Every local volume, each file system once, in mount order. A volume that cannot be asked is
+  /// left out.
+  [[nodiscard]] virtual std::vector<VolumeSample> sampleLocalVolumes() = 0;
+};
+
+}  // namespace spacekeep

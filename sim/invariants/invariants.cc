@@ -1,0 +1,53 @@
+#include "sim/invariants/invariants.h"
+
+#include <array>
+
+namespace spacekeep::sim {
+namespace {
+
+constexpr std::array kInvariants = {
+    Invariant{"the run ends and leaves nothing blocked", checkEnd},
+    Invariant{"every line stands where it belongs", checkOddities},
+    Invariant{"each client gets exactly one answer", checkOneAnswerPerClient},
+    Invariant{"the answer is what the purge reported last", checkAnswersAreOutcomes},
+    Invariant{"purges never overlap", checkPurgesDoNotOverlap},
+    Invariant{"only purging services are asked", checkOnlyPurgingServicesAreAsked},
+    Invariant{"only a purge that fell short cancels", checkCancelsFollowShortfalls},
+    Invariant{"every urgency up to the limit runs", checkUrgencies},
+    Invariant{"waits are exact", checkWaitsAreExact},
+    Invariant{"only a reply ends a wait early", checkOnlySignalsEndWaits},
+    Invariant{"a share is an equal part of what is missing", checkSharesAreEqualParts},
+    Invariant{"shares are computed one after another on their queue", checkSharesOneAfterAnother},
+    Invariant{"every service is offered its first share before any its second",
+              checkFirstSharesComeFirst},
+    Invariant{"shares never add up to more than is missing", checkSharesDoNotExceedWhatIsMissing},
+    Invariant{"nobody is asked for 0 bytes", checkNobodyIsAskedForNothing},
+    Invariant{"the divisor is the number of services that can still give", checkDivisor},
+    Invariant{"no service is asked twice at once", checkNeverAskedTwiceAtOnce},
+    Invariant{"the in-flight set follows requests and their ends", checkInFlightSet},
+    Invariant{"every request ends once", checkEveryRequestEndsOnce},
+    Invariant{"a met share is followed by another offer", checkMetSharesAreOfferedAnother},
+    Invariant{"the freed amount is what the volume gained", checkFreedIsMeasured},
+    Invariant{"the reported amount is the sum of the replies", checkReportedSum},
+    Invariant{"statistics of services balance with replies", checkServiceStatistics},
+    Invariant{"statistics of purges balance with outcomes", checkPurgeStatistics},
+    Invariant{"urgency records name what services reported", checkReportingServices},
+};
+
+}  // namespace
+
+std::span<const Invariant> purgeInvariants() { return kInvariants; }
+
+std::vector<Violation> judge(const PurgeRun& run) {
+  const PurgeStory story(run);
+  std::vector<Violation> violations;
+  for (const Invariant& invariant : kInvariants) {
+    Findings findings;
+    invariant.check(story, findings);
+    for (std::string& text : findings) violations.push_back({invariant.name, std::move(text)});
+    if (invariant.check == checkEnd && !violations.empty()) break;
+  }
+  return violations;
+}
+
+}  // namespace spacekeep::sim

@@ -1,0 +1,76 @@
+#include "sim/invariants/purge_story.h"
+
+#include <algorithm>
+
+namespace spacekeep::sim {
+namespace {
+
+const std::string* volumeOf(const Operation& operation) {
+  return stringAt(operation.request, "SPACEKEEP_VOLUME");
+}
+
+}  // namespace
+
+std::vector<std::uint64_t> PurgeStory::freeBetween(const std::string& volume, std::size_t first,
+                                                   std::size_t last) const {
+  std::vector<std::uint64_t> values = {0};
+  for (std::size_t at = 0; at <= last && at < run.events.size(); ++at) {
+    const auto* space = std::get_if<FreeSpaceIs>(&run.events[at].body);
+    if (space == nullptr || space->volume != volume) continue;
+    if (at <= first) {
+      values.front() = space->free;
+    } else {
+      values.push_back(space->free);
+    }
+  }
+  return values;
+}
+
+bool PurgeStory::hadFreed(const Operation& operation, std::uint64_t bytes, std::size_t first,
+                          std::size_t last) const {
+  const std::string* volume = volumeOf(operation);
+  const std::uint64_t begin =
+      unsignedAt(operation.outcome, "SPACEKEEP_FREESPACE_BEGIN").value_or(0);
+  const auto values = freeBetween(volume == nullptr ? "" : *volume, first, last);
+  return std::any_of(values.begin(), values.end(), [&](std::uint64_t free) {
+    return bytes == (free > begin ? free - begin : 0);
+  });
+}
+
+bool PurgeStory::hadReached(const Operation& operation, std::size_t first, std::size_t last) const {
+  const std::string* volume = volumeOf(operation);
+  const std::uint64_t begin =
+      unsignedAt(operation.outcome, "SPACEKEEP_FREESPACE_BEGIN").value_or(0);
+  const auto values = freeBetween(volume == nullptr ? "" : *volume, first, last);
+  return std::any_of(values.begin(), values.end(), [&](std::uint64_t free) {
+    return (free > begin ? free - begin : 0) >= operation.needed;
+  });
+}
+
+int PurgeStory::inFlightBefore(std::size_t operation, const std::string& service,
+                               std::size_t at) const {
+  int count = 0;
+  for (const ShareTask& task : tasks) {
+    if (task.operation == operation && task.service == service && task.added &&
+        task.adding_at < at) {
+      ++count;
+    }
+  }
+  for (const Reply& reply : replies) {
+    if (reply.operation == operation && reply.service == service && reply.removing_at < at) {
+      --count;
+    }
+  }
+  for (const Failure& failure : failures) {
+    if (failure.operation == operation && failure.service == service && failure.removing_at < at) {
+      --count;
+    }
+  }
+  return count;
+}
+
+std::string PurgeStory::name(const Operation& operation) const {
+  return "purge of " + std::to_string(operation.needed) + " bytes (" + operation.token + ")";
+}
+
+}  // namespace spacekeep::sim

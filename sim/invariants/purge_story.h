@@ -1,0 +1,127 @@
+// Thread safety: plain values; PurgeStory refers to the run it was made from.
+//
+// What a trace says about purges, put in order: operations with their urgencies, share
+// computations, replies and failures. A position is an index into the events of the run.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "sim/scenarios/purge_run.h"
+#include "sim/world/trace.h"
+
+namespace spacekeep::sim {
+
+inline constexpr std::size_t kNowhere = SIZE_MAX;
+
+/// A line "donation (...) = ...".
+struct Share {
+  std::size_t at = 0;
+  std::uint64_t donation = 0;
+  std::uint64_t needed = 0;
+  std::uint64_t purged = 0;
+  std::uint64_t divisor = 0;
+};
+
+/// One share computation, from "queuing service" to its last line.
+struct ShareTask {
+  std::size_t at = 0;
+  std::size_t last_at = 0;
+  unsigned thread = 0;
+  std::string service;
+  std::optional<Share> share;
+  std::size_t adding_at = kNowhere;
+  bool added = false;
+  std::size_t operation = kNowhere;  ///< kNowhere: cannot be told
+};
+
+/// One booked reply.
+struct Reply {
+  std::size_t booked_at = 0;  ///< "service purged"
+  unsigned thread = 0;
+  std::string service;
+  std::uint64_t amount = 0;
+  std::uint64_t call = 0;  ///< 0 until the answer names it
+  std::uint64_t donation = 0;
+  std::int32_t urgency = 0;
+  std::size_t completion_at = kNowhere;
+  std::size_t removing_at = kNowhere;
+  unsigned removals = 0;
+  unsigned signals = 0;
+  std::size_t done_at = kNowhere;  ///< "took ... seconds"
+  std::size_t operation = kNowhere;
+};
+
+/// A failed connection, as a purge noted it.
+struct Failure {
+  std::size_t at = 0;
+  std::string service;  ///< empty until its removal names it
+  std::size_t removing_at = kNowhere;
+  std::size_t operation = kNowhere;
+};
+
+/// One urgency.
+struct Pass {
+  std::int32_t urgency = 0;
+  std::size_t begin_at = 0;         ///< "IN QUEUE"
+  std::size_t asked_at = kNowhere;  ///< "Urgency: %d"
+  std::size_t waiting_at = kNowhere;
+  std::uint64_t wait_seconds = 0;
+  std::size_t timed_out_at = kNowhere;
+  std::size_t stats_at = kNowhere;
+};
+
+struct Operation {
+  std::string token;
+  Dictionary request;
+  std::uint64_t needed = 0;
+  std::int32_t limit = 0;
+  unsigned thread = 0;
+  std::size_t before_begin_at = 0;       ///< what its thread did last before that
+  std::size_t begin_at = 0;              ///< "urgencyLimit: ..."
+  std::size_t measured_at = kNowhere;    ///< the statistic of the elapsed time
+  std::size_t cancelling_at = kNowhere;  ///< "cancelling purge"
+  std::size_t end_at = kNowhere;         ///< "result"
+  Dictionary outcome;
+  std::vector<Pass> passes;
+  std::set<std::string> services;  ///< those that were offered a share
+  /// Lines of another purge could not be told from this one's: only what needs no attribution
+  /// holds.
+  bool blurred = false;
+};
+
+struct PurgeStory {
+  explicit PurgeStory(const PurgeRun& run);
+
+  const PurgeRun& run;
+  std::vector<Operation> operations;
+  std::vector<ShareTask> tasks;
+  std::vector<Reply> replies;
+  std::vector<Failure> failures;
+  std::vector<std::string> oddities;  ///< lines that stand where they cannot be
+
+  [[nodiscard]] std::uint64_t timeAt(std::size_t at) const { return run.events[at].at_ns; }
+  /// Every value that the volume's free space had from `first` to `last`.
+  [[nodiscard]] std::vector<std::uint64_t> freeBetween(const std::string& volume, std::size_t first,
+                                                       std::size_t last) const;
+  /// Whether the operation had freed `bytes` at some moment from `first` to `last`.
+  [[nodiscard]] bool hadFreed(const Operation& operation, std::uint64_t bytes, std::size_t first,
+                              std::size_t last) const;
+  /// Whether it had freed what it needs, likewise.
+  [[nodiscard]] bool hadReached(const Operation& operation, std::size_t first,
+                                std::size_t last) const;
+  /// Successful additions less removals of the service before `at`.
+  [[nodiscard]] int inFlightBefore(std::size_t operation, const std::string& service,
+                                   std::size_t at) const;
+  [[nodiscard]] std::string name(const Operation& operation) const;
+};
+
+/// A reply that met its share is followed by another offer.
+[[nodiscard]] inline bool metItsShare(const Reply& reply) { return reply.amount >= reply.donation; }
+
+}  // namespace spacekeep::sim

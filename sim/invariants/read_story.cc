@@ -1,0 +1,292 @@
+// From events to a story. Each thread's lines read like the code that wrote them: what a line is
+// about is told by the lines before it on the same thread.
+#include <algorithm>
+#include <utility>
+
+#include "sim/invariants/log_formats.h"
+#include "sim/invariants/purge_story.h"
+#include "sim/world/simulated_service.h"
+#include "support/values/text.h"
+
+namespace spacekeep::sim {
+namespace {
+
+using formats::dictionaryField;
+using formats::numberField;
+using formats::textField;
+
+/// What one thread is in the middle of, as indices into the story.
+struct ThreadState {
+  std::size_t operation = kNowhere;
+  std::size_t task = kNowhere;
+  std::size_t reply = kNowhere;
+  std::size_t failure = kNowhere;
+  std::size_t last_at = 0;
+};
+
+struct AskedCall {
+  std::string service;
+  std::string token;
+  std::uint64_t amount = 0;
+  std::int32_t urgency = 0;
+};
+
+class Reader {
+ public:
+  explicit Reader(PurgeStory& story) : story_(story) {}
+
+  void read() {
+    for (std::size_t at = 0; at < story_.run.events.size(); ++at) {
+      const Event& event = story_.run.events[at];
+      if (const auto* line = std::get_if<LogLine>(&event.body)) {
+        readLine(at, event.thread, *line);
+      } else if (const auto* asked = std::get_if<ServiceAsked>(&event.body)) {
+        asked_[asked->call] = {asked->service, asked->token, asked->amount.value_or(0),
+                               asked->urgency};
+      } else if (const auto* sent = std::get_if<StatisticSent>(&event.body)) {
+        readStatistic(at, event.thread, *sent);
+      }
+      threads_[event.thread].last_at = at;
+    }
+    attributeReplies();
+    attributeTasks();
+    attributeFailures();
+  }
+
+ private:
+  void readLine(std::size_t at, unsigned thread, const LogLine& line) {
+    ThreadState& state = threads_[thread];
+    if (line.format == formats::kBegin) {
+      begin(at, thread, line);
+    } else if (line.format == formats::kQueuing) {
+      state.task = story_.tasks.size();
+      story_.tasks.push_back(
+          {.at = at, .last_at = at, .thread = thread, .service = textField(line, 1), .share = {}});
+    } else if (line.format == formats::kDonation) {
+      donation(at, state, line);
+    } else if (line.format == formats::kInFlight && textField(line, 0) == "updateInFlight") {
+      inFlight(at, state, line);
+    } else if (line.format == formats::kAlreadyIn && state.task != kNowhere) {
+      story_.tasks[state.task].added = false;
+      story_.tasks[state.task].last_at = at;
+    } else {
+      readReplyLine(at, thread, state, line);
+    }
+  }
+
+  void begin(std::size_t at, unsigned thread, const LogLine& line) {
+    Operation operation;
+    operation.thread = thread;
+    operation.before_begin_at = threads_[thread].last_at;
+    operation.begin_at = at;
+    operation.limit = static_cast<std::int32_t>(numberField(line, 1));
+    operation.request = dictionaryField(line, 2);
+    operation.needed = unsignedAt(operation.request, "SPACEKEEP_AMOUNT").value_or(0);
+    const Value* token = operation.request.find("SPACEKEEP_TOKEN");
+    if (token != nullptr) operation.token = textOf(*token);
+    threads_[thread].operation = story_.operations.size();
+    story_.operations.push_back(std::move(operation));
+  }
+
+  void donation(std::size_t at, const ThreadState& state, const LogLine& line) {
+    if (state.task == kNowhere || story_.tasks[state.task].share) {
+      story_.oddities.push_back("a donation outside of a share computation: " + textOfLine(line));
+      return;
+    }
+    ShareTask& task = story_.tasks[state.task];
+    task.share = Share{at, numberField(line, 1), numberField(line, 2), numberField(line, 3),
+                       numberField(line, 4)};
+    task.last_at = at;
+  }
+
+  void inFlight(std::size_t at, ThreadState& state, const LogLine& line) {
+    const std::string service = textField(line, 2);
+    if (textField(line, 1) == "adding") {
+      if (state.task == kNowhere || story_.tasks[state.task].service != service) {
+        story_.oddities.push_back("an addition outside of a share computation: " + service);
+        return;
+      }
+      ShareTask& task = story_.tasks[state.task];
+      task.adding_at = at;
+      task.added = true;
+      task.last_at = at;
+    } else if (state.reply != kNowhere) {
+      Reply& reply = story_.replies[state.reply];
+      reply.removing_at = at;
+      ++reply.removals;
+    } else if (state.failure != kNowhere) {
+      Failure& failure = story_.failures[state.failure];
+      failure.service = service;
+      failure.removing_at = at;
+      state.failure = kNowhere;
+    } else {
+      story_.oddities.push_back("a removal that nobody asked for: " + service);
+    }
+  }
+
+  void readReplyLine(std::size_t at, unsigned thread, ThreadState& state, const LogLine& line) {
+    if (line.format == formats::kPurged) {
+      state.task = kNowhere;
+      state.reply = story_.replies.size();
+      story_.replies.push_back({.booked_at = at,
+                                .thread = thread,
+                                .service = textField(line, 1),
+                                .amount = numberField(line, 2)});
+    } else if (line.format == formats::kFailed && textField(line, 0) == "queueServiceRequest") {
+      state.failure = story_.failures.size();
+      story_.failures.push_back({.at = at, .service = {}});
+    } else if (line.format == formats::kCompletion && state.reply != kNowhere) {
+      Reply& reply = story_.replies[state.reply];
+      reply.completion_at = at;
+      reply.call = unsignedAt(dictionaryField(line, 2), kCallKey).value_or(0);
+    } else if (line.format == formats::kSignalling) {
+      if (state.reply == kNowhere) {
+        story_.oddities.push_back("a signal outside of the booking of a reply");
+      } else {
+        ++story_.replies[state.reply].signals;
+      }
+    } else if (line.format == formats::kTook && state.reply != kNowhere) {
+      story_.replies[state.reply].done_at = at;
+      state.reply = kNowhere;
+    } else if (state.operation != kNowhere) {
+      readCourse(at, state, line);
+    }
+  }
+
+  void readCourse(std::size_t at, ThreadState& state, const LogLine& line) {
+    Operation& operation = story_.operations[state.operation];
+    if (line.format == formats::kInQueue) {
+      Pass pass;
+      pass.urgency = static_cast<std::int32_t>(operation.passes.size()) + 1;
+      pass.begin_at = at;
+      operation.passes.push_back(pass);
+    } else if (line.format == formats::kCancelling) {
+      operation.cancelling_at = at;
+    } else if (line.format == formats::kResult) {
+      operation.end_at = at;
+      operation.outcome = dictionaryField(line, 1);
+      state.operation = kNowhere;
+    } else if (!operation.passes.empty()) {
+      readPass(at, operation.passes.back(), line);
+    }
+  }
+
+  static void readPass(std::size_t at, Pass& pass, const LogLine& line) {
+    if (line.format == formats::kUrgency) {
+      pass.asked_at = at;
+    } else if (line.format == formats::kWaiting) {
+      pass.waiting_at = at;
+      pass.wait_seconds = numberField(line, 1);
+    } else if (line.format == formats::kTimedOut) {
+      pass.timed_out_at = at;
+    } else if (line.format == formats::kStatistics) {
+      pass.stats_at = at;
+    }
+  }
+
+  void readStatistic(std::size_t at, unsigned thread, const StatisticSent& sent) {
+    const std::size_t operation = threads_[thread].operation;
+    if (operation != kNowhere && sent.key == "SpacekeepPurgeElapsedNanoseconds") {
+      story_.operations[operation].measured_at = at;
+    }
+  }
+
+  [[nodiscard]] std::size_t operationWithToken(const std::string& token) const {
+    for (std::size_t i = 0; i < story_.operations.size(); ++i) {
+      if (story_.operations[i].token == token) return i;
+    }
+    return kNowhere;
+  }
+
+  void attributeReplies() {
+    for (Reply& reply : story_.replies) {
+      const auto asked = asked_.find(reply.call);
+      if (asked == asked_.end() || asked->second.service != reply.service) {
+        story_.oddities.push_back("a reply of " + reply.service + " to nothing that was asked");
+        continue;
+      }
+      reply.donation = asked->second.amount;
+      reply.urgency = asked->second.urgency;
+      reply.operation = operationWithToken(asked->second.token);
+    }
+  }
+
+  // A donation names the bytes needed, which no two purges share. A computation that stopped before
+  // it belongs to the running purge, unless a purge that has ended may still have one to come.
+  void attributeTasks() {
+    for (ShareTask& task : story_.tasks) {
+      if (!task.share) continue;
+      for (std::size_t i = 0; i < story_.operations.size(); ++i) {
+        if (story_.operations[i].needed != task.share->needed) continue;
+        task.operation = i;
+        story_.operations[i].services.insert(task.service);
+      }
+    }
+    for (ShareTask& task : story_.tasks) {
+      if (task.operation == kNowhere) attributeUnnamed(task);
+    }
+  }
+
+  void attributeUnnamed(ShareTask& task) {
+    std::vector<std::size_t> possible;
+    for (std::size_t i = 0; i < story_.operations.size(); ++i) {
+      const Operation& operation = story_.operations[i];
+      if (operation.begin_at > task.at) continue;
+      if (operation.end_at > task.at || outstandingTasks(i, task) > 0) possible.push_back(i);
+    }
+    if (possible.size() == 1) {
+      task.operation = possible.front();
+      story_.operations[task.operation].services.insert(task.service);
+      return;
+    }
+    for (const std::size_t i : possible) story_.operations[i].blurred = true;
+  }
+
+  // Each asked urgency queues one computation for each service, each met share one more.
+  [[nodiscard]] std::int64_t outstandingTasks(std::size_t operation, const ShareTask& next) const {
+    const Operation& ended = story_.operations[operation];
+    std::int64_t count = 0;
+    for (const Pass& pass : ended.passes) {
+      if (pass.asked_at != kNowhere && ended.services.contains(next.service)) ++count;
+    }
+    for (const Reply& reply : story_.replies) {
+      if (reply.operation == operation && reply.service == next.service &&
+          reply.booked_at < next.at && metItsShare(reply)) {
+        ++count;
+      }
+    }
+    for (const ShareTask& task : story_.tasks) {
+      if (task.operation == operation && task.service == next.service && task.at < next.at) --count;
+    }
+    return count;
+  }
+
+  void attributeFailures() {
+    for (Failure& failure : story_.failures) {
+      if (failure.removing_at == kNowhere) continue;
+      std::vector<std::size_t> possible;
+      for (std::size_t i = 0; i < story_.operations.size(); ++i) {
+        if (story_.inFlightBefore(i, failure.service, failure.removing_at) > 0) {
+          possible.push_back(i);
+        }
+      }
+      if (possible.empty()) {
+        story_.oddities.push_back("a failure of " + failure.service + ", which was not in flight");
+        continue;
+      }
+      failure.operation = possible.front();
+      if (possible.size() == 1) continue;
+      for (const std::size_t i : possible) story_.operations[i].blurred = true;
+    }
+  }
+
+  PurgeStory& story_;
+  std::map<unsigned, ThreadState> threads_;
+  std::map<std::uint64_t, AskedCall> asked_;
+};
+
+}  // namespace
+
+PurgeStory::PurgeStory(const PurgeRun& run_given) : run(run_given) { Reader(*this).read(); }
+
+}  // namespace spacekeep::sim

@@ -67,6 +67,9 @@ struct ServedInterface {
   std::vector<ServedMethod> methods;  ///< one per described method
 };
 
+/// What is wrong with it, empty when each described method has exactly one usable handler.
+[[nodiscard]] std::string problemOf(const ServedInterface& interface);
+
 /// Accepts connections of entitled peers and serves an interface on them.
 class Listener {
  public:

@@ -1,0 +1,288 @@
+#include "support/ipc/linux/bus_link.h"
+
+#include <fcntl.h>
+#include <sys/epoll.h>
+#include <sys/ioctl.h>
+#include <sys/socket.h>
+#include <systemd/sd-bus.h>
+#include <systemd/sd-event.h>
+#include <time.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <utility>
+
+#include "support/ipc/linux/authenticated_bus.h"
+
+namespace spacekeep::ipc {
+
+namespace {
+
+constexpr std::size_t kHeaderBytes = 16;
+constexpr int kMessagesPerTurn = 32;  // then other connections have their turn
+
+/// A 32-bit number of the header in the byte order that the header states.
+std::uint64_t numberAt(const unsigned char* header, std::size_t offset) {
+  std::uint64_t number = 0;
+  for (std::size_t i = 0; i < 4; ++i) {
+    const std::size_t place = header[0] == 'l' ? 3 - i : i;
+    number = number << 8U | header[offset + place];
+  }
+  return number;
+}
+
+std::size_t bytesAvailable(int fd) {
+  int bytes = 0;
+  return ::ioctl(fd, FIONREAD, &bytes) == 0 && bytes > 0 ? static_cast<std::size_t>(bytes) : 0;
+}
+
+}  // namespace
+
+BusLink::BusLink(IpcLoop& loop, Owner& owner, Authentication::Role role, const LinkLimits& limits)
+    : loop_(loop), owner_(owner), role_(role), limits_(limits) {}
+
+BusLink::~BusLink() { close(); }
+
+void BusLink::start(int fd, uid_t peer_uid) {
+  fd_ = ::fcntl(fd, F_DUPFD_CLOEXEC, 3);
+  if (fd_ < 0) {
+    end(LinkEnd::kRefused, "this process has no descriptor left");
+    return;
+  }
+  socket_ = std::make_shared<Descriptor>(fd_);
+  // The other side of a passed descriptor may have changed the mode, and the IPC thread never waits.
+  ::fcntl(fd_, F_SETFL, ::fcntl(fd_, F_GETFL) | O_NONBLOCK);
+  authentication_ = std::make_unique<Authentication>(role_, fd_, peer_uid);
+  const std::uint64_t usec = std::max<std::uint64_t>(limits_.authentication_ns / 1000, 1);
+  if (!watch() || sd_event_add_time_relative(loop_.event(), &timer_, CLOCK_MONOTONIC, usec, 1000,
+                                             &BusLink::onTimeout, this) < 0) {
+    end(LinkEnd::kRefused, "this process cannot watch another connection");
+    return;
+  }
+  if (!authentication_->begin()) end(LinkEnd::kPeerLeft, "the peer has left");
+}
+
+bool BusLink::watch() {
+  events_ = EPOLLIN;
+  return sd_event_add_io(loop_.event(), &io_, fd_, events_, &BusLink::onIo, this) >= 0;
+}
+
+int BusLink::onTimeout(sd_event_source*, std::uint64_t, void* self) {
+  static_cast<BusLink*>(self)->end(LinkEnd::kRefused, "it did not authenticate in time");
+  return 0;
+}
+
+int BusLink::onIo(sd_event_source*, int, std::uint32_t events, void* self) {
+  auto* link = static_cast<BusLink*>(self);
+  if (link->bus_ == nullptr) {
+    link->authenticate();
+    return 0;
+  }
+  link->process();
+  // What was left of a header does not get longer once the peer is gone.
+  if (!link->ended_ && (link->events_ & EPOLLET) != 0 && (events & (EPOLLHUP | EPOLLRDHUP)) != 0) {
+    link->end(LinkEnd::kPeerLeft, "the peer has left");
+  }
+  return 0;
+}
+
+void BusLink::authenticate() {
+  std::string why;
+  switch (authentication_->advance(why)) {
+    case Authentication::Progress::kMore:
+      return;
+    case Authentication::Progress::kFailed:
+      end(LinkEnd::kRefused, why);
+      return;
+    case Authentication::Progress::kDone:
+      break;
+  }
+  if (!open()) {
+    end(LinkEnd::kRefused, "this process has no descriptor left");
+    return;
+  }
+  owner_.linkReady();
+}
+
+bool BusLink::open() {
+  io_ = sd_event_source_unref(io_);
+  timer_ = sd_event_source_disable_unref(timer_);
+  authentication_.reset();
+  bus_ = makeAuthenticatedBus(fd_);
+  socket_.reset();
+  if (bus_ == nullptr) return false;
+  fd_ = sd_bus_get_fd(bus_);
+  return fd_ >= 0 && sd_bus_add_filter(bus_, nullptr, &BusLink::onMessage, this) >= 0 && watch();
+}
+
+int BusLink::onMessage(sd_bus_message* message, void* self, sd_bus_error*) {
+  auto* link = static_cast<BusLink*>(self);
+  // The message that sd-bus makes itself when the stream has ended.
+  if (link->ended_ || sd_bus_is_open(link->bus_) <= 0) return 1;
+  link->in_message_ = false;
+  link->owner_.linkMessage(message);
+  return 1;  // so that sd-bus never answers anything by itself
+}
+
+void BusLink::process() {
+  processing_ = true;
+  for (int i = 0; i < kMessagesPerTurn && !ended_; ++i) {
+    if (!processOnce()) break;
+  }
+  processing_ = false;
+  if (ended_) {
+    release();
+    return;
+  }
+  forgetWritten();
+  updateEvents();
+}
+
+/// Lets sd-bus read at most one message, and only one whose size is known to be within the limit.
+/// Answers whether there may be more to do.
+bool BusLink::processOnce() {
+  if (!in_message_) {
+    switch (lookAhead()) {
+      case Ahead::kRefused:
+        return false;
+      case Ahead::kMessage:
+        in_message_ = true;
+        message_read_ = 0;
+        break;
+      case Ahead::kNothing:
+      case Ahead::kIncomplete:
+        if (queued_sizes_.empty()) return false;
+        // To write, sd-bus must be allowed to read as well, and what came in meanwhile was not
+        // judged: until a message has arrived, its size counts as the largest.
+        in_message_ = true;
+        message_read_ = 0;
+        message_size_ = limits_.message_bytes;
+        break;
+    }
+  }
+  const std::size_t available = bytesAvailable(fd_);
+  const int progress = sd_bus_process(bus_, nullptr);
+  if (ended_) return false;
+  if (progress < 0) {
+    end(LinkEnd::kRefused, std::string("its messages cannot be read: ") + std::strerror(-progress));
+  } else if (sd_bus_is_open(bus_) <= 0) {
+    end(LinkEnd::kPeerLeft, "the peer has left");
+  } else if (in_message_ && messageWasDropped(available)) {
+    end(LinkEnd::kRefused, "it sent a broken message");
+  }
+  return !ended_ && progress > 0;
+}
+
+BusLink::Ahead BusLink::lookAhead() {
+  std::array<unsigned char, kHeaderBytes> header{};
+  const ssize_t seen = ::recv(fd_, header.data(), header.size(), MSG_PEEK | MSG_DONTWAIT);
+  if (seen == 0 || (seen < 0 && errno != EAGAIN && errno != EINTR)) {
+    end(LinkEnd::kPeerLeft, "the peer has left");
+    return Ahead::kRefused;
+  }
+  if (seen < 0) return Ahead::kNothing;
+  const bool complete = static_cast<std::size_t>(seen) == header.size();
+  waitForMore(!complete);
+  if (!complete) return Ahead::kIncomplete;
+  return judgeHeader(header.data()) ? Ahead::kMessage : Ahead::kRefused;
+}
+
+/// The fixed part of a header: byte order, type, flags, version, length of the body, serial, length
+/// of the fields ("Message Format" of the D-Bus specification).
+bool BusLink::judgeHeader(const unsigned char* header) {
+  if ((header[0] != 'l' && header[0] != 'B') || header[1] < 1 || header[1] > 4 || header[3] != 1) {
+    end(LinkEnd::kRefused, "it sent something that is no D-Bus message");
+    return false;
+  }
+  const std::uint64_t fields = (numberAt(header, 12) + 7) / 8 * 8;
+  const std::uint64_t size = kHeaderBytes + fields + numberAt(header, 4);
+  if (size > limits_.message_bytes) {
+    end(LinkEnd::kRefused, "it sent a message of " + std::to_string(size) + " bytes, more than " +
+                               std::to_string(limits_.message_bytes));
+    return false;
+  }
+  message_size_ = static_cast<std::size_t>(size);
+  return true;
+}
+
+/// sd-bus leaves out what it cannot parse and reads on, past what was judged. `available` bytes
+/// were there before it read, so it has read that many at least.
+bool BusLink::messageWasDropped(std::size_t available) {
+  message_read_ += available;
+  return message_read_ >= message_size_;
+}
+
+/// A header of which a part has arrived is left in the socket. The socket then stays readable, so
+/// it is watched for the next arrival instead.
+void BusLink::waitForMore(bool until_something_arrives) {
+  const bool waiting = (events_ & EPOLLET) != 0;
+  if (waiting == until_something_arrives) return;
+  events_ = (events_ & EPOLLOUT) | EPOLLIN;
+  if (until_something_arrives) events_ |= EPOLLET | EPOLLRDHUP;
+  sd_event_source_set_io_events(io_, events_);
+}
+
+void BusLink::updateEvents() {
+  std::uint32_t wanted = events_ & ~static_cast<std::uint32_t>(EPOLLOUT);
+  if (!queued_sizes_.empty()) wanted |= EPOLLOUT;
+  if (wanted == events_) return;
+  events_ = wanted;
+  sd_event_source_set_io_events(io_, events_);
+}
+
+std::optional<std::uint64_t> BusLink::send(sd_bus_message* message, std::size_t bytes) {
+  if (ended_ || bus_ == nullptr) return std::nullopt;
+  std::uint64_t serial = 0;
+  const int result = sd_bus_send(bus_, message, &serial);
+  if (result < 0) {
+    const bool gone = result == -ECONNRESET || result == -EPIPE || result == -ENOTCONN;
+    if (gone) {
+      end(LinkEnd::kPeerLeft, "the peer has left");
+    } else if (sd_bus_is_open(bus_) <= 0 || result == -ENOBUFS) {
+      end(LinkEnd::kRefused, "it does not take its messages");
+    }
+    return std::nullopt;
+  }
+  queued_sizes_.push_back(bytes);
+  queued_bytes_ += bytes;
+  forgetWritten();
+  if (queued_sizes_.size() > limits_.queued_messages || queued_bytes_ > limits_.queued_bytes) {
+    end(LinkEnd::kRefused, "it left " + std::to_string(queued_sizes_.size()) + " messages of about " +
+                               std::to_string(queued_bytes_) + " bytes unread");
+    return std::nullopt;
+  }
+  if (!processing_) updateEvents();
+  return serial;
+}
+
+void BusLink::forgetWritten() {
+  std::uint64_t waiting = 0;
+  if (sd_bus_get_n_queued_write(bus_, &waiting) < 0) return;
+  while (queued_sizes_.size() > waiting) {
+    queued_bytes_ -= queued_sizes_.front();
+    queued_sizes_.pop_front();
+  }
+}
+
+void BusLink::end(LinkEnd how, const std::string& why) {
+  if (ended_) return;
+  ended_ = true;
+  if (!processing_) release();
+  owner_.linkEnded(how, why);
+}
+
+void BusLink::close() {
+  ended_ = true;
+  if (!processing_) release();
+}
+
+void BusLink::release() {
+  io_ = sd_event_source_disable_unref(io_);
+  timer_ = sd_event_source_disable_unref(timer_);
+  if (bus_ != nullptr) bus_ = sd_bus_close_unref(bus_);
+  socket_.reset();
+}
+
+}  // namespace spacekeep::ipc

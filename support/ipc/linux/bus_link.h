@@ -1,0 +1,108 @@
+// Thread safety: confined to the IPC thread.
+//
+// One D-Bus connection over one unix stream socket: authentication, the sd_bus object, and the
+// limits on what the peer may send and leave unread. Both ends of the system stand on it; what the
+// messages mean is its owner's business.
+#pragma once
+
+#include <sys/types.h>
+#include <systemd/sd-bus.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "support/ipc/arguments.h"
+#include "support/ipc/linux/authentication.h"
+#include "support/ipc/linux/ipc_loop.h"
+
+namespace spacekeep::ipc {
+
+struct LinkLimits {
+  std::uint64_t authentication_ns;
+  std::size_t message_bytes;
+  std::size_t queued_messages;
+  std::size_t queued_bytes;
+};
+
+enum class LinkEnd {
+  kPeerLeft,  ///< the peer closed its end or is gone
+  kRefused,   ///< this side cut it off: authentication, a limit, a broken message
+};
+
+class BusLink {
+ public:
+  class Owner {
+   public:
+    virtual ~Owner() = default;
+    /// Authenticated; messages may be sent from now on.
+    virtual void linkReady() = 0;
+    /// The message is good during the call only.
+    virtual void linkMessage(sd_bus_message* message) = 0;
+    /// Nothing follows. Never called after close(). The owner may not destroy the link within.
+    virtual void linkEnded(LinkEnd end, const std::string& why) = 0;
+  };
+
+  BusLink(IpcLoop& loop, Owner& owner, Authentication::Role role, const LinkLimits& limits);
+  ~BusLink();
+  BusLink(const BusLink&) = delete;
+  BusLink& operator=(const BusLink&) = delete;
+
+  /// Begins to authenticate over a duplicate of `fd`. Failures of any kind are told by linkEnded,
+  /// also within this call.
+  void start(int fd, uid_t peer_uid);
+  [[nodiscard]] bool ready() const { return bus_ != nullptr; }
+  [[nodiscard]] bool ended() const { return ended_; }
+  /// For making messages. Null until ready.
+  [[nodiscard]] sd_bus* bus() const { return bus_; }
+
+  /// Sends or queues the message; `bytes` is its estimated size. Answers its serial, none when it
+  /// was not sent. A peer that leaves too much unread is cut off.
+  std::optional<std::uint64_t> send(sd_bus_message* message, std::size_t bytes);
+  /// Closes without telling the owner. Safe within its callbacks.
+  void close();
+
+ private:
+  static int onIo(sd_event_source*, int fd, std::uint32_t events, void* self);
+  static int onTimeout(sd_event_source*, std::uint64_t usec, void* self);
+  static int onMessage(sd_bus_message* message, void* self, sd_bus_error*);
+
+  bool watch();
+  void authenticate();
+  bool open();
+  void process();
+  bool processOnce();
+  enum class Ahead { kNothing, kIncomplete, kMessage, kRefused };
+  Ahead lookAhead();
+  bool judgeHeader(const unsigned char* header);
+  bool messageWasDropped(std::size_t available);
+  void waitForMore(bool until_something_arrives);
+  void updateEvents();
+  void forgetWritten();
+  void end(LinkEnd how, const std::string& why);
+  void release();
+
+  IpcLoop& loop_;
+  Owner& owner_;
+  const Authentication::Role role_;
+  const LinkLimits limits_;
+  SharedDescriptor socket_;  // until the bus owns it
+  std::unique_ptr<Authentication> authentication_;
+  sd_event_source* io_ = nullptr;
+  sd_event_source* timer_ = nullptr;
+  sd_bus* bus_ = nullptr;
+  int fd_ = -1;
+  std::uint32_t events_ = 0;
+  bool processing_ = false;
+  bool ended_ = false;
+  bool in_message_ = false;        // its header was judged, it has not arrived as a whole
+  std::size_t message_size_ = 0;   // of that message
+  std::size_t message_read_ = 0;   // of it, what sd-bus has read at least
+  std::deque<std::size_t> queued_sizes_;
+  std::size_t queued_bytes_ = 0;
+};
+
+}  // namespace spacekeep::ipc

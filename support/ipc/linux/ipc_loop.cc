@@ -1,0 +1,96 @@
+#include "support/ipc/linux/ipc_loop.h"
+
+#include <sys/eventfd.h>
+#include <systemd/sd-event.h>
+#include <unistd.h>
+
+#include <mutex>
+#include <utility>
+
+#include "support/queues/waiting.h"
+
+namespace spacekeep::ipc {
+
+namespace {
+thread_local const IpcLoop* current_loop = nullptr;
+}  // namespace
+
+IpcLoop::IpcLoop() {
+  wake_fd_ = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+  if (wake_fd_ < 0 || sd_event_new(&event_) < 0) rt::panic("IPC: no descriptor for the event loop");
+  if (sd_event_add_io(event_, nullptr, wake_fd_, EPOLLIN, &IpcLoop::onWake, this) < 0) {
+    rt::panic("IPC: the event loop takes no wake-up source");
+  }
+  thread_ = rt::Thread("ipc", [this] { run(); });
+}
+
+IpcLoop::~IpcLoop() {
+  post([this] {
+    const std::scoped_lock lock(mutex_);
+    stopping_ = true;
+  });
+  thread_.join();
+  sd_event_unref(event_);
+  ::close(wake_fd_);
+}
+
+void IpcLoop::post(Task task) {
+  {
+    const std::scoped_lock lock(mutex_);
+    posted_.push_back(std::move(task));
+    if (wake_pending_) return;
+    wake_pending_ = true;
+  }
+  // A counter of 1 fits always, so the write cannot fail.
+  const std::uint64_t one = 1;
+  [[maybe_unused]] const ssize_t written = ::write(wake_fd_, &one, sizeof one);
+}
+
+void IpcLoop::runAndWait(const Task& task) {
+  if (isCurrent()) {
+    task();
+    return;
+  }
+  CountingSemaphore done(0);
+  post([&task, &done] {
+    task();
+    done.signal();
+  });
+  done.wait();
+}
+
+bool IpcLoop::isCurrent() const { return current_loop == this; }
+
+int IpcLoop::onWake(sd_event_source*, int fd, std::uint32_t, void* self) {
+  std::uint64_t count = 0;
+  [[maybe_unused]] const ssize_t read = ::read(fd, &count, sizeof count);
+  static_cast<IpcLoop*>(self)->runPosted();
+  return 0;
+}
+
+void IpcLoop::runPosted() {
+  std::vector<Task> tasks;
+  {
+    const std::scoped_lock lock(mutex_);
+    tasks.swap(posted_);
+    wake_pending_ = false;
+  }
+  for (Task& task : tasks) {
+    task();
+    task = nullptr;  // what a task holds is let go before the next one runs
+  }
+}
+
+void IpcLoop::run() {
+  current_loop = this;
+  while (true) {
+    {
+      const std::scoped_lock lock(mutex_);
+      if (stopping_ && posted_.empty()) return;
+    }
+    if (sd_event_run(event_, UINT64_MAX) < 0) rt::panic("IPC: the event loop failed");
+    wakeups_.fetch_add(1, std::memory_order_relaxed);
+  }
+}
+
+}  // namespace spacekeep::ipc

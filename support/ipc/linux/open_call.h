@@ -1,0 +1,41 @@
+// Thread safety: every member may be called from any thread.
+//
+// A call that was taken in and not answered yet. The first answer counts; dropped without one, it
+// only makes room for another call of its connection.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+
+#include "support/ipc/linux/served_connection.h"
+#include "support/ipc/linux/server_context.h"
+
+namespace spacekeep::ipc {
+
+class OpenCall {
+ public:
+  OpenCall(std::shared_ptr<ServerContext> context, std::weak_ptr<ServedConnection> connection,
+           const MethodDescription& method, std::uint64_t serial, bool wants_answer);
+  ~OpenCall();
+  OpenCall(const OpenCall&) = delete;
+  OpenCall& operator=(const OpenCall&) = delete;
+
+  /// What a handler gets; it keeps `call` alive.
+  [[nodiscard]] static Responder responderFor(const std::shared_ptr<OpenCall>& call);
+
+ private:
+  void reply(Arguments arguments);
+  void fail(const Error& error);
+  template <class Act>
+  void finish(Act act);
+
+  const std::shared_ptr<ServerContext> context_;
+  const std::weak_ptr<ServedConnection> connection_;
+  const MethodDescription& method_;
+  const std::uint64_t serial_;
+  const bool wants_answer_;
+  std::atomic<bool> finished_{false};
+};
+
+}  // namespace spacekeep::ipc

@@ -1,0 +1,53 @@
+// Thread safety: constant after construction, apart from the members that state their own.
+//
+// What all connections of one server share. Lives until the last handler and answer are gone.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <utility>
+
+#include "support/access/peer_identity.h"
+#include "support/ipc/lanes.h"
+#include "support/ipc/linux/bus_server.h"
+#include "support/ipc/linux/ipc_loop.h"
+#include "support/ipc/linux/refusal_log.h"
+#include "support/ipc/linux/sockets.h"
+#include "support/ipc/served.h"
+#include "support/ipc/serving_gate.h"
+
+namespace spacekeep::ipc {
+
+struct ServerContext {
+  ServerContext(IpcLoop& ipc_loop, ConcurrentQueue& global_queue, ServedInterface served,
+                ServerOptions server_options)
+      : loop(ipc_loop),
+        global(global_queue),
+        interface(std::move(served)),
+        options(std::move(server_options)),
+        lanes(std::make_shared<Lanes>(global_queue)) {
+    endpoint_rules.refuse_own_process = options.refuse_own_process;
+  }
+
+  IpcLoop& loop;
+  ConcurrentQueue& global;
+  const ServedInterface interface;
+  const ServerOptions options;
+  const std::shared_ptr<Lanes> lanes;  ///< any thread
+  ServingGate gate;                    ///< any thread; loop is there at least while one is inside
+  EndpointRules endpoint_rules;        ///< IPC thread
+  RefusalLog refusals;                 ///< IPC thread
+};
+
+/// The peer of an accepted connection, as handlers see it.
+class AcceptedPeer final : public PeerConnection {
+ public:
+  explicit AcceptedPeer(std::shared_ptr<const access::PeerIdentity> identity)
+      : identity_(std::move(identity)) {}
+  [[nodiscard]] const access::PeerIdentity& identity() const override { return *identity_; }
+
+ private:
+  const std::shared_ptr<const access::PeerIdentity> identity_;
+};
+
+}  // namespace spacekeep::ipc

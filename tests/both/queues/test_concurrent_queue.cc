@@ -1,0 +1,227 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <atomic>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <stdexcept>
+#include <vector>
+
+#include "support/queues/concurrent_queue.h"
+#include "support/queues/waiting.h"
+#include "tests/helpers/schedules.h"
+
+namespace spacekeep {
+namespace {
+
+constexpr std::uint64_t kMillisecondNs = 1'000'000;
+constexpr std::uint64_t kSecondNs = 1'000'000'000;
+
+ConcurrentQueue::Options withParallelism(std::size_t parallelism) {
+  return {.name = "global", .parallelism = parallelism, .idle_worker_ns = 10 * kSecondNs};
+}
+
+void waitForThreads(const ConcurrentQueue& queue, std::size_t threads) {
+  while (queue.counts().threads != threads) rt::sleepNs(100 * kMillisecondNs);
+}
+
+TEST(ConcurrentQueue, RunsEveryTaskOnce) {
+  inEverySchedule(200, [] {
+    std::vector<std::atomic<int>> runs(50);
+    {
+      ConcurrentQueue queue(withParallelism(4));
+      for (auto& count : runs) {
+        queue.async([&count] { ++count; });
+      }
+    }
+    for (const auto& count : runs) EXPECT_EQ(count, 1);
+  });
+}
+
+TEST(ConcurrentQueue, OneWorkerStartsTasksInTheOrderOfSubmission) {
+  inEverySchedule(200, [] {
+    std::vector<int> order;
+    {
+      ConcurrentQueue queue(withParallelism(1));
+      for (int number = 0; number < 20; ++number) {
+        queue.async([&order, number] { order.push_back(number); });
+      }
+    }
+    std::vector<int> expected(20);
+    for (int number = 0; number < 20; ++number) expected[static_cast<std::size_t>(number)] = number;
+    EXPECT_EQ(order, expected);
+  });
+}
+
+TEST(ConcurrentQueue, NeverRunsMoreTasksSideBySideThanItsParallelism) {
+  inEverySchedule(200, [] {
+    std::atomic<int> running = 0;
+    std::atomic<int> most = 0;
+    rt::Mutex mutex;
+    {
+      ConcurrentQueue queue(withParallelism(3));
+      for (int number = 0; number < 30; ++number) {
+        queue.async([&] {
+          const int now = ++running;
+          {
+            const std::scoped_lock lock(mutex);
+            most = std::max(most.load(), now);
+          }
+          --running;
+        });
+      }
+    }
+    EXPECT_LE(most, 3);
+    EXPECT_GE(most, 1);
+  });
+}
+
+TEST(ConcurrentQueue, DestructorWaitsForTasksThatTasksSubmit) {
+  inEverySchedule(200, [] {
+    std::atomic<int> depth_reached = 0;
+    std::function<void(int)> descend;
+    {
+      ConcurrentQueue queue(withParallelism(2));
+      descend = [&](int depth) {
+        depth_reached = depth;
+        if (depth < 10) queue.async([&descend, depth] { descend(depth + 1); });
+      };
+      queue.async([&descend] { descend(1); });
+    }
+    EXPECT_EQ(depth_reached, 10);
+  });
+}
+
+TEST(ConcurrentQueue, TasksThatAllWaitForALaterOneEnd) {
+  inEverySchedule(100, [] {
+    std::atomic<int> ended = 0;
+    CountingSemaphore go(0);
+    {
+      ConcurrentQueue queue(withParallelism(4));
+      for (int number = 0; number < 20; ++number) {
+        queue.async([&] {
+          go.wait();
+          ++ended;
+        });
+      }
+      queue.async([&go] {
+        for (int number = 0; number < 20; ++number) go.signal();
+      });
+    }
+    EXPECT_EQ(ended, 20);
+  });
+}
+
+TEST(ConcurrentQueue, AThousandBlockedTasksNeverStarveALaterOne) {
+  inEverySchedule(4, [] {
+    CountingSemaphore go(0);
+    CountingSemaphore later_ran(0);
+    ConcurrentQueue queue(withParallelism(2));
+    for (int number = 0; number < 1'000; ++number) {
+      queue.async([&go] { go.wait(); });
+    }
+    queue.async([&later_ran] { later_ran.signal(); });
+    later_ran.wait();
+    EXPECT_EQ(queue.counts().pending, 0U);
+    EXPECT_GE(queue.counts().peak_threads, 1'000U);
+    for (int number = 0; number < 1'000; ++number) go.signal();
+  });
+}
+
+TEST(ConcurrentQueue, AWorkerInNestedRegionsCountsAsBlockedOnce) {
+  inEverySchedule(50, [] {
+    ConcurrentQueue queue(withParallelism(1));
+    CountingSemaphore checked(0);
+    queue.async([&] {
+      const BlockingRegion outer;
+      {
+        const BlockingRegion inner;
+        EXPECT_EQ(queue.counts().blocked, 1U);
+      }
+      EXPECT_EQ(queue.counts().blocked, 1U);
+      checked.signal();
+    });
+    checked.wait();
+  });
+}
+
+TEST(ConcurrentQueue, ARegionOutsideOfAWorkerDoesNothing) {
+  inEverySchedule(4, [] {
+    ConcurrentQueue queue(withParallelism(1));
+    const BlockingRegion region;
+    EXPECT_EQ(queue.counts().blocked, 0U);
+  });
+}
+
+TEST(ConcurrentQueue, IdleWorkersEndAndNoThreadIsLeft) {
+  inEverySchedule(50, [] {
+    ConcurrentQueue queue(withParallelism(4));
+    TaskGroup group;
+    for (int number = 0; number < 8; ++number) {
+      group.async(queue, [] { rt::sleepNs(kSecondNs); });
+    }
+    group.wait();
+    EXPECT_GE(queue.counts().peak_threads, 1U);
+    EXPECT_LE(queue.counts().peak_threads, 4U);
+    waitForThreads(queue, 0);
+    // An idle queue starts again when there is work.
+    CountingSemaphore ran(0);
+    queue.async([&ran] { ran.signal(); });
+    ran.wait();
+  });
+}
+
+TEST(ConcurrentQueue, AnIdleWorkerIsUsedAgainWithinItsIdleTime) {
+  inEverySchedule(50, [] {
+    ConcurrentQueue queue({.name = "global", .parallelism = 4, .idle_worker_ns = rt::kNever - 1});
+    for (int number = 0; number < 10; ++number) {
+      CountingSemaphore ran(0);
+      queue.async([&ran] { ran.signal(); });
+      ran.wait();
+      // The worker is idle again only after its task object is gone.
+      rt::sleepNs(kSecondNs);
+    }
+    EXPECT_LE(queue.counts().threads, 4U);
+    if (!onRealThreads()) {
+      EXPECT_EQ(queue.counts().peak_threads, 1U);
+    }
+  });
+}
+
+TEST(ConcurrentQueue, WhatATaskCapturedIsGoneBeforeTheQueueIs) {
+  inEverySchedule(50, [] {
+    std::weak_ptr<int> watched;
+    {
+      ConcurrentQueue queue(withParallelism(2));
+      auto owned = std::make_shared<int>(7);
+      watched = owned;
+      queue.async([owned] { EXPECT_EQ(*owned, 7); });
+    }
+    EXPECT_TRUE(watched.expired());
+  });
+}
+
+TEST(ConcurrentQueue, ZeroParallelismStillRunsTasks) {
+  inEverySchedule(4, [] {
+    std::atomic<bool> ran = false;
+    {
+      ConcurrentQueue queue(withParallelism(0));
+      queue.async([&ran] { ran = true; });
+    }
+    EXPECT_TRUE(ran);
+  });
+}
+
+TEST(ConcurrentQueueDeathTest, ATaskThatThrowsNamesTheQueue) {
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  EXPECT_DEATH(inEverySchedule(1,
+                               [] {
+                                 ConcurrentQueue queue({.name = "porridge"});
+                                 queue.async([] { throw std::runtime_error("too hot"); });
+                               }),
+               "a task of queue porridge threw: too hot");
+}
+
+}  // namespace
+}  // namespace spacekeep

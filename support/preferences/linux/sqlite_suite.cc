@@ -1,0 +1,217 @@
+#include "support/preferences/linux/sqlite_suite.h"
+
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "support/logging/log.h"
+#include "support/preferences/linux/suite_file.h"
+#include "support/values/plist.h"
+#include "support/values/text.h"
+
+namespace spacekeep {
+namespace {
+
+std::string listOf(const std::set<std::string>& keys) {
+  Array array;
+  for (const std::string& key : keys) array.push_back(key);
+  return textOf(Value(std::move(array)));
+}
+
+int bindText(sqlite3_stmt* statement, int place, const std::string& text) {
+  return sqlite3_bind_text64(statement, place, text.data(), text.size(), SQLITE_TRANSIENT,
+                             SQLITE_UTF8);
+}
+
+int runToEnd(sqlite3_stmt* statement) {
+  const int code = sqlite3_step(statement);
+  return code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+int removeKey(sqlite3* database, const std::string& key) {
+  const Statement remove = prepare(database, "DELETE FROM preferences WHERE key = ?1");
+  if (!remove) return sqlite3_extended_errcode(database);
+  const int code = bindText(remove.get(), 1, key);
+  return code == SQLITE_OK ? runToEnd(remove.get()) : code;
+}
+
+int storeKey(sqlite3* database, const std::string& key, const std::vector<std::uint8_t>& bytes) {
+  const Statement store =
+      prepare(database, "INSERT OR REPLACE INTO preferences (key, value) VALUES (?1, ?2)");
+  if (!store) return sqlite3_extended_errcode(database);
+  int code = bindText(store.get(), 1, key);
+  if (code == SQLITE_OK) {
+    code = sqlite3_bind_blob64(store.get(), 2, bytes.data(), bytes.size(), SQLITE_TRANSIENT);
+  }
+  return code == SQLITE_OK ? runToEnd(store.get()) : code;
+}
+
+// In the first transaction and not when the file is opened, so that opening writes nothing.
+int makeTable(sqlite3* database) {
+  static const std::string sql =
+      "PRAGMA application_id = " + std::to_string(kSuiteApplicationId) +
+      "; PRAGMA user_version = " + std::to_string(kSuiteVersion) +
+      "; CREATE TABLE IF NOT EXISTS preferences"
+      " (key TEXT PRIMARY KEY NOT NULL, value BLOB NOT NULL) WITHOUT ROWID";
+  return execute(database, sql.c_str());
+}
+
+// A rollback journal that stays (no inode is needed for a commit once it is there), every commit
+// through to the disk before it returns.
+int configure(sqlite3* database, const SqliteSuiteOptions& options) {
+  sqlite3_busy_timeout(database, options.busy_timeout_ms);
+  const std::string sql =
+      "PRAGMA journal_mode = PERSIST; PRAGMA synchronous = EXTRA; PRAGMA temp_store = MEMORY;"
+      "PRAGMA trusted_schema = OFF; PRAGMA max_page_count = " +
+      std::to_string(options.max_pages);
+  return execute(database, sql.c_str());
+}
+
+std::string columnText(sqlite3_stmt* row, int column) {
+  const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(row, column));
+  const auto length = static_cast<std::size_t>(sqlite3_column_bytes(row, column));
+  return text == nullptr ? std::string() : std::string(text, length);
+}
+
+std::span<const std::uint8_t> columnBytes(sqlite3_stmt* row, int column) {
+  const auto* bytes = static_cast<const std::uint8_t*>(sqlite3_column_blob(row, column));
+  return {bytes, static_cast<std::size_t>(sqlite3_column_bytes(row, column))};
+}
+
+}  // namespace
+
+std::unique_ptr<SqliteSuite> SqliteSuite::open(const std::string& directory,
+                                               const std::string& name,
+                                               SqliteSuiteOptions options) {
+  auto opened = openSuiteFile(directory, name);
+  if (const auto* error = std::get_if<SuiteFileError>(&opened)) {
+    logProblem("%s the suite %@ cannot be opened: %@", "openPreferencesSuite", name, error->reason);
+    return nullptr;
+  }
+  Database database = std::get<Database>(std::move(opened));
+  const int configured = configure(database.get(), options);
+  const std::string path = directory + "/" + name + ".sqlite";
+  std::unique_ptr<SqliteSuite> suite(
+      new SqliteSuite(std::move(database), path, std::move(options)));
+  Failure failure = suite->failure(configured);
+  if (failure.code == SQLITE_OK) failure = suite->loadIfChanged();
+  if (failure.code == SQLITE_OK) return suite;
+  logProblem("%s the suite %@ cannot be opened: %@", "openPreferencesSuite", name, failure.reason);
+  return nullptr;
+}
+
+std::optional<Value> SqliteSuite::get(std::string_view key) {
+  if (const auto set = pending_.find(key); set != pending_.end()) return set->second;
+  const auto found = stored_.find(key);
+  return found == stored_.end() ? std::nullopt : std::optional(found->second);
+}
+
+void SqliteSuite::set(std::string_view key, std::optional<Value> value) {
+  pending_.insert_or_assign(std::string(key), std::move(value));
+}
+
+std::optional<std::string> SqliteSuite::synchronize() {
+  std::set<std::string> given_up;
+  Failure failure = commitPending(given_up);
+  if ((failure.code & 0xff) == SQLITE_FULL && options_.make_room()) {
+    given_up.clear();
+    failure = commitPending(given_up);
+  }
+  if (failure.code != SQLITE_OK) {
+    return path_ + " cannot be written, what was set is kept for the next try: " + failure.reason;
+  }
+  failure = loadIfChanged();
+  if (failure.code != SQLITE_OK) return path_ + " cannot be read: " + failure.reason;
+  if (given_up.empty()) return std::nullopt;
+  return path_ + ": too deep or too large to be stored and given up: " + listOf(given_up);
+}
+
+SqliteSuite::Failure SqliteSuite::failure(int code) const {
+  return code == SQLITE_OK ? Failure{} : Failure{code, sqliteText(database_.get(), code)};
+}
+
+SqliteSuite::Failure SqliteSuite::commitPending(std::set<std::string>& given_up) {
+  if (pending_.empty()) return {};
+  int code = execute(database_.get(), "BEGIN IMMEDIATE");
+  if (code != SQLITE_OK) return failure(code);
+  code = writePending(given_up);
+  if (code == SQLITE_OK) code = execute(database_.get(), "COMMIT");
+  if (code != SQLITE_OK) {
+    Failure what = failure(code);
+    // Some errors have rolled back already; the one that matters is kept above.
+    static_cast<void>(execute(database_.get(), "ROLLBACK"));
+    return what;
+  }
+  keepCommitted(given_up);
+  return {};
+}
+
+int SqliteSuite::writePending(std::set<std::string>& given_up) {
+  int code = makeTable(database_.get());
+  for (const auto& [key, value] : pending_) {
+    if (code != SQLITE_OK) return code;
+    if (!value) {
+      code = removeKey(database_.get(), key);
+      continue;
+    }
+    const std::vector<std::uint8_t> bytes = binaryPlist(*value);
+    if (bytes.empty()) {
+      given_up.insert(key);
+    } else {
+      code = storeKey(database_.get(), key, bytes);
+    }
+  }
+  return code;
+}
+
+void SqliteSuite::keepCommitted(const std::set<std::string>& given_up) {
+  for (auto& [key, value] : pending_) {
+    if (given_up.contains(key)) continue;
+    if (value) {
+      stored_.insert_or_assign(key, std::move(*value));
+    } else {
+      stored_.erase(key);
+    }
+  }
+  pending_.clear();
+}
+
+// The counter moves when another connection commits, not when this one does (pragma data_version).
+SqliteSuite::Failure SqliteSuite::loadIfChanged() {
+  int code = SQLITE_OK;
+  const std::int64_t version = queryInteger(database_.get(), "PRAGMA data_version", code);
+  if (code != SQLITE_ROW) return failure(code);
+  if (data_version_ == version) return {};
+  Failure result = load();
+  if (result.code == SQLITE_OK) data_version_ = version;
+  return result;
+}
+
+SqliteSuite::Failure SqliteSuite::load() {
+  int code = SQLITE_OK;
+  const std::int64_t tables = queryInteger(
+      database_.get(), "SELECT count(*) FROM sqlite_schema WHERE name = 'preferences'", code);
+  if (code != SQLITE_ROW) return failure(code);
+  std::map<std::string, Value, std::less<>> loaded;
+  if (tables > 0) {
+    const Statement rows = prepare(database_.get(), "SELECT key, value FROM preferences");
+    code = rows ? sqlite3_step(rows.get()) : sqlite3_extended_errcode(database_.get());
+    for (; code == SQLITE_ROW; code = sqlite3_step(rows.get())) loadRow(rows.get(), loaded);
+    if (code != SQLITE_DONE) return failure(code);
+  }
+  stored_ = std::move(loaded);
+  return {};
+}
+
+// A value that cannot be read is left on disk, where a person can look at it, until it is set anew.
+void SqliteSuite::loadRow(sqlite3_stmt* row, std::map<std::string, Value, std::less<>>& loaded) {
+  const std::string key = columnText(row, 0);
+  auto value = parsePlist(columnBytes(row, 1));
+  if (const auto* error = std::get_if<PlistError>(&value)) {
+    logProblem("%s %@: the value of %@ is left out: %@", "loadSuite", path_, key, error->reason);
+    return;
+  }
+  loaded.insert_or_assign(key, std::get<Value>(std::move(value)));
+}
+
+}  // namespace spacekeep

@@ -1,0 +1,29 @@
+// Thread safety: confined to one thread at a time.
+//
+// Getting from a name to an open, sound SQLite file, whatever stands in its place.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <variant>
+
+#include "support/preferences/linux/sqlite.h"
+
+namespace spacekeep {
+
+/// In the file's header, so that the file of another program is not taken for a suite ("SKPF").
+inline constexpr std::int64_t kSuiteApplicationId = 0x534b5046;
+inline constexpr std::int64_t kSuiteVersion = 1;
+
+struct SuiteFileError {
+  std::string reason;
+};
+
+/// Bytes, no slash, no leading dot, at most 200: goes into a file name as it is.
+[[nodiscard]] bool isSafeSuiteName(const std::string& name);
+
+/// As SqliteSuite::open describes. Setting aside is logged here.
+[[nodiscard]] std::variant<Database, SuiteFileError> openSuiteFile(const std::string& directory,
+                                                                   const std::string& name);
+
+}  // namespace spacekeep

@@ -4,11 +4,14 @@
 #pragma once
 
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
 
 #include "support/ipc/connection.h"
 #include "support/queues/concurrent_queue.h"
+#include "support/queues/serial_queue.h"
+#include "support/runtime/runtime.h"
 
 namespace spacekeep {
 
@@ -31,7 +34,9 @@ class ServiceCaller {
   /// Returns at once. Later, on another thread, runs `call`; runs `failure` instead (or as well,
   /// once, when the connection fails before `done`) if there is no record, the service cannot be
   /// reached or the connection fails. Neither ever runs from within this function: callers may
-  /// hold a queue that the failure handler needs.
+  /// hold a queue that the failure handler needs. Call handlers of one service run in the order of
+  /// these calls, one at a time, so that a cancel never overtakes the request that it is about;
+  /// therefore a call handler must not wait for a later call to the same service.
   void CallServiceAsync(std::shared_ptr<const ServiceReference> service, CallHandler call,
                         FailureHandler failure);
 
@@ -40,9 +45,21 @@ class ServiceCaller {
                    FailureHandler failure);
 
  private:
+  class Attempt;
+  using Invoked = std::function<void()>;
+
+  void start(std::shared_ptr<const ServiceReference> service, CallHandler call,
+             FailureHandler failure, Invoked invoked);
+  [[nodiscard]] std::shared_ptr<ipc::Connection> reach(const ServiceReference& service) const;
+  [[nodiscard]] std::shared_ptr<SerialQueue> orderOf(const std::string& service_id);
+
   ConcurrentQueue& global_;
   ipc::Connector& connector_;
   const ipc::InterfaceDescription& interface_;
+  rt::Mutex mutex_;
+  /// Protected by mutex_. One for each service that is being called; a queue lives while it has
+  /// tasks.
+  std::map<std::string, std::weak_ptr<SerialQueue>> orders_;
 };
 
 }  // namespace spacekeep

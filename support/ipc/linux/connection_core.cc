@@ -23,7 +23,7 @@ std::string textOrEmpty(const char* text) { return text == nullptr ? "" : text; 
 
 ConnectionCore::ConnectionCore(IpcLoop& loop, ConcurrentQueue& global, SharedDescriptor descriptor,
                                const ConnectionLimits& limits)
-    : loop_(loop),
+    : inbox_(loop.inbox()),
       global_(global),
       limits_(limits),
       descriptor_(std::move(descriptor)),
@@ -50,14 +50,14 @@ void ConnectionCore::resume() {
   if (resumed_) return;
   resumed_ = true;
   // Posted under the lock, so that no call overtakes those that were held.
-  loop_.post([self = shared_from_this(), held = std::move(held_)]() mutable {
+  inbox_->post([self = shared_from_this(), held = std::move(held_)]() mutable {
     self->start(std::move(held));
   });
   held_.clear();
 }
 
 void ConnectionCore::invalidate() {
-  loop_.post([self = shared_from_this()] {
+  inbox_->post([self = shared_from_this()] {
     if (self->finished_) return;
     self->link_.close();
     self->failPending({kErrorDisconnected, "the connection was invalidated"});
@@ -105,7 +105,7 @@ Error ConnectionCore::admit(std::string_view member, const Arguments& arguments,
 }
 
 void ConnectionCore::post(Call call) {
-  loop_.post([self = shared_from_this(), call = std::move(call)]() mutable {
+  inbox_->post([self = shared_from_this(), call = std::move(call)]() mutable {
     self->transmit(std::move(call));
   });
 }

@@ -68,7 +68,7 @@ class ConnectionCore final : public BusLink::Owner,
   void failPending(const Error& error);
   void finish(End how);
 
-  IpcLoop& loop_;
+  const std::shared_ptr<IpcLoop::Inbox> inbox_;
   ConcurrentQueue& global_;
   const ConnectionLimits limits_;
 

@@ -24,10 +24,10 @@ class BusConnection final : public Connection, public std::enable_shared_from_th
  public:
   BusConnection(IpcLoop& loop, ConcurrentQueue& global, SharedDescriptor descriptor,
                 const ConnectionLimits& limits)
-      : loop_(loop),
+      : inbox_(loop.inbox()),
         core_(std::make_shared<ConnectionCore>(loop, global, std::move(descriptor), limits)) {}
   ~BusConnection() override {
-    loop_.post([core = std::move(core_)] { core->abandon(); });
+    inbox_->post([core = std::move(core_)] { core->abandon(); });
   }
 
   void setInvalidationHandler(Handler handler) override {
@@ -60,7 +60,7 @@ class BusConnection final : public Connection, public std::enable_shared_from_th
     const ConnectionCore::SharedErrorHandler on_error_;
   };
 
-  IpcLoop& loop_;
+  const std::shared_ptr<IpcLoop::Inbox> inbox_;
   std::shared_ptr<ConnectionCore> core_;
 };
 

@@ -21,29 +21,27 @@ IpcLoop::IpcLoop() {
   if (sd_event_add_io(event_, nullptr, wake_fd_, EPOLLIN, &IpcLoop::onWake, this) < 0) {
     rt::panic("IPC: the event loop takes no wake-up source");
   }
+  inbox_ = std::make_shared<Inbox>(wake_fd_);
   thread_ = rt::Thread("ipc", [this] { run(); });
 }
 
 IpcLoop::~IpcLoop() {
-  post([this] {
-    const std::scoped_lock lock(mutex_);
-    stopping_ = true;
-  });
+  post([this] { stopping_ = true; });
   thread_.join();
   sd_event_unref(event_);
   ::close(wake_fd_);
 }
 
-void IpcLoop::post(Task task) {
-  {
-    const std::scoped_lock lock(mutex_);
-    posted_.push_back(std::move(task));
-    if (wake_pending_) return;
-    wake_pending_ = true;
-  }
-  // A counter of 1 fits always, so the write cannot fail.
+bool IpcLoop::Inbox::post(Task task) {
+  const std::scoped_lock lock(mutex_);
+  if (stopped_) return false;
+  posted_.push_back(std::move(task));
+  if (std::exchange(wake_pending_, true)) return true;
+  // A counter of 1 fits always, so the write cannot fail. It happens under the lock, since the
+  // descriptor is closed once stopped_ is set.
   const std::uint64_t one = 1;
   [[maybe_unused]] const ssize_t written = ::write(wake_fd_, &one, sizeof one);
+  return true;
 }
 
 void IpcLoop::runAndWait(const Task& task) {
@@ -71,9 +69,9 @@ int IpcLoop::onWake(sd_event_source*, int fd, std::uint32_t, void* self) {
 void IpcLoop::runPosted() {
   std::vector<Task> tasks;
   {
-    const std::scoped_lock lock(mutex_);
-    tasks.swap(posted_);
-    wake_pending_ = false;
+    const std::scoped_lock lock(inbox_->mutex_);
+    tasks.swap(inbox_->posted_);
+    inbox_->wake_pending_ = false;
   }
   for (Task& task : tasks) {
     task();
@@ -84,9 +82,10 @@ void IpcLoop::runPosted() {
 void IpcLoop::run() {
   current_loop = this;
   while (true) {
-    {
-      const std::scoped_lock lock(mutex_);
-      if (stopping_ && posted_.empty()) return;
+    if (stopping_) {
+      const std::scoped_lock lock(inbox_->mutex_);
+      inbox_->stopped_ = inbox_->posted_.empty();
+      if (inbox_->stopped_) return;
     }
     if (sd_event_run(event_, UINT64_MAX) < 0) rt::panic("IPC: the event loop failed");
     wakeups_.fetch_add(1, std::memory_order_relaxed);

@@ -22,19 +22,27 @@ class ConcurrentQueue::Membership {
  public:
   explicit Membership(ConcurrentQueue& queue) : queue_(queue) {}
   ~Membership() {
+    if (has_left_) return;
     const Lock lock(queue_.mutex_);
+    leave();
+  }
+  Membership(const Membership&) = delete;
+  Membership& operator=(const Membership&) = delete;
+
+  /// With the queue's lock held.
+  void leave() {
+    has_left_ = true;
     --queue_.threads_;
     if (is_idle) --queue_.idle_;
     // Notified under the lock: the destructor that waits for this frees the queue right after.
     queue_.worker_ended_.notifyAll();
   }
-  Membership(const Membership&) = delete;
-  Membership& operator=(const Membership&) = delete;
 
   bool is_idle = true;
 
  private:
   ConcurrentQueue& queue_;
+  bool has_left_ = false;
 };
 
 ConcurrentQueue::ConcurrentQueue(Options options)
@@ -115,6 +123,8 @@ void ConcurrentQueue::work(Worker& self) {
     membership.is_idle = true;
     provideWorker();
   }
+  // Before the lock is given back: a task that comes now must not count on this worker.
+  membership.leave();
 }
 
 /// Waits for a task; false when the worker should end instead.

@@ -1,0 +1,163 @@
+// Services that check in at run time.
+#include <gtest/gtest.h>
+
+#include "tests/both/daemon/daemon_world.h"
+#include "tests/helpers/schedules.h"
+
+namespace spacekeep::test {
+namespace {
+
+using CallState = sim::ClientCall::State;
+
+const Dictionary kPurges{{"PURGE", true}};
+
+TEST(CheckIn, ANewServiceIsPingedRegisteredAndAnswered) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto cache = world.world.addService("cache");
+    const auto call = world.world.checkIn(
+        cache, {{"PURGE", true}, {"PERIODIC", 1}, {"SPACEKEEP_NOTIFICATIONS", Array{"news"}}});
+    EXPECT_EQ(call->wait(), (Dictionary{{"SPACEKEEP_ID", "cache"}, {"ANON", true}}));
+    EXPECT_EQ(std::get<ipc::OptionalString>(call->answer()[1]), std::nullopt);
+    EXPECT_EQ(cache->callCount("servicePing"), 1U);
+    const auto record = world.services().at("cache");
+    EXPECT_EQ(record->ID, "cache");
+    EXPECT_TRUE(record->doesPurge());
+    EXPECT_TRUE(record->doesPeriodic());
+    EXPECT_FALSE(record->doNotQuery());
+    EXPECT_TRUE(record->desires("news"));
+    EXPECT_NE(record->connection, nullptr);
+    EXPECT_NE(record->endpoint(), nullptr);
+    EXPECT_TRUE(world.daemons().empty());
+  });
+}
+
+TEST(CheckIn, UnderAnIdOfADescriptorIsAnsweredWithNeitherResultNorError) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.world.declareService("declared", {});
+    world.start();
+    const auto impostor = world.world.addService("declared");
+    const auto before = world.services();
+    const auto call = world.world.checkIn(impostor, kPurges);
+    EXPECT_EQ(call->wait(), std::nullopt);
+    EXPECT_EQ(call->state(), CallState::kAnswered);
+    EXPECT_EQ(std::get<ipc::OptionalString>(call->answer()[1]), std::nullopt);
+    EXPECT_EQ(world.services(), before);
+    EXPECT_TRUE(impostor->calls().empty());
+    EXPECT_TRUE(world.world.trace().linesOfLevel(kLogProblem).empty());
+  });
+}
+
+TEST(CheckIn, WithoutTheServiceEntitlementIsNeverAnswered) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto cache = world.world.addService("cache");
+    const auto call =
+        world.world.call(world.world.client("nobody"), "clientCheckin",
+                         {std::string("cache"), world.world.endpointOf(cache), kPurges});
+    EXPECT_EQ(call->wait(), std::nullopt);
+    EXPECT_EQ(call->state(), CallState::kDropped);
+    EXPECT_TRUE(world.services().empty());
+    EXPECT_TRUE(cache->calls().empty());
+    EXPECT_EQ(world.world.trace().linesOfLevel(kLogProblem),
+              std::vector<std::string>{"clientCheckin Connection is not entitled!"});
+  });
+}
+
+TEST(CheckIn, TheSecondOneChangesTheFlagsAndKeepsTheFirstConnection) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto cache = world.world.addService("cache");
+    world.world.checkIn(cache, {{"PURGE", true}, {"PERIODIC", true}})->wait();
+    const auto record = world.services().at("cache");
+    const auto connection = record->connection;
+    const auto endpoint = record->endpoint();
+    const auto call = world.world.checkIn(cache, {{"PURGE", false}});
+    EXPECT_EQ(call->wait(), (Dictionary{{"SPACEKEEP_ID", "cache"}, {"ANON", true}}));
+    EXPECT_EQ(world.services().at("cache"), record);
+    EXPECT_FALSE(record->doesPurge());
+    EXPECT_FALSE(record->doesPeriodic());
+    EXPECT_EQ(record->connection, connection);
+    EXPECT_EQ(record->endpoint(), endpoint);
+    EXPECT_EQ(world.world.connector().connectionsMade(), 1U);
+    EXPECT_EQ(cache->callCount("servicePing"), 1U);
+    EXPECT_TRUE(world.world.trace().hasLine("clientCheckin operating on an existing service"));
+  });
+}
+
+TEST(CheckIn, WithoutNotificationsClearsThem) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto cache = world.world.addService("cache");
+    world.world.checkIn(cache, {{"SPACEKEEP_NOTIFICATIONS", Array{"news"}}})->wait();
+    EXPECT_TRUE(world.services().at("cache")->desires("news"));
+    world.world.checkIn(cache, kPurges)->wait();
+    EXPECT_EQ(world.services().at("cache")->desiredNotifications(), std::nullopt);
+  });
+}
+
+TEST(CheckIn, AServiceThatClosesItsConnectionIsRemovedAndMayComeBack) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto cache = world.world.addService("cache");
+    world.world.checkIn(cache, kPurges)->wait();
+    const auto first = world.services().at("cache");
+    cache->closeConnections();
+    EXPECT_TRUE(world.eventually([&] { return world.services().empty(); }));
+    EXPECT_TRUE(world.world.trace().hasLine("clientCheckin invalidationHandler ENTRY"));
+    world.world.checkIn(cache, kPurges)->wait();
+    EXPECT_NE(world.services().at("cache"), first);
+    EXPECT_EQ(cache->callCount("servicePing"), 2U);
+    EXPECT_EQ(world.world.connector().connectionsMade(), 2U);
+  });
+}
+
+TEST(CheckIn, AServiceWhoseProcessDiesIsRemoved) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto cache = world.world.addService("cache");
+    world.world.checkIn(cache, kPurges)->wait();
+    cache->die();
+    EXPECT_TRUE(world.eventually([&] { return world.services().empty(); }));
+    EXPECT_TRUE(world.world.trace().hasLine("clientCheckin interruptionHandler ENTRY"));
+  });
+}
+
+TEST(CheckIn, TheEndOfAnOldConnectionLeavesANewerRecordAlone) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto cache = world.world.addService("cache");
+    world.world.checkIn(cache, kPurges)->wait();
+    const auto older = world.services().at("cache");
+    const auto newer = std::make_shared<SKService>("cache");
+    world.daemon->collection_queue()->sync([&] { world.daemon->setServices({{"cache", newer}}); });
+    cache->closeConnections();
+    EXPECT_TRUE(world.eventually(
+        [&] { return world.world.trace().hasLine("clientCheckin invalidationHandler ENTRY"); }));
+    rt::sleepNs(1'000'000'000);  // time enough for a removal that must not come
+    EXPECT_EQ(world.services().at("cache"), newer);
+  });
+}
+
+TEST(CheckIn, TwoServicesAtOnceAreBothRegistered) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto a = world.world.checkIn(world.world.addService("a"), kPurges);
+    const auto b = world.world.checkIn(world.world.addService("b"), kPurges);
+    a->wait();
+    b->wait();
+    EXPECT_EQ(world.services().size(), 2U);
+  });
+}
+
+}  // namespace
+}  // namespace spacekeep::test

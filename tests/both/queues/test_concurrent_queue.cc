@@ -189,6 +189,18 @@ TEST(ConcurrentQueue, AnIdleWorkerIsUsedAgainWithinItsIdleTime) {
   });
 }
 
+TEST(ConcurrentQueue, ATaskThatComesJustAsTheWorkerEndsStillRuns) {
+  inEverySchedule(400, [] {
+    ConcurrentQueue queue({.name = "global", .parallelism = 2, .idle_worker_ns = kSecondNs});
+    for (int number = 0; number < 5; ++number) {
+      CountingSemaphore ran(0);
+      queue.async([&ran] { ran.signal(); });
+      ran.wait();
+      rt::sleepNs(kSecondNs);
+    }
+  });
+}
+
 TEST(ConcurrentQueue, WhatATaskCapturedIsGoneBeforeTheQueueIs) {
   inEverySchedule(50, [] {
     std::weak_ptr<int> watched;

@@ -138,10 +138,10 @@ TEST(SqliteSuite, AFileThatOthersMayReadIsLockedDown) {
   EXPECT_EQ(modeOf(fileOf(directory)), 0600u);
 }
 
-TEST(SqliteSuite, EveryCommitGoesThroughToTheDisk) {
+TEST(SqliteSuite, TheJournalStaysAfterACommitWithNothingToPlayBack) {
   const TemporaryDirectory directory;
   store(directory, "k", 1);
-  // The journal stays after the commit, its header cleared: there is nothing to play back.
+  // Its header is cleared, which is the moment that commits.
   const std::string journal = contentOf(fileOf(directory) + "-journal");
   ASSERT_GE(journal.size(), 28u);
   EXPECT_EQ(journal.substr(0, 28), std::string(28, '\0'));

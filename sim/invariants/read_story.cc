@@ -234,6 +234,11 @@ class Reader {
       if (operation.begin_at > task.at) continue;
       if (operation.end_at > task.at || outstandingTasks(i, task) > 0) possible.push_back(i);
     }
+    if (possible.empty()) {
+      for (std::size_t i = 0; i < story_.operations.size(); ++i) {
+        if (story_.operations[i].begin_at < task.at) possible.push_back(i);
+      }
+    }
     if (possible.size() == 1) {
       task.operation = possible.front();
       story_.operations[task.operation].services.insert(task.service);

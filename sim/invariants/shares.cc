@@ -122,6 +122,22 @@ void checkSum(const PurgeStory& story, std::size_t index, std::size_t pass_index
   }
 }
 
+/// From here on the purge may set its divisor anew.
+std::size_t firstWake(const PurgeStory& story, std::size_t index) {
+  const Operation& operation = story.operations[index];
+  if (operation.passes.empty()) return operation.begin_at;
+  std::size_t first =
+      std::min(operation.passes.front().timed_out_at, operation.passes.front().stats_at);
+  for (const Reply& reply : story.replies) {
+    if (reply.operation == index && reply.signals > 0) first = std::min(first, reply.removing_at);
+  }
+  if (truthAt(operation.request, "SPACEKEEP_FINISH_EARLY") &&
+      story.hadReached(operation, operation.begin_at, first)) {
+    return operation.begin_at;
+  }
+  return first;
+}
+
 }  // namespace
 
 void checkSharesAreEqualParts(const PurgeStory& story, Findings& findings) {
@@ -195,20 +211,13 @@ void checkNobodyIsAskedForNothing(const PurgeStory& story, Findings& findings) {
   }
 }
 
-// From the services less those in flight, by one down with each reply that fell short. A reply in
-// the middle of being booked may or may not have counted yet.
+// In the first urgency it starts as the number of services and goes down by one with each reply
+// that fell short. A reply in the middle of being booked may or may not have counted yet.
 void checkDivisor(const PurgeStory& story, Findings& findings) {
   for (const ShareTask& task : story.tasks) {
     if (!task.share || task.operation == kNowhere) continue;
     const Operation& operation = story.operations[task.operation];
-    if (operation.blurred || operation.passes.empty()) continue;
-    const std::size_t first_asked = operation.passes.front().asked_at;
-    const bool in_first_pass =
-        operation.passes.size() == 1 || task.share->at < operation.passes[1].begin_at;
-    if (!in_first_pass || first_asked == kNowhere ||
-        operation.passes.front().stats_at < task.share->at) {
-      continue;
-    }
+    if (operation.blurred || task.share->at > firstWake(story, task.operation)) continue;
     std::uint64_t surely = 0;
     std::uint64_t possibly = 0;
     for (const Reply& reply : story.replies) {

@@ -68,6 +68,10 @@ OwnedBytes drawOwned(Random& random, std::uint64_t about_bytes) {
   return owned;
 }
 
+bool claimsMoreThanItFrees(const CallBehaviour& call) {
+  return call.percent_reported > 100 || call.reported_extra > 0 || call.space_returns_after_ns > 0;
+}
+
 ServiceBehaviour drawBehaviour(Random& random, std::uint64_t about_bytes) {
   ServiceBehaviour behaviour;
   behaviour.owns[kRoot] = drawOwned(random, about_bytes);
@@ -78,6 +82,8 @@ ServiceBehaviour drawBehaviour(Random& random, std::uint64_t about_bytes) {
   for (std::uint64_t step = 0; step < steps; ++step) {
     behaviour.purge.push_back(plain ? CallBehaviour{} : drawPurgeCall(random));
   }
+  // The last entry stands for every later call, see the header for claims without end.
+  if (claimsMoreThanItFrees(behaviour.purge.back())) behaviour.purge.emplace_back();
   behaviour.ping.delay_ns = random.percent(20) ? drawDelay(random) : 0;
   if (random.percent(10)) behaviour.cancel.answer = Answer::kNever;
   behaviour.cancel_stops_purge = random.percent(30);

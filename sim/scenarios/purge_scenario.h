@@ -20,6 +20,9 @@
 // - A service that is silent to its ping for good, or whose connection fails before it has answered
 //   it: by its description the daemon then waits for ever, and with it everybody. Pings are late
 //   here, never lost.
+// - A service that for ever claims what it did not free, in no time at all: it is asked again and
+//   again until the wait runs out, and in virtual time a wait does not run out while there is work.
+//   Services claim falsely a few times here and then tell the truth.
 // - A clock that runs backwards, memory that runs out, threads that get no turn at all.
 // - A volume whose free space is read wrong: what the volume shows is the truth here.
 // - Two purges that need the very same number of bytes: the log tells purges apart by it.

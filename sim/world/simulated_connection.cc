@@ -117,6 +117,7 @@ void SimulatedConnection::deliver(std::uint64_t call) {
     return;
   }
   const auto self = shared_from_this();
+  incoming.connection = this;
   incoming.reply = [self, call](ipc::Arguments answer) { self->replied(call, std::move(answer)); };
   incoming.fail = [self](ConnectionEnd how) { self->end(how); };
   service_->receive(std::move(incoming));
@@ -167,6 +168,7 @@ void SimulatedConnection::end(ConnectionEnd how) {
     on_invalidation_ = nullptr;
     on_interruption_ = nullptr;
   }
+  if (service_ != nullptr) service_->connectionEnded(this);
   for (auto& [call, pending] : failed) {
     if (pending.member == kPing) {
       const std::scoped_lock lock(mutex_);

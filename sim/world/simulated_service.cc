@@ -268,7 +268,6 @@ void SimulatedService::die() {
     alive_ = false;
   }
   trace_.add(WorldChanged{id_ + " dies"});
-  failOpenCalls();
   endConnections(ConnectionEnd::kInterrupted);
 }
 
@@ -280,7 +279,6 @@ void SimulatedService::start() {
 
 void SimulatedService::closeConnections() {
   trace_.add(WorldChanged{id_ + " closes its connections"});
-  failOpenCalls();
   endConnections(ConnectionEnd::kInvalidated);
 }
 
@@ -289,15 +287,20 @@ bool SimulatedService::alive() const {
   return alive_;
 }
 
-void SimulatedService::failOpenCalls() {
-  std::map<std::uint64_t, OpenCall> dropped;
+void SimulatedService::connectionEnded(const SimulatedConnection* connection) {
+  std::vector<OpenCall> dropped;
   const std::scoped_lock lock(mutex_);
-  dropped.swap(open_);
-  for (const auto& [call, open] : dropped) {
-    RecordedCall& record = records_[open.record];
+  for (auto call = open_.begin(); call != open_.end();) {
+    if (call->second.incoming.connection != connection) {
+      ++call;
+      continue;
+    }
+    RecordedCall& record = records_[call->second.record];
     record.state = RecordedCall::State::kFailed;
     record.ended_ns = trace_.nowNs();
-    trace_.add(ServiceCallFailed{id_, record.member, call});
+    trace_.add(ServiceCallFailed{id_, record.member, record.call});
+    dropped.push_back(std::move(call->second));
+    call = open_.erase(call);
   }
 }
 

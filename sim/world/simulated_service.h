@@ -44,6 +44,7 @@ struct RecordedCall {
 
 /// A call as the connection hands it over. Exactly one of the two is to be called, once.
 struct IncomingCall {
+  const SimulatedConnection* connection = nullptr;
   const ipc::MethodDescription* method = nullptr;
   ipc::Arguments arguments;
   std::function<void(ipc::Arguments)> reply;
@@ -85,6 +86,8 @@ class SimulatedService : public std::enable_shared_from_this<SimulatedService> {
   // For connections.
   void receive(IncomingCall incoming);
   void connected(const std::shared_ptr<SimulatedConnection>& connection);
+  /// The calls that came over it are given up.
+  void connectionEnded(const SimulatedConnection* connection);
 
  private:
   struct OpenCall {
@@ -100,7 +103,6 @@ class SimulatedService : public std::enable_shared_from_this<SimulatedService> {
   void end(std::uint64_t call);
   void stopPurges();
   void finish(OpenCall open);
-  void failOpenCalls();
   void endConnections(ConnectionEnd how);
   [[nodiscard]] std::uint64_t giveUp(const RecordedCall& record, const CallBehaviour& behaviour);
   [[nodiscard]] Dictionary answerTo(RecordedCall& record, const CallBehaviour& behaviour);

@@ -139,16 +139,20 @@ std::string CheckInLoop::awaitAnswer(Session& session) {
   const std::uint64_t patience =
       rt::deadlineAfterNs(static_cast<std::uint64_t>(patience_ms) * 1'000'000);
   if (!control_->waitUntil(patience, settled) && !control_->stopping()) {
-    control_->report(
-        HostState::kCheckingIn,
-        "the daemon has not answered the check-in yet; it never answers a user who does "
-        "not hold \"SERVICE_ENTITLEMENT\", and answers late while it waits for another "
-        "service");
+    control_->report(HostState::kCheckingIn,
+                     "the daemon has not answered the check-in yet; it answers late while it waits "
+                     "for another service, or while it does not get an answer to its ping");
     control_->waitUntil(rt::kNever, settled);
   }
-  // After a wish to stop, give the daemon the time to finish its ping.
-  if (!control_->waitUntil(rt::deadlineAfterNs(kGraceNs), settled, false)) return "stopped";
-  return serveUntilLost(session);
+  // Time for the rest of what is on its way: after a wish to stop, the daemon's ping; after the
+  // service's connection was closed, the answer that may say why.
+  const auto answered = [&session] { return session.answer.has_value() || session.daemon_lost; };
+  if (control_->waitUntil(rt::deadlineAfterNs(kGraceNs), answered, false)) {
+    return serveUntilLost(session);
+  }
+  return "the daemon dropped the check-in without an answer, as it does when this user does not "
+         "hold "
+         "\"SERVICE_ENTITLEMENT\"";
 }
 
 std::string CheckInLoop::serveUntilLost(Session& session) {

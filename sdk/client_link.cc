@@ -6,6 +6,7 @@
 #include <mutex>
 #include <optional>
 #include <utility>
+#include <vector>
 
 #include "client/client_protocol.h"
 #include "sdk/deadline_timer.h"
@@ -26,6 +27,7 @@ struct ClientLink::Shared {
   bool ended = false;
   bool turned_away = false;  ///< ended by a daemon that lives and has never answered anything
   bool closing = false;      ///< by this side
+  std::vector<std::function<void()>> waiting_for_end;
 
   void noteAnswer() {
     const std::scoped_lock lock(mutex);
@@ -33,23 +35,44 @@ struct ClientLink::Shared {
   }
 
   void noteEnd(bool daemon_lives) {
+    std::vector<std::function<void()>> explanations;
+    bool tell = false;
     {
       const std::scoped_lock lock(mutex);
-      if (ended || closing) return;
       ended = true;
-      turned_away = daemon_lives && !answered;
+      turned_away = daemon_lives && !answered && !closing;
+      tell = !closing && options.on_disconnect;
+      explanations.swap(waiting_for_end);
     }
-    if (options.on_disconnect) options.on_disconnect();
+    for (const auto& explanation : explanations) explanation();
+    if (tell) options.on_disconnect();
   }
 
-  /// The daemon turns a peer away by closing the connection, which by itself looks like any other
-  /// disconnect. A person needs to hear of the missing right.
-  [[nodiscard]] Error explain(Error error) const {
-    const std::scoped_lock lock(mutex);
-    if (error.kind != ErrorKind::kDisconnected || answered || closing) return error;
-    return {turned_away ? ErrorKind::kNotAllowed : ErrorKind::kDisconnected,
+  /// Runs `fail` with the error, later if why the connection ended is not known yet: the daemon
+  /// turns a peer away by closing, which looks like any other disconnect until its process is found
+  /// to live. A person needs to hear of the missing right.
+  void explain(Error error, std::function<void(Error)> fail) {
+    {
+      const std::scoped_lock lock(mutex);
+      if (error.kind == ErrorKind::kDisconnected && !answered && !closing) {
+        if (!ended) {
+          waiting_for_end.emplace_back(
+              [this, error = std::move(error), fail = std::move(fail)] { fail(explained(error)); });
+          return;
+        }
+        error = explained(error);
+      }
+    }
+    fail(std::move(error));
+  }
+
+ private:
+  /// Only once the connection has ended.
+  [[nodiscard]] Error explained(const Error& error) const {
+    if (!turned_away) return error;
+    return {ErrorKind::kNotAllowed,
             fmt::format("the daemon at {} closed the connection without an answer; it does so when "
-                        "this user does not hold \"CLIENT_ENTITLEMENT\", and when it is stopped",
+                        "this user does not hold \"CLIENT_ENTITLEMENT\"",
                         options.socket_path)};
   }
 };
@@ -129,7 +152,7 @@ void ClientLink::call(const std::string& member, ipc::Arguments arguments, Deadl
   const auto call = std::make_shared<Call>(shared_, std::move(on_end));
   const auto proxy =
       connection_->remoteProxy([call, member, shared = shared_](const ipc::Error& e) {
-        call->end(shared->explain(failureOf(e, member)));
+        shared->explain(failureOf(e, member), [call](Error error) { call->end(std::move(error)); });
       });
   proxy->call(member, std::move(arguments), [call, shared = shared_](ipc::Arguments out) {
     shared->noteAnswer();

@@ -141,16 +141,18 @@ void ServedService::enqueue(Kind kind, ipc::Responder responder, Work work) {
   }
   lanes_[static_cast<std::size_t>(kind)]->async([self = shared_from_this(), number, cancellation,
                                                  work = std::move(work),
-                                                 responder = std::move(responder)] {
-    self->run(work, cancellation, responder);
+                                                 responder = std::move(responder)]() mutable {
+    self->run(work, cancellation, std::move(responder));
     const std::scoped_lock lock(self->mutex_);
     self->pending_.erase(number);
     self->last_call_ticks_ = rt::ticks();
+    self->became_idle_.notifyAll();
   });
 }
 
+/// By value: when this returns the responder is gone, and with it the way back to the IPC thread.
 void ServedService::run(const Work& work, const Cancellation& cancellation,
-                        const ipc::Responder& responder) {
+                        ipc::Responder responder) {  // NOLINT
   try {
     responder.reply(work(*service_, cancellation));
   } catch (const std::exception& exception) {
@@ -170,6 +172,12 @@ void ServedService::cancelPurges() {
 void ServedService::cancelAll() {
   const std::scoped_lock lock(mutex_);
   for (const auto& [number, pending] : pending_) pending.cancellation.cancel();
+}
+
+void ServedService::waitUntilIdle() {
+  const BlockingRegion region;
+  const std::scoped_lock lock(mutex_);
+  while (!pending_.empty()) became_idle_.wait(mutex_);
 }
 
 void ServedService::noteCall() {

@@ -33,6 +33,8 @@ class ServedService : public std::enable_shared_from_this<ServedService> {
     std::uint64_t last_call_ticks = 0;  ///< when something was last asked for or answered
   };
   [[nodiscard]] Activity activity() const;
+  /// Until no job runs or waits. No connection may be left that could bring another one.
+  void waitUntilIdle();
 
  private:
   enum class Kind { kPurgeable, kPurge, kPeriodic, kNotify, kCallback, kCount };
@@ -47,7 +49,7 @@ class ServedService : public std::enable_shared_from_this<ServedService> {
 
   /// Runs `work` on the lane of its kind and answers with what it returns.
   void enqueue(Kind kind, ipc::Responder responder, Work work);
-  void run(const Work& work, const Cancellation& cancellation, const ipc::Responder& responder);
+  void run(const Work& work, const Cancellation& cancellation, ipc::Responder responder);
   void cancelPurges();
   void noteCall();
 
@@ -60,6 +62,7 @@ class ServedService : public std::enable_shared_from_this<ServedService> {
   std::shared_ptr<SerialQueue> lanes_[static_cast<std::size_t>(Kind::kCount)];  ///< may be shared
   mutable rt::Mutex mutex_;
   // Protected by mutex_.
+  rt::CondVar became_idle_;
   std::map<std::uint64_t, Pending> pending_;  ///< by order of arrival
   std::uint64_t next_number_ = 0;
   std::uint64_t last_call_ticks_ = 0;

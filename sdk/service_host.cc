@@ -24,6 +24,7 @@ class ServiceHost::Impl {
     control->stop();
     if (supervisor_.joinable()) supervisor_.join();
     served->cancelAll();
+    served->waitUntilIdle();  // a handler answers through the engine
   }
   Impl(const Impl&) = delete;
   Impl& operator=(const Impl&) = delete;

@@ -1,0 +1,202 @@
+// How connections end, and that each end is told once and under its right name.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <systemd/sd-id128.h>
+#include <unistd.h>
+
+#include <atomic>
+
+#include "tests/linux/ipc/ipc_world.h"
+
+namespace spacekeep::ipc::test {
+namespace {
+
+struct Ends {
+  std::atomic<int> invalidations{0};
+  std::atomic<int> interruptions{0};
+  [[nodiscard]] int all() const { return invalidations + interruptions; }
+};
+
+std::shared_ptr<Connection> watched(IpcLoop& loop, ConcurrentQueue& global,
+                                    const SharedDescriptor& descriptor, Ends& ends,
+                                    ConnectionLimits limits = {}) {
+  auto connection = connectionFromDescriptor(loop, global, descriptor, limits);
+  connection->setRemoteInterface(testInterface());
+  connection->setInvalidationHandler([&ends] { ++ends.invalidations; });
+  connection->setInterruptionHandler([&ends] { ++ends.interruptions; });
+  connection->resume();
+  return connection;
+}
+
+SharedDescriptor connectedTo(const std::string& path) {
+  std::string why;
+  SharedDescriptor connected;
+  EXPECT_TRUE(eventually([&] {
+    connected = connectSocket(path, why);
+    return connected != nullptr;
+  })) << why;
+  return connected;
+}
+
+TEST(ConnectionEnd, APeerThatClosesWhileItLivesIsAnInvalidation) {
+  TestServer server;
+  Ends ends;
+  const auto connection =
+      watched(server.loop, server.global, connectedTo(server.path()), ends);
+  PendingCall pending(connection, "hold", {});
+  ASSERT_TRUE(eventually([&] { return server.held() == 1; }));
+  server.stop();
+  const Outcome outcome = pending.wait();
+  ASSERT_TRUE(outcome.error);
+  EXPECT_EQ(outcome.error->name, "org.freedesktop.DBus.Error.Disconnected");
+  EXPECT_TRUE(eventually([&] { return ends.all() == 1; }));
+  EXPECT_EQ(ends.invalidations, 1);
+  EXPECT_EQ(pending.ends(), 1U);
+}
+
+/// A process that serves one connection at `path` and answers nothing, ended by a signal.
+class OtherProcess {
+ public:
+  explicit OtherProcess(const std::string& path) : pid_(::fork()) {
+    if (pid_ != 0) return;
+    std::string why;
+    const auto listening = bindListeningSocket(path, 0600, why);
+    sd_bus* bus = nullptr;
+    int fd = -1;
+    while (fd < 0) fd = ::accept(listening->fd(), nullptr, nullptr);
+    sd_bus_new(&bus);
+    sd_bus_set_fd(bus, fd, fd);
+    sd_bus_set_server(bus, 1, SD_ID128_MAKE(1, 2, 3, 4, 5, 6, 7, 8, 9, a, b, c, d, e, f, 0));
+    sd_bus_start(bus);
+    while (true) {
+      if (sd_bus_process(bus, nullptr) < 0) ::_exit(1);
+      sd_bus_wait(bus, 100'000);
+    }
+  }
+  ~OtherProcess() { end(); }
+  void end() {
+    if (pid_ <= 0) return;
+    ::kill(pid_, SIGKILL);
+    ::waitpid(pid_, nullptr, 0);
+    pid_ = -1;
+  }
+
+ private:
+  pid_t pid_;
+};
+
+TEST(ConnectionEnd, APeerWhoseProcessIsKilledIsAnInterruption) {
+  const spacekeep::test::TemporaryDirectory directory;
+  OtherProcess service(directory / "service.sock");
+  ConcurrentQueue global{{}};
+  IpcLoop loop;
+  Ends ends;
+  {
+    ConnectionLimits limits;
+    limits.peer_death_ns = kLongNs;
+    const auto connection =
+        watched(loop, global, connectedTo(directory / "service.sock"), ends, limits);
+    PendingCall pending(connection, "hold", {});
+    // Its own answer shows that the process serves. It knows no such object, which is an answer.
+    EXPECT_EQ(callAndWait(connection, "number", {std::int32_t{1}}).error.value().name,
+              "org.freedesktop.DBus.Error.UnknownObject");
+    service.end();
+    EXPECT_TRUE(eventually([&] { return ends.all() == 1; }));
+    EXPECT_EQ(ends.interruptions, 1);
+    EXPECT_TRUE(pending.wait().error);
+    EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).error);
+  }
+}
+
+TEST(ConnectionEnd, InvalidateFailsPendingCallsAndIsToldOnce) {
+  TestServer server;
+  Ends ends;
+  const auto connection = watched(server.loop, server.global, connectedTo(server.path()), ends);
+  PendingCall pending(connection, "hold", {});
+  ASSERT_TRUE(eventually([&] { return server.held() == 1; }));
+  connection->invalidate();
+  connection->invalidate();
+  EXPECT_TRUE(pending.wait().error);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).error);
+  EXPECT_TRUE(eventually([&] { return ends.all() == 1; }));
+  server.loop.runAndWait([] {});
+  EXPECT_EQ(ends.invalidations, 1);
+  EXPECT_EQ(ends.interruptions, 0);
+  EXPECT_EQ(pending.ends(), 1U);
+  // A late answer of the server goes nowhere.
+  server.takeHeld().reply({std::string("late")});
+  expectHonestClientIsServed(server);
+  EXPECT_EQ(pending.ends(), 1U);
+  EXPECT_TRUE(eventually([&] { return server.server().connections() == 0; }));
+}
+
+TEST(ConnectionEnd, InvalidateBeforeResumeFailsWhatWasHeld) {
+  TestServer server;
+  std::string why;
+  const auto connection = connectToPath(server.loop, server.global, server.path(), why);
+  connection->setRemoteInterface(testInterface());
+  PendingCall held(connection, "number", {std::int32_t{1}});
+  connection->invalidate();
+  EXPECT_TRUE(held.wait().error);
+  connection->resume();
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).error);
+  EXPECT_EQ(server.served(), 0U);
+}
+
+TEST(ConnectionEnd, DroppingItClosesItWithoutRunningAHandler) {
+  TestServer server;
+  Ends ends;
+  auto connection = watched(server.loop, server.global, connectedTo(server.path()), ends);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+  EXPECT_EQ(server.server().connections(), 1U);
+  connection.reset();
+  EXPECT_TRUE(eventually([&] { return server.server().connections() == 0; }));
+  EXPECT_EQ(ends.all(), 0);
+}
+
+TEST(ConnectionEnd, AnUnusableDescriptorGivesAConnectionWhoseCallsFail) {
+  ConcurrentQueue global{{}};
+  IpcLoop loop;
+  Ends ends;
+  for (const SharedDescriptor& bad :
+       {SharedDescriptor(), std::make_shared<Descriptor>(::dup(STDIN_FILENO)),
+        makeSocketPair().first}) {
+    ends.invalidations = 0;
+    const auto connection = watched(loop, global, bad, ends);
+    EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).error);
+    EXPECT_TRUE(eventually([&] { return ends.invalidations == 1; }));
+  }
+  EXPECT_EQ(ends.interruptions, 0);
+}
+
+TEST(ConnectionEnd, APeerThatNeverAuthenticatesIsGivenUp) {
+  ConcurrentQueue global{{}};
+  IpcLoop loop;
+  Ends ends;
+  const SocketPair pair = makeSocketPair();
+  ConnectionLimits limits;
+  limits.authentication_ns = 50'000'000;
+  const auto connection = watched(loop, global, pair.first, ends, limits);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).error);
+  EXPECT_TRUE(eventually([&] { return ends.invalidations == 1; }));
+}
+
+TEST(ConnectionEnd, AServedSocketPairWorksAndItsEndIsTold) {
+  TestServer server;
+  Ends ends;
+  SocketPair pair = makeSocketPair();
+  std::atomic<int> served_ends = 0;
+  server.server().serveConnected(pair.first, [&served_ends] { ++served_ends; });
+  auto connection = watched(server.loop, server.global, pair.second, ends);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+  connection->invalidate();
+  EXPECT_TRUE(eventually([&] { return ends.invalidations == 1; }));
+  pair = {};
+  EXPECT_TRUE(eventually([&] { return served_ends == 1; }));
+  EXPECT_EQ(server.server().connections(), 0U);
+}
+
+}  // namespace
+}  // namespace spacekeep::ipc::test

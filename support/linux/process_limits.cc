@@ -1,0 +1,14 @@
+#include "support/linux/process_limits.h"
+
+#include <sys/resource.h>
+
+namespace spacekeep {
+
+void raiseDescriptorLimit() {
+  rlimit files{};
+  if (getrlimit(RLIMIT_NOFILE, &files) != 0) return;
+  files.rlim_cur = files.rlim_max;
+  static_cast<void>(setrlimit(RLIMIT_NOFILE, &files));
+}
+
+}  // namespace spacekeep

@@ -1,0 +1,141 @@
+// Services that a descriptor file declares: their sockets, whom to trust, and one shared connection.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "tests/helpers/log_capture.h"
+#include "tests/linux/ipc/ipc_world.h"
+
+namespace spacekeep::ipc::test {
+namespace {
+
+TEST(DeclaredSocketName, IsMadeOfSafeServiceIdsOnly) {
+  EXPECT_EQ(declaredSocketName("com.quorvel.cache-1_a"), "com.quorvel.cache-1_a.sock");
+  EXPECT_EQ(declaredSocketName(std::string(64, 'a')), std::string(64, 'a') + ".sock");
+  for (const std::string& unsafe :
+       {std::string(), std::string("."), std::string(".."), std::string(".hidden"),
+        std::string("a/b"), std::string("../x"), std::string("a b"), std::string("\xC3\xA4"),
+        std::string("a\0b", 3), std::string(65, 'a')}) {
+    EXPECT_EQ(declaredSocketName(unsafe), "") << unsafe;
+  }
+}
+
+class Declared : public ::testing::Test {
+ protected:
+  std::shared_ptr<Connection> connectTo(const std::string& id) {
+    return connector.connectionToDeclared(id, testInterface());
+  }
+  /// Lets the server also listen as the declared service `id`.
+  void declare(const std::string& id) {
+    std::string why;
+    server.server().serveListening(bindListeningSocket(directory / (id + ".sock"), 0600, why));
+    ASSERT_EQ(why, "");
+  }
+
+  spacekeep::test::TemporaryDirectory directory;
+  TestServer server;
+  LinuxConnector connector{server.loop, server.global, directory.path()};
+};
+
+TEST_F(Declared, AServiceIsReachedAtItsSocket) {
+  declare("svc");
+  const auto connection = connectTo("svc");
+  ASSERT_NE(connection, nullptr);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+}
+
+TEST_F(Declared, CallersShareOneConnection) {
+  declare("svc");
+  declare("other");
+  EXPECT_EQ(connectTo("svc"), connectTo("svc"));
+  EXPECT_NE(connectTo("svc"), connectTo("other"));
+}
+
+TEST_F(Declared, AnEndedConnectionIsReplacedByANewOne) {
+  declare("svc");
+  const auto first = connectTo("svc");
+  ASSERT_TRUE(callAndWait(first, "number", {std::int32_t{1}}).reply);
+  first->invalidate();
+  EXPECT_TRUE(eventually([&] { return connectTo("svc") != first; }));
+  EXPECT_TRUE(callAndWait(connectTo("svc"), "number", {std::int32_t{2}}).reply);
+}
+
+TEST_F(Declared, NobodyListeningIsNoConnection) { EXPECT_EQ(connectTo("svc"), nullptr); }
+
+TEST_F(Declared, AnUnsafeIdIsNoConnectionAndIsLogged) {
+  spacekeep::test::LogCapture log;
+  EXPECT_EQ(connectTo("../daemon"), nullptr);
+  EXPECT_EQ(log.count(kLogProblem, "is no safe file name"), 1U);
+}
+
+TEST_F(Declared, ADirectoryThatOthersMayWriteToIsNotTrusted) {
+  spacekeep::test::LogCapture log;
+  declare("svc");
+  for (const mode_t mode : {0777U, 0770U, 0707U}) {
+    ASSERT_EQ(::chmod(directory.path().c_str(), mode), 0);
+    EXPECT_EQ(connectTo("svc"), nullptr);
+  }
+  EXPECT_EQ(log.count(kLogProblem, "others may write to it"), 3U);
+  ASSERT_EQ(::chmod(directory.path().c_str(), 0755), 0);
+  EXPECT_NE(connectTo("svc"), nullptr);
+}
+
+TEST_F(Declared, ADirectoryOfAnotherUserIsNotTrusted) {
+  if (::geteuid() != 0) GTEST_SKIP() << "needs root to give a directory away";
+  spacekeep::test::LogCapture log;
+  declare("svc");
+  ASSERT_EQ(::chown(directory.path().c_str(), 12345, 12345), 0);
+  EXPECT_EQ(connectTo("svc"), nullptr);
+  EXPECT_EQ(log.count(kLogProblem, "it belongs to another user"), 1U);
+}
+
+TEST_F(Declared, ADirectoryBehindASymbolicLinkIsNotTrusted) {
+  declare("svc");
+  const std::string link = server.directory / "link";
+  ASSERT_EQ(::symlink(directory.path().c_str(), link.c_str()), 0);
+  LinuxConnector through_link(server.loop, server.global, link);
+  EXPECT_EQ(through_link.connectionToDeclared("svc", testInterface()), nullptr);
+}
+
+TEST(BindListeningSocket, TakesThePlaceOfASocketThatNobodyServes) {
+  const spacekeep::test::TemporaryDirectory directory;
+  std::string why;
+  ASSERT_NE(bindListeningSocket(directory / "s", 0600, why), nullptr);
+  EXPECT_NE(bindListeningSocket(directory / "s", 0600, why), nullptr) << why;
+}
+
+TEST(BindListeningSocket, LeavesASocketThatIsServedAlone) {
+  const spacekeep::test::TemporaryDirectory directory;
+  std::string why;
+  const auto first = bindListeningSocket(directory / "s", 0600, why);
+  ASSERT_NE(first, nullptr);
+  EXPECT_EQ(bindListeningSocket(directory / "s", 0600, why), nullptr);
+  EXPECT_EQ(why, directory / "s" + " is served by another process already");
+  EXPECT_NE(connectSocket(directory / "s", why), nullptr);
+}
+
+TEST(BindListeningSocket, LeavesAFileAlone) {
+  const spacekeep::test::TemporaryDirectory directory;
+  const std::string file = directory.write("s", "content");
+  std::string why;
+  EXPECT_EQ(bindListeningSocket(file, 0600, why), nullptr);
+  EXPECT_EQ(why, file + " exists and is not a socket; remove it");
+}
+
+TEST(BindListeningSocket, GivesTheSocketExactlyItsMode) {
+  const spacekeep::test::TemporaryDirectory directory;
+  std::string why;
+  const auto listening = bindListeningSocket(directory / "s", 0666, why);
+  struct stat status {};
+  ASSERT_EQ(::stat((directory / "s").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777U, 0666U);
+}
+
+TEST(BindListeningSocket, RefusesAPathThatIsTooLong) {
+  std::string why;
+  EXPECT_EQ(bindListeningSocket("/tmp/" + std::string(200, 'x'), 0600, why), nullptr);
+  EXPECT_NE(why.find("1 to 107 bytes"), std::string::npos);
+}
+
+}  // namespace
+}  // namespace spacekeep::ipc::test

@@ -1,0 +1,98 @@
+// Descriptors that peers pass: the good one, and all that are refused before a handler sees them.
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "tests/linux/ipc/ipc_world.h"
+
+namespace spacekeep::ipc::test {
+namespace {
+
+std::string refusalOf(TestServer& server, const SharedDescriptor& descriptor) {
+  const Outcome outcome =
+      callAndWait(server.connect(), "takeDescriptor", {descriptor, std::string("text")});
+  if (!outcome.error) return "";
+  EXPECT_EQ(outcome.error->name, "org.freedesktop.DBus.Error.InvalidArgs");
+  return outcome.error->text;
+}
+
+constexpr const char* kRefused = "takeDescriptor: argument 1 (endpoint) cannot be used: ";
+
+class PassedDescriptor : public ::testing::Test {
+ protected:
+  ~PassedDescriptor() override { expectHonestClientIsServed(server); }
+  TestServer server;
+};
+
+TEST_F(PassedDescriptor, OneEndOfASocketPairArrivesAndWorks) {
+  const SocketPair pair = makeSocketPair();
+  EXPECT_EQ(refusalOf(server, pair.second), "");
+  ASSERT_NE(server.descriptor(), nullptr);
+  ASSERT_EQ(::send(pair.first->fd(), "x", 1, 0), 1);
+  char byte = 0;
+  EXPECT_EQ(::recv(server.descriptor()->fd(), &byte, 1, 0), 1);
+  EXPECT_EQ(byte, 'x');
+  EXPECT_NE(::fcntl(server.descriptor()->fd(), F_GETFD) & FD_CLOEXEC, 0);
+}
+
+TEST_F(PassedDescriptor, AServiceOnItCanBeCalled) {
+  const SocketPair pair = makeSocketPair();
+  server.server().serveConnected(pair.first);
+  EXPECT_EQ(refusalOf(server, pair.second), "");
+  const auto connection =
+      connectionFromDescriptor(server.loop, server.global, server.descriptor());
+  connection->setRemoteInterface(testInterface());
+  connection->resume();
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+}
+
+TEST_F(PassedDescriptor, AFileIsRefused) {
+  const auto file = std::make_shared<Descriptor>(::open("/proc/self/exe", O_RDONLY | O_CLOEXEC));
+  EXPECT_EQ(refusalOf(server, file), std::string(kRefused) + "it is not a unix stream socket");
+  EXPECT_EQ(server.descriptor(), nullptr);
+}
+
+TEST_F(PassedDescriptor, ADatagramSocketIsRefused) {
+  int fds[2];
+  ASSERT_EQ(::socketpair(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0, fds), 0);
+  const auto kept = std::make_shared<Descriptor>(fds[0]);
+  EXPECT_EQ(refusalOf(server, std::make_shared<Descriptor>(fds[1])),
+            std::string(kRefused) + "it is not a unix stream socket");
+}
+
+TEST_F(PassedDescriptor, AnUnconnectedSocketIsRefused) {
+  const auto lonely = std::make_shared<Descriptor>(::socket(AF_UNIX, SOCK_STREAM, 0));
+  EXPECT_EQ(refusalOf(server, lonely), std::string(kRefused) + "it is not connected");
+}
+
+TEST_F(PassedDescriptor, ASocketWhoseOtherEndIsClosedIsRefused) {
+  SocketPair pair = makeSocketPair();
+  pair.first.reset();
+  EXPECT_EQ(refusalOf(server, pair.second), std::string(kRefused) + "its other end is closed");
+}
+
+TEST_F(PassedDescriptor, ASocketConnectedToTheListenerItselfIsRefused) {
+  std::string why;
+  EXPECT_EQ(refusalOf(server, connectSocket(server.path(), why)),
+            std::string(kRefused) + "its other end is this process's own socket");
+}
+
+TEST(PassedDescriptorOfThisProcess, IsRefused) {
+  ServerOptions options = TestServer::defaultOptions();
+  options.refuse_own_process = true;
+  TestServer server(options);
+  const SocketPair pair = makeSocketPair();
+  EXPECT_EQ(refusalOf(server, pair.second),
+            std::string(kRefused) + "its other end is this process");
+}
+
+TEST_F(PassedDescriptor, NoneCanBeSentInPlaceOfOne) {
+  const Outcome outcome = callAndWait(server.connect(), "takeDescriptor",
+                                      {SharedDescriptor(), std::string("text")});
+  EXPECT_TRUE(outcome.error);
+  EXPECT_EQ(server.served(), 0U);
+}
+
+}  // namespace
+}  // namespace spacekeep::ipc::test

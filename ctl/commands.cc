@@ -82,9 +82,15 @@ sdk::Reply purgeWithProgress(sdk::Client& client, const sdk::PurgeRequest& reque
   return std::move(slot->reply);
 }
 
+/// Shells complete a directory with a slash; the mount table knows the volume without it.
+std::string withoutTrailingSlashes(std::string path) {
+  while (path.size() > 1 && path.back() == '/') path.pop_back();
+  return path;
+}
+
 sdk::PurgeRequest requestOf(const PurgeOptions& options) {
   sdk::PurgeRequest request;
-  request.volume = options.volume;
+  request.volume = withoutTrailingSlashes(options.volume);
   request.amount = options.amount;
   request.urgency = options.urgency;
   request.timeout_seconds = options.timeout_seconds;

@@ -1,6 +1,7 @@
 #include <spacekeep/client.h>
 
 #include <CLI/CLI.hpp>
+#include <cstdio>
 #include <string>
 #include <variant>
 
@@ -68,7 +69,7 @@ int main(int argc, char** argv) {
   app.set_version_flag("--version", "spacekeepctl " SPACEKEEP_VERSION);
   app.add_flag("--json", common.json, "Write the result as one JSON object");
   app.add_option("--socket", common.socket_path, "The daemon's socket")->capture_default_str();
-  app.require_subcommand(1);
+  app.require_subcommand(0, 1);  // "none" is told below, so that an unknown word is named
   app.fallthrough();
   addPurge(app, purge, amount_text);
   app.add_subcommand("cancel", "Send a cancel request; the daemon takes it and stops nothing")
@@ -78,6 +79,11 @@ int main(int argc, char** argv) {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {
     return usageCode(app, error);
+  }
+  if (app.get_subcommands().empty()) {
+    std::fputs("A command is required: purge or cancel\nRun with --help for more information.\n",
+               stderr);
+    return static_cast<int>(ExitCode::kUsage);
   }
   const ExitCode code = app.got_subcommand("purge") ? spacekeep::ctl::runPurge(common, purge)
                                                     : spacekeep::ctl::runCancel(common, token);

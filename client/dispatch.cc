@@ -43,7 +43,7 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
   };
   const auto waiting = std::make_shared<Waiting>();
   const Value* asked_token = info.dictionary() ? info.dictionary()->find(keys::kToken) : nullptr;
-  const auto operation = makeOperation<SpacekeepPurgeOperation>(platform_, info, mutableServices());
+  const auto operation = makeOperation<SpacekeepPurgeOperation>(platform_, info, *copyServices());
   const Value token = asked_token ? *asked_token : platform_.createSpacekeepToken();
 
   waiting->group.enter();

@@ -8,6 +8,7 @@
 // and here.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -25,6 +26,13 @@
 #include "support/queues/serial_queue.h"
 
 namespace spacekeep {
+
+/// Accepts client connections and serves the daemon object to them.
+using SpacekeepListener = ipc::Listener;
+
+/// The most services that the registry takes by check-in: each holds a descriptor and a place in
+/// every snapshot.
+inline constexpr std::size_t kMaxRegisteredServices = 4096;
 
 class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from_this<Spacekeep> {
  private:
@@ -51,8 +59,8 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   [[nodiscard]] const std::shared_ptr<SerialQueue>& periodic_queue() const;
   [[nodiscard]] const std::shared_ptr<SerialQueue>& notify_queue() const;
   [[nodiscard]] const std::shared_ptr<SerialQueue>& daemons_queue() const;
-  [[nodiscard]] ipc::Listener* listener() const { return listener_.get(); }
-  void setListener(std::unique_ptr<ipc::Listener> listener) { listener_ = std::move(listener); }
+  [[nodiscard]] SpacekeepListener* listener() const { return listener_.get(); }
+  void setListener(std::unique_ptr<SpacekeepListener> listener) { listener_ = std::move(listener); }
   [[nodiscard]] const std::string& rootPath() const { return root_path_; }
   [[nodiscard]] const Dictionary& default_values() const { return default_values_; }
   void setDefault_values(Dictionary values) { default_values_ = std::move(values); }
@@ -127,7 +135,7 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   // In this order, so that they are released in the reverse one.
   std::shared_ptr<SerialQueue> collection_queue_;
   std::shared_ptr<SerialQueue> defaults_queue_;
-  std::unique_ptr<ipc::Listener> listener_;
+  std::unique_ptr<SpacekeepListener> listener_;
   std::shared_ptr<SerialQueue> purge_queue_;
   std::shared_ptr<SerialQueue> purgeable_queue_;
   std::shared_ptr<SerialQueue> periodic_queue_;

@@ -33,10 +33,9 @@ SpacekeepPurgeOperation::Pass SpacekeepPurgeOperation::runUrgency(const Run& run
   }
   if (finishedEarly(*run.outcome)) return Pass::kStop;
   setPurge_semaphore(std::make_shared<CountingSemaphore>(0));
-  const std::uint64_t purged_bytes = amountPurged(*run.outcome);
-  logTrace("%s IN QUEUE, amountPurged: %llu", "startOperation", purged_bytes);
+  logTrace("%s IN QUEUE, amountPurged: %llu", "startOperation", amountPurged(*run.outcome));
   addDistribution(static_cast<double>(purge_amount_needed()), "SpacekeepPurgeAmountRequested");
-  if (purged_bytes < purge_amount_needed()) askServices(run, urgency, record);
+  if (amountPurged(*run.outcome) < purge_amount_needed()) askServices(run, urgency, record);
   endWaitIfFinishedEarly(*run.outcome);
   waitForServices(run, urgency, record);
   // After the wait, so that the next urgency divides only among services that have answered.

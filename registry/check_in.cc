@@ -41,6 +41,12 @@ bool Spacekeep::connectionIsEntitled(std::string_view entitlement) const {
 void Spacekeep::registerService(const CheckIn& check_in) {
   const auto known = services_.find(check_in.service_id);
   std::shared_ptr<SKService> service;
+  if (known == services_.end() && services_.size() >= kMaxRegisteredServices) {
+    logProblem("%s refusing %@, %llu services are registered", "clientCheckin", check_in.service_id,
+               services_.size());
+    check_in.reply(std::nullopt, "too many services are registered, try again later");
+    return;
+  }
   if (known == services_.end()) {
     service = openService(check_in);
   } else {

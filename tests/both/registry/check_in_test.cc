@@ -147,6 +147,32 @@ TEST(CheckIn, TheEndOfAnOldConnectionLeavesANewerRecordAlone) {
   });
 }
 
+TEST(CheckIn, BeyondTheMostServicesANewOneIsRefusedWithAnErrorAndAKnownOneIsNot) {
+  inEverySchedule(5, [] {
+    DaemonWorld world;
+    world.start();
+    const auto known = world.world.addService("known");
+    world.world.checkIn(known, kPurges)->wait();
+    world.daemon->collection_queue()->sync([&] {
+      ServiceMap many = world.daemon->services();
+      for (std::size_t i = 0; many.size() < kMaxRegisteredServices; ++i) {
+        const std::string service_id = "filler " + std::to_string(i);
+        many[service_id] = std::make_shared<SKService>(service_id);
+      }
+      world.daemon->setServices(std::move(many));
+    });
+    const auto late = world.world.addService("late");
+    const auto refused = world.world.checkIn(late, kPurges);
+    EXPECT_EQ(refused->wait(), std::nullopt);
+    EXPECT_EQ(std::get<ipc::OptionalString>(refused->answer()[1]),
+              "too many services are registered, try again later");
+    EXPECT_TRUE(late->calls().empty());
+    EXPECT_TRUE(
+        world.world.trace().hasLine("clientCheckin refusing late, 4096 services are registered"));
+    EXPECT_TRUE(world.world.checkIn(known, kPurges)->wait().has_value());
+  });
+}
+
 TEST(CheckIn, TwoServicesAtOnceAreBothRegistered) {
   inEverySchedule(kSchedules, [] {
     DaemonWorld world;

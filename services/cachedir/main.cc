@@ -24,10 +24,13 @@ int main(int argc, char** argv) {
   const auto cleaner = std::make_shared<CacheCleaner>(std::move(std::get<Rules>(rules)));
   switch (options.mode) {
     case Mode::kOnce:
-    case Mode::kDryRun: return static_cast<int>(freeOnce(*cleaner, options));
-    case Mode::kEstimate: return static_cast<int>(printEstimate(*cleaner, options));
+    case Mode::kDryRun:
+      return static_cast<int>(freeOnce(*cleaner, options));
+    case Mode::kEstimate:
+      return static_cast<int>(printEstimate(*cleaner, options));
     case Mode::kCheckIn:
-    case Mode::kServeSocket: return static_cast<int>(serve(cleaner, options));
+    case Mode::kServeSocket:
+      return static_cast<int>(serve(cleaner, options));
   }
   return static_cast<int>(ExitCode::kUsage);
 }

@@ -33,7 +33,8 @@ int makeFiles(const std::string& root, std::uint64_t files) {
   for (std::uint64_t i = 0; i < files; ++i) {
     const std::string folder = root + "/directory" + std::to_string(i / kFilesPerDirectory);
     if (i % kFilesPerDirectory == 0) ::mkdir(folder.c_str(), 0755);
-    // The order of use has nothing to do with that of the names: 7919 shares no factor with a million.
+    // The order of use has nothing to do with that of the names: 7919 shares no factor with a
+    // million.
     const auto age = static_cast<std::int64_t>(i * 7919 % files) + 40 * kSecondsPerDay;
     if (!makeFile(folder + "/thumbnail-" + std::to_string(i) + ".bin", now_seconds - age)) return 1;
   }
@@ -56,7 +57,8 @@ int measure(const std::string& root, std::uint64_t files) {
   report("nothing done yet", begin, 0);
   report("estimate", begin, cleaner.estimate({}).files[3]);
   begin = rt::ticks();
-  report("1 % freed", begin, cleaner.free({.amount = files / 100 * kFileBytes, .urgency = 1}).files);
+  report("1 % freed", begin,
+         cleaner.free({.amount = files / 100 * kFileBytes, .urgency = 1}).files);
   begin = rt::ticks();
   const auto all = std::numeric_limits<std::uint64_t>::max();
   report("all the rest, as a dry run", begin,

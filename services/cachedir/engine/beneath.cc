@@ -14,8 +14,8 @@ UniqueFd openHow(int folder_fd, const char* path, int flags, std::uint64_t resol
   open_how how{};
   how.flags = static_cast<unsigned>(flags | O_CLOEXEC);
   how.resolve = resolve;
-  // EAGAIN tells that a rename elsewhere kept the kernel from proving the path safe; openat2(2) says
-  // to try again. A bounded number of times, because whoever renames may go on for ever.
+  // EAGAIN tells that a rename elsewhere kept the kernel from proving the path safe; openat2(2)
+  // says to try again. A bounded number of times, because whoever renames may go on for ever.
   for (int attempt = 0; attempt < 16; ++attempt) {
     const long fd = ::syscall(SYS_openat2, folder_fd, path, &how, sizeof how);
     if (fd >= 0) return UniqueFd(static_cast<int>(fd));

@@ -24,8 +24,12 @@ class CacheCleaner::Run {
  public:
   Run(CacheCleaner& cleaner, const FreeRequest& request, const TakenVisitor& taken,
       const CancelToken& cancel)
-      : request_(request), taken_(taken), cancel_(cancel), bounds_(cleaner.bounds_),
-        open_files_(cleaner.open_files_), opened_(openRoots(cleaner.rules_, request.volume)) {}
+      : request_(request),
+        taken_(taken),
+        cancel_(cancel),
+        bounds_(cleaner.bounds_),
+        open_files_(cleaner.open_files_),
+        opened_(openRoots(cleaner.rules_, request.volume)) {}
 
   FreeResult result() {
     result_.problems = opened_.problems;
@@ -50,7 +54,7 @@ class CacheCleaner::Run {
   const Bounds bounds_;
   OpenFiles& open_files_;
   const OpenedRoots opened_;
-  std::vector<std::int64_t> latest_ns_;            // by root: used later than this stays
+  std::vector<std::int64_t> latest_ns_;           // by root: used later than this stays
   std::map<std::uint64_t, SpaceReturn> returns_;  // by file system
   Turn done_;                                     // everything up to here has been dealt with
   FreeResult result_;
@@ -59,8 +63,9 @@ class CacheCleaner::Run {
 void CacheCleaner::Run::work() {
   const std::int64_t now_ns = rt::wallClockNs();
   for (const Root& root : opened_.roots) {
-    latest_ns_.push_back(request_.periodic ? latestForPeriodic(*root.rule, now_ns)
-                                           : latestForUrgency(*root.rule, request_.urgency, now_ns));
+    latest_ns_.push_back(request_.periodic
+                             ? latestForPeriodic(*root.rule, now_ns)
+                             : latestForUrgency(*root.rule, request_.urgency, now_ns));
     if (!request_.dry_run) returns_.try_emplace(root.file_system, root.fd.get());
   }
   if (!open_files_.ensure(opened_.roots, kScanKeptNs, cancel_)) {

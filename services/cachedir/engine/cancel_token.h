@@ -1,9 +1,9 @@
 // Thread safety: every member may be called from any thread, if the caller's own question may.
 //
 // Whether a request has been cancelled. One counter serves all requests of an engine: a cancel
-// raises it, and a request is cancelled when it no longer reads what it read at its start. A request
-// that begins after the cancel is thereby untouched by it. Besides, the one who asks may bring a
-// question of his own.
+// raises it, and a request is cancelled when it no longer reads what it read at its start. A
+// request that begins after the cancel is thereby untouched by it. Besides, the one who asks may
+// bring a question of his own.
 #pragma once
 
 #include <atomic>

@@ -2,7 +2,8 @@
 //
 // The last check before a file goes, made on the opened file itself, and held while it is unlinked.
 // Each part sees what the others do not:
-//   - flock(2), exclusive and not waiting: fails while anybody has a flock lock on the file. Held, it
+//   - flock(2), exclusive and not waiting: fails while anybody has a flock lock on the file. Held,
+//   it
 //     keeps those out who would take one now.
 //   - F_OFD_GETLK (fcntl_locking(2)): shows record locks, of a process or of a descriptor, which
 //     flock does not see.

@@ -81,7 +81,8 @@ void OpenFiles::scanDescriptors(const std::string& process) {
   while (const dirent* entry = ::readdir(descriptors.get())) {
     char first = 0;
     // Only what has a path is a file; asking a socket or a pipe further would be a waste.
-    if (!isNumber(entry->d_name) || ::readlinkat(fd, entry->d_name, &first, 1) != 1 || first != '/') {
+    if (!isNumber(entry->d_name) || ::readlinkat(fd, entry->d_name, &first, 1) != 1 ||
+        first != '/') {
       continue;
     }
     struct statx facts {};
@@ -102,8 +103,9 @@ void OpenFiles::scanMappings(const std::string& process) {
     at_start = std::string_view(line).ends_with('\n');
     unsigned major_number = 0, minor_number = 0;
     unsigned long long inode = 0;
-    if (was_start && std::sscanf(line, "%*x-%*x %*4s %*x %x:%x %llu", &major_number, &minor_number,
-                                 &inode) == 3 &&
+    if (was_start &&
+        std::sscanf(line, "%*x-%*x %*4s %*x %x:%x %llu", &major_number, &minor_number, &inode) ==
+            3 &&
         inode != 0) {
       remember({makedev(major_number, minor_number), inode});
     }

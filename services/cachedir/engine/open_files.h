@@ -1,8 +1,8 @@
 // Thread safety: one thread at a time.
 //
 // Which files are held by processes, as far as /proc shows it: open descriptors (/proc/PID/fd),
-// mappings (/proc/PID/maps) and locks and leases (/proc/locks). One scan serves a whole request; only
-// inodes on the file systems of the caches are remembered.
+// mappings (/proc/PID/maps) and locks and leases (/proc/locks). One scan serves a whole request;
+// only inodes on the file systems of the caches are remembered.
 #pragma once
 
 #include <cstdint>

@@ -3,8 +3,8 @@
 // How many of a file's allocated bytes come back when it is deleted.
 #pragma once
 
-#include <cstdint>
 #include <sys/stat.h>
+#include <cstdint>
 
 namespace spacekeep::cachedir {
 

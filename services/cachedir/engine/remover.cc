@@ -13,7 +13,8 @@
 namespace spacekeep::cachedir {
 namespace {
 
-// Where leases cannot tell who has a file open, the scan of /proc is all there is, and must be fresh.
+// Where leases cannot tell who has a file open, the scan of /proc is all there is, and must be
+// fresh.
 constexpr std::uint64_t kFreshScanNs = 500 * kNsPerMs;
 
 bool sameName(int folder, const std::string& name, const Inode& inode) {
@@ -85,12 +86,15 @@ std::variant<Removal, Left> Remover::take(const Candidate& candidate, const Canc
 
   const FileGuard guard(fd.get());
   switch (guard.verdict()) {
-    case FileGuard::Verdict::kLocked: return Left::kLocked;
-    case FileGuard::Verdict::kOpen: return Left::kOpen;
+    case FileGuard::Verdict::kLocked:
+      return Left::kLocked;
+    case FileGuard::Verdict::kOpen:
+      return Left::kOpen;
     case FileGuard::Verdict::kUnproven:
       if (seenOpen(candidate, false, cancel)) return Left::kOpen;
       break;
-    case FileGuard::Verdict::kAlone: break;
+    case FileGuard::Verdict::kAlone:
+      break;
   }
   if (const auto no = objection(fd.get(), candidate, facts)) return *no;
   Removal removal;

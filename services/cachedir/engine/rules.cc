@@ -20,10 +20,9 @@ constexpr std::string_view kTopKeys[] = {"SPACEKEEP_ID", "SPACEKEEP_SERVICES",
 constexpr std::string_view kDirectoryKeys[] = {"PATH", "UNUSED_DAYS", "PERIODIC_UNUSED_DAYS",
                                                "KEEP", "REMOVE_EMPTY_DIRECTORIES"};
 // Places that hold a whole system rather than a cache: naming one is a slip, and a costly one.
-constexpr std::string_view kNeverCaches[] = {"/",     "/bin",  "/boot", "/dev", "/etc",
-                                             "/home", "/lib",  "/lib64", "/opt", "/proc",
-                                             "/root", "/run",  "/sbin", "/sys", "/tmp",
-                                             "/usr",  "/var",  "/var/lib", "/System"};
+constexpr std::string_view kNeverCaches[] = {
+    "/",     "/bin", "/boot", "/dev", "/etc", "/home", "/lib", "/lib64",   "/opt",   "/proc",
+    "/root", "/run", "/sbin", "/sys", "/tmp", "/usr",  "/var", "/var/lib", "/System"};
 
 /// Reads one document; the first thing that is wrong stays in `error`.
 class Reader {
@@ -96,7 +95,8 @@ bool Reader::readTexts(const Dictionary& from, std::string_view key, const std::
 bool Reader::readId(const Dictionary& top) {
   const std::string* id = stringAt(top, "SPACEKEEP_ID");
   if (id == nullptr || id->empty()) {
-    return fail("SPACEKEEP_ID", "missing, or not a string", "name the service, as com.example.cache");
+    return fail("SPACEKEEP_ID", "missing, or not a string",
+                "name the service, as com.example.cache");
   }
   rules_.service_id = *id;
   return true;
@@ -127,9 +127,9 @@ bool Reader::readPath(const Dictionary& from, const std::string& where, Director
   rule.path = *path;
   while (rule.path.size() > 1 && rule.path.back() == '/') rule.path.pop_back();
   const std::string framed = rule.path + "/";
-  if (framed != "//" && (framed.find("//") != std::string::npos ||
-                         framed.find("/./") != std::string::npos ||
-                         framed.find("/../") != std::string::npos)) {
+  if (framed != "//" &&
+      (framed.find("//") != std::string::npos || framed.find("/./") != std::string::npos ||
+       framed.find("/../") != std::string::npos)) {
     return fail(place, "\"" + *path + "\" holds an empty, \".\" or \"..\" component",
                 "write the path without them");
   }
@@ -150,9 +150,8 @@ bool Reader::readDays(const Value& value, const std::string& where, std::int64_t
 
 bool Reader::readUnused(const Dictionary& from, const std::string& where, DirectoryRule& rule) {
   const Value* periodic = from.find("PERIODIC_UNUSED_DAYS");
-  if (periodic != nullptr &&
-      !readDays(*periodic, where + " PERIODIC_UNUSED_DAYS",
-                rule.periodic_unused_seconds.emplace(0))) {
+  if (periodic != nullptr && !readDays(*periodic, where + " PERIODIC_UNUSED_DAYS",
+                                       rule.periodic_unused_seconds.emplace(0))) {
     return false;
   }
   const Value* value = from.find("UNUSED_DAYS");
@@ -240,10 +239,10 @@ std::variant<Rules, RuleError> Reader::read(const Value& document) {
     fail("", "the top level is not a dictionary", "begin with a dictionary");
     return error_;
   }
-  const bool good = onlyKnownKeys(*top, kTopKeys, "") && readId(*top) && readServices(*top) &&
-                    readTexts(*top, "SPACEKEEP_NOTIFICATIONS", "", kMaxNotifications,
-                              rules_.notifications) &&
-                    readDirectories(*top);
+  const bool good =
+      onlyKnownKeys(*top, kTopKeys, "") && readId(*top) && readServices(*top) &&
+      readTexts(*top, "SPACEKEEP_NOTIFICATIONS", "", kMaxNotifications, rules_.notifications) &&
+      readDirectories(*top);
   if (!good) return error_;
   return std::move(rules_);
 }
@@ -287,7 +286,8 @@ std::variant<Rules, RuleError> readRules(const std::string& file) {
 }
 
 bool isKept(const DirectoryRule& rule, const std::string& path) {
-  const char* last = path.c_str() + (path.rfind('/') == std::string::npos ? 0 : path.rfind('/') + 1);
+  const char* last =
+      path.c_str() + (path.rfind('/') == std::string::npos ? 0 : path.rfind('/') + 1);
   for (const std::string& pattern : rule.keep) {
     const bool whole = pattern.find('/') != std::string::npos;
     if (::fnmatch(pattern.c_str(), whole ? path.c_str() : last, FNM_PATHNAME) == 0) return true;

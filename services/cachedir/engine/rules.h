@@ -1,8 +1,8 @@
 // Thread safety: plain values and pure functions.
 //
-// What a rule file says: which directories are caches, how long a file in them must have been unused
-// before it may go, and how the service presents itself to the daemon. docs/cachedir.md is the text
-// for the people who write such files.
+// What a rule file says: which directories are caches, how long a file in them must have been
+// unused before it may go, and how the service presents itself to the daemon. docs/cachedir.md is
+// the text for the people who write such files.
 #pragma once
 
 #include <array>
@@ -20,7 +20,7 @@ namespace spacekeep::cachedir {
 
 inline constexpr int kUrgencies = 4;
 inline constexpr std::size_t kMaxDirectories = 64;
-inline constexpr std::size_t kMaxPatterns = 256;       // of one directory
+inline constexpr std::size_t kMaxPatterns = 256;  // of one directory
 inline constexpr std::size_t kMaxPatternBytes = 1024;
 inline constexpr std::size_t kMaxNotifications = 64;
 inline constexpr double kMaxUnusedDays = 36500;

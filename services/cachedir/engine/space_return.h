@@ -1,8 +1,8 @@
 // Thread safety: one thread at a time.
 //
-// Waits until deleted bytes show in the free space of their file system. ext4 and tmpfs show them at
-// once; xfs frees blocks in the background, within milliseconds; btrfs only with the next commit of a
-// transaction, which may be 30 seconds away and which syncfs(2) brings about.
+// Waits until deleted bytes show in the free space of their file system. ext4 and tmpfs show them
+// at once; xfs frees blocks in the background, within milliseconds; btrfs only with the next commit
+// of a transaction, which may be 30 seconds away and which syncfs(2) brings about.
 #pragma once
 
 #include <cstdint>

@@ -24,8 +24,14 @@ enum class Left : std::size_t {
 };
 
 inline constexpr std::array<std::string_view, static_cast<std::size_t>(Left::kCount)> kLeftWords = {
-    "open",    "locked",     "linked elsewhere", "nothing to give back", "used since chosen",
-    "unreadable", "too deep", "refused by the file system"};
+    "open",
+    "locked",
+    "linked elsewhere",
+    "nothing to give back",
+    "used since chosen",
+    "unreadable",
+    "too deep",
+    "refused by the file system"};
 
 struct Tally {
   std::array<std::uint64_t, static_cast<std::size_t>(Left::kCount)> counts{};

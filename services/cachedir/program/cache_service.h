@@ -1,4 +1,5 @@
-// Thread safety: every member may be called from any thread; the engine orders what must not overlap.
+// Thread safety: every member may be called from any thread; the engine orders what must not
+// overlap.
 //
 // The engine as a service of the daemon: each request becomes one call of the engine.
 #pragma once

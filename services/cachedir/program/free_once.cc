@@ -40,21 +40,20 @@ void printLeft(const Tally& left) {
 ExitCode freeOnce(CacheCleaner& cleaner, const Options& options) {
   const StopSignals signals([&cleaner] { cleaner.cancel(); });
   const bool dry_run = options.mode == Mode::kDryRun;
-  const FreeResult result = cleaner.free({.amount = options.amount,
-                                          .urgency = options.urgency,
-                                          .volume = options.volume,
-                                          .dry_run = dry_run},
-                                         [](const TakenFile& file) {
-                                           std::printf("%llu\t%s\n",
-                                                       static_cast<unsigned long long>(file.bytes),
-                                                       printable(file.path).c_str());
-                                         });
+  const FreeResult result =
+      cleaner.free({.amount = options.amount,
+                    .urgency = options.urgency,
+                    .volume = options.volume,
+                    .dry_run = dry_run},
+                   [](const TakenFile& file) {
+                     std::printf("%llu\t%s\n", static_cast<unsigned long long>(file.bytes),
+                                 printable(file.path).c_str());
+                   });
   std::fflush(stdout);
   printProblems(result.problems);
   printLeft(result.left);
   std::fprintf(stderr, "%s %llu bytes (%s) in %llu files%s\n", dry_run ? "would free" : "freed",
-               static_cast<unsigned long long>(result.bytes),
-               ctl::printSize(result.bytes).c_str(),
+               static_cast<unsigned long long>(result.bytes), ctl::printSize(result.bytes).c_str(),
                static_cast<unsigned long long>(result.files),
                result.cancelled ? ", stopped early" : "");
   return result.bytes >= options.amount ? ExitCode::kDone : ExitCode::kLessThanAsked;

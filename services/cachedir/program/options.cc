@@ -49,12 +49,13 @@ std::variant<Options, int> readCommandLine(int argc, char** argv) {
   CLI::App app(kDescription, "spacekeep-cachedir");
   app.set_version_flag("--version", "spacekeep-cachedir " SPACEKEEP_VERSION);
   app.add_option("--rules", options.rules_file, "The rule file, a property list")->required();
-  auto* check_in = app.add_flag("--check-in", flags.check_in, "Serve by checking in with the daemon");
+  auto* check_in =
+      app.add_flag("--check-in", flags.check_in, "Serve by checking in with the daemon");
   auto* once = app.add_flag("--once", flags.once, "Free now, without a daemon, and end");
   auto* dry_run = app.add_flag("--dry-run", flags.dry_run,
                                "As --once, but delete nothing and say what would go");
-  auto* estimate = app.add_flag("--estimate", flags.estimate,
-                                "Say what each urgency could free, and end");
+  auto* estimate =
+      app.add_flag("--estimate", flags.estimate, "Say what each urgency could free, and end");
   estimate->excludes(once)->excludes(dry_run)->excludes(check_in);
   check_in->excludes(once)->excludes(dry_run);
   auto* amount = app.add_option("--amount", amount_text,

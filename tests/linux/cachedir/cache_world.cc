@@ -29,6 +29,7 @@ class PrivateMounts : public testing::Environment {
     char pattern[] = "/tmp/cachedir-test-XXXXXX";
     ASSERT_NE(::mkdtemp(pattern), nullptr);
     base = pattern;
+    ASSERT_EQ(::chmod(pattern, 0755), 0);  // tests also run as other users
   }
   void TearDown() override {
     if (!base.empty()) std::filesystem::remove_all(base);
@@ -101,8 +102,7 @@ void writeFile(const std::string& path, std::uint64_t bytes, double days) {
 }
 
 void setAge(const std::string& path, double days) {
-  const std::int64_t then_ns =
-      rt::wallClockNs() - static_cast<std::int64_t>(days * 86400 * 1e9);
+  const std::int64_t then_ns = rt::wallClockNs() - static_cast<std::int64_t>(days * 86400 * 1e9);
   const timespec time{.tv_sec = then_ns / kNsPerSecond, .tv_nsec = then_ns % kNsPerSecond};
   const timespec times[2] = {time, time};
   ASSERT_EQ(::utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW), 0) << path;

@@ -1,7 +1,7 @@
 // Thread safety: one test at a time.
 //
-// Real file systems and files for the tests of the cache directory service. Everything is mounted in
-// a mount namespace of the test program's own, so nothing outlives it or is seen elsewhere.
+// Real file systems and files for the tests of the cache directory service. Everything is mounted
+// in a mount namespace of the test program's own, so nothing outlives it or is seen elsewhere.
 #pragma once
 
 #include <sys/types.h>

@@ -58,7 +58,11 @@ TEST(OldestFiles, OneFileIsKeptHoweverLongItsName) {
 
 FoundFile linked(std::uint64_t inode, std::string_view name, std::uint64_t links,
                  std::int64_t used_ns = 1) {
-  return {.folder = kFolder, .name = name, .inode = {1, inode}, .used_ns = used_ns, .bytes = 4096,
+  return {.folder = kFolder,
+          .name = name,
+          .inode = {1, inode},
+          .used_ns = used_ns,
+          .bytes = 4096,
           .links = links};
 }
 

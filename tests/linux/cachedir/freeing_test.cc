@@ -53,7 +53,8 @@ TEST_P(Freeing, WhatIsClaimedIsWhatTheFileSystemHasBackWhenTheAnswerComes) {
 TEST_P(Freeing, AReadCountsAsUseAsAWriteDoes) {
   writeFile(volume_ / "read", kMiB, 200);
   writeFile(volume_ / "older", kMiB, 100);
-  const timespec times[2] = {{.tv_sec = 0, .tv_nsec = UTIME_NOW}, {.tv_sec = 0, .tv_nsec = UTIME_OMIT}};
+  const timespec times[2] = {{.tv_sec = 0, .tv_nsec = UTIME_NOW},
+                             {.tv_sec = 0, .tv_nsec = UTIME_OMIT}};
   ASSERT_EQ(::utimensat(AT_FDCWD, (volume_ / "read").c_str(), times, 0), 0);
   volume_.settle();
   EXPECT_THAT(freeIn(volume_.path(), kMiB, 1).paths, ElementsAre(volume_ / "older"));
@@ -61,8 +62,8 @@ TEST_P(Freeing, AReadCountsAsUseAsAWriteDoes) {
 
 TEST_P(Freeing, EachUrgencyTakesYoungerFilesThanTheOneBefore) {
   const std::vector<std::pair<const char*, double>> files = {
-      {"days31", 31}, {"days29", 29}, {"days8", 8}, {"days6", 6}, {"hours25", 25.0 / 24},
-      {"hours23", 23.0 / 24}, {"now", 0}, {"tomorrow", -1}};
+      {"days31", 31},         {"days29", 29},         {"days8", 8}, {"days6", 6},
+      {"hours25", 25.0 / 24}, {"hours23", 23.0 / 24}, {"now", 0},   {"tomorrow", -1}};
   for (const auto& [name, days] : files) writeFile(volume_ / name, kMiB, days);
   volume_.settle();
   CacheCleaner cleaner(rulesFor(volume_.path()));
@@ -120,7 +121,8 @@ TEST_P(Freeing, SeveralPassesOverMoreFilesThanFitKeepTheOrder) {
     // Age 149 goes first; 17 has the inverse 3 modulo 50.
     const std::string expected = volume_ / ("f" + std::to_string(((49 - i) * 3) % 50));
     EXPECT_EQ(i < 20 ? few.paths[static_cast<std::size_t>(i)]
-                     : rest.paths[static_cast<std::size_t>(i - 20)], expected);
+                     : rest.paths[static_cast<std::size_t>(i - 20)],
+              expected);
   }
 }
 

@@ -1,4 +1,5 @@
 // Claimed bytes must come back: hard links, and blocks shared without links.
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
@@ -114,6 +115,25 @@ TEST_P(SharedBlocks, OfAFileThatSharesHalfOnlyTheOtherHalfCounts) {
   const std::uint64_t before = volume_.freeBytes();
   EXPECT_EQ(freeIn(volume_ / "cache", 2 * kMiB).result.bytes, kMiB);
   EXPECT_NEAR(static_cast<double>(volume_.freeBytes() - before), static_cast<double>(kMiB), 65536);
+}
+
+TEST_P(SharedBlocks, AFileInManyPiecesCountsForThosePiecesThatAreItsOwn) {
+  constexpr int kPieces = 300;  // more than one question to the file system
+  constexpr std::uint64_t kPiece = 16 * 1024;
+  writeFile(volume_ / "original", kPieces * kPiece);
+  run("mkdir " + volume_ / "cache");
+  run("cp --reflink=always " + volume_ / "original" + " " + volume_ / "cache/copy");
+  {
+    const UniqueFd fd(::open((volume_ / "cache/copy").c_str(), O_WRONLY));
+    const std::string piece(kPiece, 'y');
+    for (int i = 0; i < kPieces; i += 2) {
+      const auto place = static_cast<off_t>(i) * static_cast<off_t>(kPiece);
+      ASSERT_EQ(::pwrite(fd.get(), piece.data(), kPiece, place), static_cast<ssize_t>(kPiece));
+    }
+  }
+  setAge(volume_ / "cache/copy", 50);
+  volume_.settle();
+  EXPECT_EQ(freeIn(volume_ / "cache", kPieces * kPiece).result.bytes, kPieces / 2 * kPiece);
 }
 
 }  // namespace

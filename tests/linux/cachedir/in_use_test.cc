@@ -4,6 +4,8 @@
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/mman.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -87,9 +89,7 @@ bool holdMapped(const char* path) {
 
 TEST_P(InUse, AFileHeldOpenIsSpared) { expectSparedWhile(holdOpen, Left::kOpen); }
 TEST_P(InUse, AFileOpenForWritingIsSpared) { expectSparedWhile(holdOpenForWriting, Left::kOpen); }
-TEST_P(InUse, AMappedFileWithoutADescriptorIsSpared) {
-  expectSparedWhile(holdMapped, Left::kOpen);
-}
+TEST_P(InUse, AMappedFileWithoutADescriptorIsSpared) { expectSparedWhile(holdMapped, Left::kOpen); }
 TEST_P(InUse, AFileUnderFlockIsSpared) { expectSparedWhile(holdFlock, Left::kOpen); }
 TEST_P(InUse, AFileUnderARecordLockIsSpared) { expectSparedWhile(holdRecordLock, Left::kOpen); }
 TEST_P(InUse, ALeasedFileIsSpared) { expectSparedWhile(holdLease, Left::kOpen); }
@@ -164,6 +164,48 @@ TEST_P(InUse, AFileLinkedAfterTheWalkIsSpared) {
     }
   });
   EXPECT_EQ(result.left.of(Left::kLinked), 1U);
+  EXPECT_TRUE(exists(held_));
+}
+
+/// Runs `body` in another process under the user `nobody`; answers whether it said true.
+bool asNobody(const std::function<bool()>& body) {
+  constexpr uid_t kNobody = 65534;
+  const pid_t child = ::fork();
+  if (child == 0) {
+    if (::setresgid(kNobody, kNobody, kNobody) != 0) ::_exit(2);
+    if (::setresuid(kNobody, kNobody, kNobody) != 0) ::_exit(2);
+    ::_exit(body() ? 0 : 1);
+  }
+  int status = 0;
+  EXPECT_EQ(::waitpid(child, &status, 0), child);
+  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+TEST_P(InUse, WithoutTheRightToALeaseWhatProcShowsDecides) {
+  // Files of root in a directory of another user, who may delete them and gets no lease on them.
+  ASSERT_EQ(::chmod((volume_ / "").c_str(), 0777), 0);
+  EXPECT_TRUE(asNobody([this] {
+    const UniqueFd fd(::open(free_.c_str(), O_RDONLY | O_CLOEXEC));
+    return FileGuard(fd.get()).verdict() == FileGuard::Verdict::kUnproven;
+  }));
+  EXPECT_TRUE(asNobody([this] {
+    const UniqueFd user(::open(held_.c_str(), O_RDONLY | O_CLOEXEC));
+    const Observed seen = freeIn(volume_.path(), 2 * kMiB);
+    return seen.paths == std::vector<std::string>{free_} && seen.result.left.of(Left::kOpen) == 1;
+  }));
+  EXPECT_TRUE(exists(held_));
+  EXPECT_FALSE(exists(free_));
+}
+
+TEST_P(InUse, AFileThatCannotBeReadStays) {
+  ASSERT_EQ(::chmod((volume_ / "").c_str(), 0777), 0);
+  ASSERT_EQ(::chmod(held_.c_str(), 0600), 0);
+  ::rmdir((volume_ / "lost+found").c_str());  // ext4's own, which cannot be read either
+  EXPECT_TRUE(asNobody([this] {
+    const Observed seen = freeIn(volume_.path(), 2 * kMiB);
+    return seen.paths == std::vector<std::string>{free_} &&
+           seen.result.left.of(Left::kUnreadable) == 1;
+  }));
   EXPECT_TRUE(exists(held_));
 }
 

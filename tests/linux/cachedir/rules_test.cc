@@ -111,7 +111,8 @@ TEST(Rules, EachMistakeInADirectoryIsNamedWithItsPlace) {
   for (const Bad& bad : mistakes) {
     Dictionary entry = directory("/data/cache");
     entry.set(bad.key, bad.value);
-    EXPECT_THAT(errorOf(withDirectory(entry)), AllOf(HasSubstr("rules.plist: "), HasSubstr(bad.where)))
+    EXPECT_THAT(errorOf(withDirectory(entry)),
+                AllOf(HasSubstr("rules.plist: "), HasSubstr(bad.where)))
         << bad.key;
   }
 }
@@ -126,8 +127,10 @@ TEST(Rules, EachMistakeAtTheTopIsNamed) {
       {"DIRECTORIES", Array{}, "DIRECTORIES: not an array of 1 to 64"},
       {"DIRECTORIES", 5, "DIRECTORIES: not an array of 1 to 64"},
       {"DIRECTORIES", Array{5}, "DIRECTORIES[0]: not a dictionary"},
-      {"DIRECTORIES", Array(kMaxDirectories + 1, Value(directory("/a/b"))), "not an array of 1 to 64"},
-      {"DIRECTORIES", Array{directory("/a/b"), directory("/a/b/c")}, "\"/a/b/c\" overlaps \"/a/b\""},
+      {"DIRECTORIES", Array(kMaxDirectories + 1, Value(directory("/a/b"))),
+       "not an array of 1 to 64"},
+      {"DIRECTORIES", Array{directory("/a/b"), directory("/a/b/c")},
+       "\"/a/b/c\" overlaps \"/a/b\""},
       {"DIRECTORIES", Array{directory("/a/b"), directory("/a/b/")}, "overlaps"},
       {"DIRECTORY", "/a/b", "unknown key \"DIRECTORY\""},
   };

@@ -32,8 +32,8 @@ void logVerdict(const PeerIdentity& identity, std::string_view entitlement,
 EntitlementAccess::EntitlementAccess(std::vector<Rule> rules, std::size_t max_remembered)
     : rules_(std::move(rules)), max_remembered_(std::max<std::size_t>(max_remembered, 1)) {}
 
-bool EntitlementAccess::connectionIsEntitled(
-    ipc::PeerConnection* connection, std::initializer_list<std::string_view> entitlements) {
+bool EntitlementAccess::connectionIsEntitled(ipc::PeerConnection* connection,
+                                             std::initializer_list<std::string_view> entitlements) {
   if (connection == nullptr) return false;
   return std::ranges::all_of(entitlements, [&](std::string_view entitlement) {
     return isEntitled(connection->identity(), entitlement);

@@ -19,13 +19,14 @@ namespace spacekeep::access {
 struct PeerFacts {
   std::uint32_t uid = 0;
   std::uint32_t gid = 0;
-  std::vector<std::uint32_t> groups;  ///< supplementary groups
-  std::optional<std::string> label;   ///< security label (SELinux context, AppArmor profile, ...)
-  std::int32_t pid = 0;               ///< for log lines only, never for a decision
-  ipc::SharedDescriptor pidfd;        ///< of the peer's process, null when the kernel has none
+  std::vector<std::uint32_t> groups = {};  ///< supplementary groups
+  std::optional<std::string> label =
+      {};                ///< security label (SELinux context, AppArmor profile, ...)
+  std::int32_t pid = 0;  ///< for log lines only, never for a decision
+  ipc::SharedDescriptor pidfd = nullptr;  ///< of the peer's process, null when the kernel has none
   /// The system service that the process belongs to ("cache.service"). Only set together with
   /// `pidfd`, because a unit looked up by process number alone could be somebody else's.
-  std::optional<std::string> unit;
+  std::optional<std::string> unit = {};
 };
 
 class PeerIdentity {

@@ -98,8 +98,7 @@ Problem readKey(const std::string& key, const Value& value, const NameLookup& lo
 
 }  // namespace
 
-std::variant<ParsedRule, RuleError> ruleFromDocument(const std::string& name,
-                                                     const Value& document,
+std::variant<ParsedRule, RuleError> ruleFromDocument(const std::string& name, const Value& document,
                                                      const NameLookup& lookup) {
   const Dictionary* dictionary = document.dictionary();
   if (dictionary == nullptr) return RuleError{"the document is no dictionary"};

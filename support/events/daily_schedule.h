@@ -25,7 +25,7 @@ struct DailySchedule {
 struct Clocks {
   std::int64_t wall_ns = 0;   ///< since 1970
   std::uint64_t boot_ns = 0;  ///< since the machine started, suspend included (CLOCK_BOOTTIME)
-  std::string boot_id;        ///< different after each start of the machine
+  std::string boot_id = {};   ///< different after each start of the machine
 };
 
 /// The moment from which the next interval counts: when the last run was to be, or, if that came
@@ -33,14 +33,14 @@ struct Clocks {
 struct RunRecord {
   std::int64_t wall_ns = 0;
   std::uint64_t boot_ns = 0;
-  std::string boot_id;
+  std::string boot_id = {};
   bool operator==(const RunRecord&) const = default;
 };
 
 struct DailyPlan {
-  std::optional<RunRecord> last;    ///< none: it never ran
-  std::uint64_t since_boot_ns = 0;  ///< when this plan was made; nothing is due before
-  std::uint64_t delay_ns = 0;       ///< drawn once per plan, below random_delay_seconds
+  std::optional<RunRecord> last = {};  ///< none: it never ran
+  std::uint64_t since_boot_ns = 0;     ///< when this plan was made; nothing is due before
+  std::uint64_t delay_ns = 0;          ///< drawn once per plan, below random_delay_seconds
 };
 
 enum class DailyStep { kWait, kWaitForPower, kRun };
@@ -48,7 +48,7 @@ enum class DailyStep { kWait, kWaitForPower, kRun };
 struct DailyDecision {
   DailyStep step = DailyStep::kWait;
   std::uint64_t wake_boot_ns = 0;  ///< when to decide again, for the two waits
-  RunRecord record;                ///< what to keep, for kRun
+  RunRecord record = {};           ///< what to keep, for kRun
 };
 
 /// How often the power is looked at while a run waits for it.

@@ -36,7 +36,14 @@ class KeepAliveTransaction {
   KeepAlive& keep_alive_;
 };
 
-enum class ActivityState : std::int32_t { kCheckIn = 0, kWait = 1, kRun = 2, kDefer = 3, kContinue = 4, kDone = 5 };
+enum class ActivityState : std::int32_t {
+  kCheckIn = 0,
+  kWait = 1,
+  kRun = 2,
+  kDefer = 3,
+  kContinue = 4,
+  kDone = 5
+};
 
 /// A scheduled background activity, as its handler sees it.
 class Activity {

@@ -1,8 +1,8 @@
 // Thread safety: every member may be called from any thread; destroy it only after the last caller.
 //
 // The event stream for low space: a thread that looks at the volumes as often as LowSpaceWatch asks
-// for, and sends what it reports as events {"_Flags": flags} to a handler. One event is handled at a
-// time: while one is, a further one could only repeat what that one is about to do.
+// for, and sends what it reports as events {"_Flags": flags} to a handler. One event is handled at
+// a time: while one is, a further one could only repeat what that one is about to do.
 #pragma once
 
 #include <cstdint>

@@ -70,14 +70,14 @@ LowSpaceWatch::Watched LowSpaceWatch::observe(const VolumeSample& sample,
   } else {
     watched = known->second;
     const std::uint64_t elapsed_ns = now_ns - watched.looked_at_ns;
-    watched.bytes_per_second = fastestRate(
-        watched.bytes_per_second,
-        usedSince(watched.space.available_bytes, sample.space.available_bytes), elapsed_ns,
-        limits_.slowest_bytes_per_second, limits_.rate_half_life_ns);
-    watched.inodes_per_second = fastestRate(
-        watched.inodes_per_second,
-        usedSince(watched.space.available_inodes, sample.space.available_inodes), elapsed_ns,
-        limits_.slowest_inodes_per_second, limits_.rate_half_life_ns);
+    watched.bytes_per_second =
+        fastestRate(watched.bytes_per_second,
+                    usedSince(watched.space.available_bytes, sample.space.available_bytes),
+                    elapsed_ns, limits_.slowest_bytes_per_second, limits_.rate_half_life_ns);
+    watched.inodes_per_second =
+        fastestRate(watched.inodes_per_second,
+                    usedSince(watched.space.available_inodes, sample.space.available_inodes),
+                    elapsed_ns, limits_.slowest_inodes_per_second, limits_.rate_half_life_ns);
   }
   watched.space = sample.space;
   watched.looked_at_ns = now_ns;
@@ -111,12 +111,10 @@ std::uint64_t LowSpaceWatch::pauseFor(const Watched& watched, SpaceLevel level,
 
   const SpaceThresholds thresholds = spaceThresholds(watched.space);
   const bool is_low = level == SpaceLevel::kLow;
-  const std::uint64_t bytes_left =
-      above(watched.space.available_bytes,
-            is_low ? thresholds.very_low_bytes : thresholds.low_bytes);
-  const std::uint64_t inodes_left =
-      above(watched.space.available_inodes,
-            is_low ? thresholds.very_low_inodes : thresholds.low_inodes);
+  const std::uint64_t bytes_left = above(watched.space.available_bytes,
+                                         is_low ? thresholds.very_low_bytes : thresholds.low_bytes);
+  const std::uint64_t inodes_left = above(
+      watched.space.available_inodes, is_low ? thresholds.very_low_inodes : thresholds.low_inodes);
   std::uint64_t pause = timeToUseUpNs(bytes_left, watched.bytes_per_second);
   if (watched.space.inodes != 0) {
     pause = std::min(pause, timeToUseUpNs(inodes_left, watched.inodes_per_second));

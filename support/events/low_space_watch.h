@@ -68,7 +68,8 @@ class LowSpaceWatch {
   using Key = std::pair<std::string, std::uint64_t>;  // mount point, file system
 
   [[nodiscard]] Watched observe(const VolumeSample& sample, std::uint64_t now_ns) const;
-  [[nodiscard]] std::uint64_t report(Watched& watched, SpaceLevel level, std::uint64_t now_ns) const;
+  [[nodiscard]] std::uint64_t report(Watched& watched, SpaceLevel level,
+                                     std::uint64_t now_ns) const;
   [[nodiscard]] std::uint64_t pauseFor(const Watched& watched, SpaceLevel level,
                                        std::uint64_t now_ns) const;
 

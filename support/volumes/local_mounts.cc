@@ -17,9 +17,9 @@ bool isOneOf(const std::array<std::string_view, N>& list, std::string_view text)
 constexpr std::array<std::string_view, 6> kLocalWithoutDevice = {"btrfs", "bcachefs", "zfs",
                                                                  "ubifs", "jffs2",    "tmpfs"};
 constexpr std::array<std::string_view, 20> kDistantTypes = {
-    "autofs", "nfs",    "nfs4",   "cifs",  "smb3",  "smbfs",   "9p",   "afs",  "ceph",   "ncpfs",
-    "gfs",    "gfs2",   "ocfs2",  "lustre", "coda", "orangefs", "virtiofs", "vboxsf", "glusterfs",
-    "beegfs"};
+    "autofs", "nfs",      "nfs4",     "cifs",   "smb3",      "smbfs", "9p",
+    "afs",    "ceph",     "ncpfs",    "gfs",    "gfs2",      "ocfs2", "lustre",
+    "coda",   "orangefs", "virtiofs", "vboxsf", "glusterfs", "beegfs"};
 
 /// `path` lies at or below `ancestor`.
 bool isAtOrBelow(std::string_view path, std::string_view ancestor) {
@@ -69,6 +69,7 @@ class MountTree {
   /// Another mount on the same parent lies on the way to its mount point.
   [[nodiscard]] bool isCutOff(std::size_t index) const {
     const MountEntry& mount = table_[index];
+    if (mount.id == mount.parent_id) return false;  // the first root of all is its own parent
     return std::ranges::any_of(children_.at(mount.parent_id), [&](std::size_t sibling) {
       const std::string& other = table_[sibling].mount_point;
       if (sibling == index || table_[sibling].id == mount.parent_id) return false;

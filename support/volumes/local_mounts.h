@@ -17,9 +17,9 @@ struct MountEntry {
   std::int32_t parent_id = 0;
   std::uint32_t device_major = 0;
   std::uint32_t device_minor = 0;
-  std::string mount_point;
-  std::string type;
-  std::string source;
+  std::string mount_point = {};
+  std::string type = {};
+  std::string source = {};
   /// The file system, not the mount: a service manager may show the daemon writable file systems
   /// by read-only mounts, and others go on writing to them.
   bool read_only = false;
@@ -29,8 +29,8 @@ struct MountEntry {
 enum class FileSystemKind {
   kLocal,      ///< stands on a block device or flash of this machine, or is a tmpfs
   kRootLocal,  ///< local as the root only: an overlay
-  kDistant,    ///< on the network, in another process, or mounted on first use: may hang when touched
-  kPseudo,     ///< holds no data of anybody
+  kDistant,  ///< on the network, in another process, or mounted on first use: may hang when touched
+  kPseudo,   ///< holds no data of anybody
 };
 [[nodiscard]] FileSystemKind kindOf(const MountEntry& mount);
 

@@ -39,11 +39,11 @@ SpaceThresholds spaceThresholds(const VolumeSpace& space) {
 
 SpaceLevel spaceLevel(const VolumeSpace& space, SpaceLevel previous) {
   const SpaceThresholds thresholds = spaceThresholds(space);
-  const SpaceLevel by_bytes = levelOf(space.available_bytes, thresholds.low_bytes,
-                                      thresholds.very_low_bytes, previous);
+  const SpaceLevel by_bytes =
+      levelOf(space.available_bytes, thresholds.low_bytes, thresholds.very_low_bytes, previous);
   if (space.inodes == 0) return by_bytes;
-  const SpaceLevel by_inodes = levelOf(space.available_inodes, thresholds.low_inodes,
-                                       thresholds.very_low_inodes, previous);
+  const SpaceLevel by_inodes =
+      levelOf(space.available_inodes, thresholds.low_inodes, thresholds.very_low_inodes, previous);
   return std::max(by_bytes, by_inodes);
 }
 

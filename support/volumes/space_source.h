@@ -11,9 +11,9 @@
 namespace spacekeep {
 
 struct VolumeSample {
-  std::string volume;           ///< mount point
+  std::string volume = {};        ///< mount point
   std::uint64_t file_system = 0;  ///< tells apart what was mounted there one after another
-  VolumeSpace space;
+  VolumeSpace space = {};
   SpaceLevel level = SpaceLevel::kEnough;
 };
 

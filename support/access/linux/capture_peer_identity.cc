@@ -19,7 +19,8 @@ namespace {
 #ifdef SO_PEERPIDFD
 constexpr int kPeerPidfd = SO_PEERPIDFD;
 #else
-constexpr int kPeerPidfd = 77;  // Linux 6.5 and newer; asm-generic/socket.h, the same on x86 and ARM
+constexpr int kPeerPidfd =
+    77;  // Linux 6.5 and newer; asm-generic/socket.h, the same on x86 and ARM
 #endif
 
 constexpr std::size_t kMaxGroups = 65536;  // NGROUPS_MAX of the kernel
@@ -46,8 +47,8 @@ std::optional<std::vector<T>> readOption(int fd, int option, std::size_t limit) 
 
 std::vector<std::uint32_t> readGroups(int fd) {
   static_assert(sizeof(gid_t) == sizeof(std::uint32_t));
-  return readOption<std::uint32_t>(fd, SO_PEERGROUPS, kMaxGroups).value_or(
-      std::vector<std::uint32_t>{});
+  return readOption<std::uint32_t>(fd, SO_PEERGROUPS, kMaxGroups)
+      .value_or(std::vector<std::uint32_t>{});
 }
 
 std::optional<std::string> readLabel(int fd) {

@@ -20,7 +20,8 @@ inline constexpr std::size_t kMaxRuleFileBytes = 64 * 1024;
 /// The rules of every "*.plist" file, in the order of the file names. A file of the administrator
 /// replaces the vendor's of the same name, also when it is broken: what somebody meant to take away
 /// must not come back by a typing error. Broken files, and files or directories that anybody but
-/// root or this process's own user could have written, are left out; each is logged with its reason.
+/// root or this process's own user could have written, are left out; each is logged with its
+/// reason.
 [[nodiscard]] std::vector<Rule> loadRules(const std::string& vendor_directory,
                                           const std::string& administrator_directory,
                                           const NameLookup& lookup);

@@ -23,14 +23,14 @@ class DailyActivity : public std::enable_shared_from_this<DailyActivity> {
   struct Options {
     std::string name;
     DailySchedule schedule;
-    std::string record_path;            ///< where the last run is remembered
+    std::string record_path;  ///< where the last run is remembered
     std::function<bool()> onMainsPower;
     std::function<Clocks()> readClocks;
   };
 
   /// The queue must outlive it.
-  DailyActivity(std::shared_ptr<EventLoop> loop, ConcurrentQueue& global, EventSources::ActivityHandler handler,
-                Options options);
+  DailyActivity(std::shared_ptr<EventLoop> loop, ConcurrentQueue& global,
+                EventSources::ActivityHandler handler, Options options);
 
   void start();
 

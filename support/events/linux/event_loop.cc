@@ -47,6 +47,7 @@ void EventLoop::stop() {
   }
   ::eventfd_write(wake_, 1);
   if (thread_.joinable()) thread_.join();
+  delayed_.clear();
 }
 
 void EventLoop::post(Callback callback) {
@@ -73,7 +74,8 @@ void EventLoop::unwatch(int fd) {
 void EventLoop::run() {
   std::array<epoll_event, 16> events{};
   while (runPosted()) {
-    const int count = ::epoll_wait(epoll_, events.data(), static_cast<int>(events.size()), -1);
+    const int count =
+        ::epoll_wait(epoll_, events.data(), static_cast<int>(events.size()), runDelayed());
     for (int i = 0; i < count; ++i) {
       const int fd = events.at(static_cast<std::size_t>(i)).data.fd;
       if (fd == wake_) {
@@ -102,6 +104,26 @@ bool EventLoop::runPosted() {
     }
     callback();
   }
+}
+
+void EventLoop::postAfter(std::uint64_t delay_ns, Callback callback) {
+  const std::uint64_t deadline = rt::deadlineAfterNs(delay_ns);
+  post([this, deadline, later = std::move(callback)] { delayed_.emplace(deadline, later); });
+}
+
+int EventLoop::runDelayed() {
+  while (!delayed_.empty() && delayed_.begin()->first <= rt::ticks()) {
+    const Callback due = std::move(delayed_.extract(delayed_.begin()).mapped());
+    due();
+  }
+  if (delayed_.empty()) return -1;
+  // CLOCK_MONOTONIC ticks in nanoseconds on Linux; rounded up, so that it is due on waking up.
+  constexpr std::uint64_t kNsPerMs = 1'000'000;
+  constexpr std::uint64_t kLongestSleepMs = 3'600'000;
+  const std::uint64_t now = rt::ticks();
+  const std::uint64_t next = delayed_.begin()->first;
+  const std::uint64_t left_ns = next > now ? next - now : 0;
+  return static_cast<int>(std::min(left_ns / kNsPerMs + 1, kLongestSleepMs));
 }
 
 BootTimer::BootTimer(EventLoop& loop, EventLoop::Callback fired)

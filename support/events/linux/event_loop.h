@@ -31,6 +31,10 @@ class EventLoop {
   /// Runs `callback` on the loop's thread.
   void post(Callback callback);
 
+  /// Runs `callback` on the loop's thread, `delay_ns` from now at the earliest (suspend does not
+  /// count).
+  void postAfter(std::uint64_t delay_ns, Callback callback);
+
   /// Calls `ready` each time that one of `epoll_events` comes up on `fd`. The descriptor stays the
   /// caller's and must be unwatched before it is closed. Answers false when it cannot be watched.
   bool watch(int fd, std::uint32_t epoll_events, Callback ready);
@@ -39,6 +43,8 @@ class EventLoop {
  private:
   void run();
   bool runPosted();
+  /// Runs what is due, and answers for how many milliseconds the loop may sleep, -1 for good.
+  int runDelayed();
 
   const int epoll_;
   const int wake_;  // eventfd(2)
@@ -48,6 +54,7 @@ class EventLoop {
   bool stopping_ = false;
   // Confined to the loop's thread.
   std::map<int, Callback> watched_;
+  std::multimap<std::uint64_t, Callback> delayed_;  // by the deadline in ticks
 
   rt::Thread thread_;  // last: it uses all of the above
 };

@@ -42,11 +42,12 @@ namespace {
 
 }  // namespace
 
-LinuxEventSources::LinuxEventSources(ConcurrentQueue& global, SpaceSource& space, Options options)
+LinuxEventSources::LinuxEventSources(std::shared_ptr<EventLoop> loop, ConcurrentQueue& global,
+                                     SpaceSource& space, Options options)
     : global_(global),
       space_(space),
       options_(std::move(options)),
-      loop_(std::make_shared<EventLoop>()),
+      loop_(std::move(loop)),
       keep_alive_(loop_, global,
                   [socket = options_.system_bus_socket] {
                     return inhibitSleep(socket, "Freeing storage space");

@@ -29,7 +29,7 @@ class LinuxEventSources final : public EventSources {
  public:
   struct Options {
     std::vector<std::string> launch_directories;  ///< of "<activity>.plist", the first one wins
-    std::string state_directory;                  ///< of "<activity>.run", the memory of its last run
+    std::string state_directory;  ///< of "<activity>.run", the memory of its last run
     std::string power_supply_directory = "/sys/class/power_supply";
     std::string mount_table_path = "/proc/self/mountinfo";
     std::string system_bus_socket = "/run/dbus/system_bus_socket";
@@ -37,8 +37,9 @@ class LinuxEventSources final : public EventSources {
   /// Whether the daemon still works, found out within `wait_ns`.
   using WatchdogProbe = std::function<bool(std::uint64_t wait_ns)>;
 
-  /// `global` and `space` must outlive it.
-  LinuxEventSources(ConcurrentQueue& global, SpaceSource& space, Options options);
+  /// `global` and `space` must outlive it. It stops the loop when it ends.
+  LinuxEventSources(std::shared_ptr<EventLoop> loop, ConcurrentQueue& global, SpaceSource& space,
+                    Options options);
   ~LinuxEventSources() override;
 
   void registerActivity(const std::string& name, ActivityHandler handler) override;

@@ -49,10 +49,10 @@ LinuxKeepAlive::~LinuxKeepAlive() {
 void LinuxKeepAlive::changed(bool busy) {
   sd_notify(0, busy ? "STATUS=Working." : "STATUS=Idle.");
   if (busy) {
-    loop_->post([loop = loop_.get(), held = inhibition_,
-                 at_boot_ns = bootClockNs() + inhibit_after_ns_] {
-      held->becomeBusy(*loop, at_boot_ns);
-    });
+    loop_->post(
+        [loop = loop_.get(), held = inhibition_, at_boot_ns = bootClockNs() + inhibit_after_ns_] {
+          held->becomeBusy(*loop, at_boot_ns);
+        });
   } else {
     loop_->post([held = inhibition_] { held->becomeIdle(); });
   }

@@ -53,10 +53,10 @@ ipc::SharedDescriptor inhibitSleep(const std::string& bus_socket, const std::str
   const Bus bus = connectTo(bus_socket);
   if (bus == nullptr) return nullptr;
   sd_bus_message* answer = nullptr;
-  const int called = sd_bus_call_method(
-      bus.get(), "org.freedesktop.login1", "/org/freedesktop/login1",
-      "org.freedesktop.login1.Manager", "Inhibit", nullptr, &answer, "ssss", "sleep", "Spacekeep",
-      why.c_str(), "block");
+  const int called =
+      sd_bus_call_method(bus.get(), "org.freedesktop.login1", "/org/freedesktop/login1",
+                         "org.freedesktop.login1.Manager", "Inhibit", nullptr, &answer, "ssss",
+                         "sleep", "Spacekeep", why.c_str(), "block");
   const std::unique_ptr<sd_bus_message, UnrefMessage> answered(answer);
   int fd = -1;
   if (called < 0 || sd_bus_message_read(answered.get(), "h", &fd) <= 0) return nullptr;

@@ -14,8 +14,8 @@ namespace spacekeep {
 
 inline constexpr const char* kSystemBusSocket = "/run/dbus/system_bus_socket";
 
-/// Sends the signal "<everything before the last dot>.<rest>" from "/com/quorvel/Spacekeep". Answers
-/// 0, or an errno value; ENOENT where there is no bus.
+/// Sends the signal "<everything before the last dot>.<rest>" from "/com/quorvel/Spacekeep".
+/// Answers 0, or an errno value; ENOENT where there is no bus.
 [[nodiscard]] int emitSystemSignal(const std::string& bus_socket, const std::string& name);
 
 /// Asks the login manager not to suspend the machine (org.freedesktop.login1(5), Inhibit with

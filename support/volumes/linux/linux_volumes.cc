@@ -59,9 +59,8 @@ std::vector<VolumeSample> LinuxVolumes::sampleLocalVolumes() {
   for (const MountEntry& mount : eachFileSystemOnce(*table_.current())) {
     const auto space = measureSpace(mount);
     if (!space) continue;
-    samples.push_back({.volume = mount.mount_point,
-                       .file_system = fileSystemNumber(mount),
-                       .space = *space});
+    samples.push_back(
+        {.volume = mount.mount_point, .file_system = fileSystemNumber(mount), .space = *space});
   }
   memory_.judge(samples);
   return samples;

@@ -121,15 +121,18 @@ TEST(EntitlementRules, AnybodyMatchesOnlyWithoutOtherConditions) {
 }
 
 TEST(PeerIdentity, AUnitWithoutAPidfdIsDropped) {
-  const PeerIdentity identity(
-      {.uid = 1, .gid = 1, .groups = {}, .label = {}, .pid = 5, .pidfd = nullptr, .unit = "a.service"});
+  const PeerIdentity identity({.uid = 1,
+                               .gid = 1,
+                               .groups = {},
+                               .label = {},
+                               .pid = 5,
+                               .pidfd = nullptr,
+                               .unit = "a.service"});
   EXPECT_EQ(identity.unit(), std::nullopt);
   EXPECT_EQ(identity.describe(), "uid 1 gid 1 pid 5");
 }
 
-TEST(PeerIdentity, EveryIdentityHasItsOwnSerial) {
-  EXPECT_NE(peer().serial(), peer().serial());
-}
+TEST(PeerIdentity, EveryIdentityHasItsOwnSerial) { EXPECT_NE(peer().serial(), peer().serial()); }
 
 }  // namespace
 }  // namespace spacekeep::access

@@ -72,8 +72,8 @@ TEST(RuleFile, ATextOfDigitsIsANameAndNotANumber) {
 }
 
 TEST(RuleFile, AnUnknownEntitlementIsRemarkedAndTheRestHolds) {
-  const ParsedRule result = parsed(Dictionary{
-      {"MATCH_USER", 1}, {"GRANT", Array{"CLIENT_ENTITLEMENT", "CLIENT_ENTITELMENT"}}});
+  const ParsedRule result = parsed(
+      Dictionary{{"MATCH_USER", 1}, {"GRANT", Array{"CLIENT_ENTITLEMENT", "CLIENT_ENTITELMENT"}}});
   ASSERT_EQ(result.remarks.size(), 1U);
   EXPECT_EQ(result.remarks[0],
             "GRANT names CLIENT_ENTITELMENT, which is no entitlement of this system");
@@ -97,7 +97,8 @@ TEST(RuleFile, WhatIsBrokenAndWhy) {
   EXPECT_EQ(reason(Dictionary{{"MATCH_USER", 4294967296LL}}), ids);
   EXPECT_EQ(reason(Dictionary{{"MATCH_USER", 1.5}}), ids);
   EXPECT_EQ(reason(Dictionary{{"MATCH_USER", Array{Array{}}}}), ids);
-  EXPECT_EQ(reason(Dictionary{{"MATCH_UNIT", 5}}), "MATCH_UNIT must be a text or an array of texts");
+  EXPECT_EQ(reason(Dictionary{{"MATCH_UNIT", 5}}),
+            "MATCH_UNIT must be a text or an array of texts");
   EXPECT_EQ(reason(Dictionary{{"MATCH_LABEL", ""}}),
             "MATCH_LABEL must be a text or an array of texts");
   EXPECT_EQ(reason(Dictionary{{"GRANT", "CLIENT_ENTITLEMENT"}}), "GRANT must be an array of texts");

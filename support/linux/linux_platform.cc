@@ -1,0 +1,94 @@
+#include "support/linux/linux_platform.h"
+
+#include <utility>
+
+#include "support/access/linux/load_rules.h"
+#include "support/ipc/linux/bus_listener.h"
+#include "support/ipc/linux/sockets.h"
+#include "support/linux/token.h"
+#include "support/logging/log.h"
+#include "support/preferences/linux/sqlite_suite.h"
+
+namespace spacekeep {
+namespace {
+
+/// Everybody may connect as far as the file system goes: who gets in is for the entitlements to
+/// say.
+constexpr mode_t kSocketMode = 0666;
+
+/// Stands in where there is no socket: the daemon goes on with what needs no clients.
+class DeafListener final : public ipc::Listener {
+ public:
+  void setRequiredEntitlement(std::string) override {}
+  void resume() override {}
+};
+
+std::vector<access::Rule> loadAllRules(const LinuxPaths& paths) {
+  return access::loadRules(paths.vendor_directory + "/entitlements.d",
+                           paths.administrator_directory + "/entitlements.d",
+                           access::systemNameLookup());
+}
+
+OpenMetricsStatistics::Schedule scheduleOn(std::shared_ptr<EventLoop> loop) {
+  return [loop = std::move(loop)](std::uint64_t delay_ns, std::function<void()> task) {
+    loop->postAfter(delay_ns, std::move(task));
+  };
+}
+
+LinuxEventSources::Options eventOptions(const LinuxPaths& paths) {
+  return {.launch_directories = {paths.administrator_directory + "/launch.d",
+                                 paths.vendor_directory + "/launch.d"},
+          .state_directory = paths.state_directory,
+          .power_supply_directory = paths.power_supply_directory,
+          .mount_table_path = paths.mount_table,
+          .system_bus_socket = paths.system_bus_socket};
+}
+
+}  // namespace
+
+LinuxPlatform::LinuxPlatform(const ipc::InterfaceDescription& service_interface, LinuxPaths paths)
+    : paths_(std::move(paths)),
+      global_({}),
+      loop_(std::make_shared<EventLoop>()),
+      volumes_(paths_.mount_table),
+      access_(loadAllRules(paths_)),
+      statistics_(paths_.metrics_file, scheduleOn(loop_)),
+      connector_(ipc_loop_, global_, paths_.services_directory),
+      services_(global_, connector_, service_interface),
+      events_(loop_, global_, volumes_, eventOptions(paths_)),
+      platform_(makePlatform()) {}
+
+Platform LinuxPlatform::makePlatform() {
+  return {.global = global_,
+          .volumes = volumes_,
+          .access = access_,
+          .statistics = statistics_,
+          .files = files_,
+          .connector = connector_,
+          .services = services_,
+          .openPreferencesSuite = [directory = paths_.state_directory](const std::string& name)
+              -> std::unique_ptr<PreferencesSuite> { return SqliteSuite::open(directory, name); },
+          .makeListener =
+              [this](ipc::ServedInterface interface) { return makeListener(std::move(interface)); },
+          .createSpacekeepToken = [] { return Value(randomToken()); }};
+}
+
+std::unique_ptr<ipc::Listener> LinuxPlatform::makeListener(ipc::ServedInterface interface) {
+  ipc::SharedDescriptor listening = ipc::listeningSocketFromServiceManager();
+  std::string why;
+  if (listening == nullptr) listening = ipc::bindListeningSocket(paths_.socket, kSocketMode, why);
+  if (listening == nullptr) {
+    logProblem("%s cannot listen on %s, clients cannot connect: %s", "makeListener", paths_.socket,
+               why);
+    return std::make_unique<DeafListener>();
+  }
+  return std::make_unique<ipc::BusListener>(ipc_loop_, global_, access_, std::move(listening),
+                                            std::move(interface));
+}
+
+void LinuxPlatform::watchQueues(std::vector<std::shared_ptr<SerialQueue>> queues) {
+  events_.setWatchdogProbe([probe = std::make_shared<QueueProbe>(std::move(queues))](
+                               std::uint64_t wait_ns) { return probe->answersWithin(wait_ns); });
+}
+
+}  // namespace spacekeep

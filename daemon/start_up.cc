@@ -1,8 +1,8 @@
 #include "daemon/start_up.h"
 
 #include <cstdlib>
+#include <cstring>
 #include <memory>
-#include <system_error>
 #include <utility>
 
 #include "daemon/spacekeep.h"
@@ -22,7 +22,7 @@ void announceLaunch(EventSources& events) {
   const int error_number = events.postNotification(kLaunchedNotification);
   if (error_number == 0) return;
   logProblem("%s Failed to post the launched notification: %s", "main",
-             std::generic_category().message(error_number));
+             std::strerror(error_number));
 }
 
 void runSynchronously(ConcurrentQueue& queue, Task task) {

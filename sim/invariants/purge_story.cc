@@ -69,6 +69,31 @@ int PurgeStory::inFlightBefore(std::size_t operation, const std::string& service
   return count;
 }
 
+bool PurgeStory::wasIdle(std::size_t operation, std::size_t first, std::size_t last,
+                         bool asked_only) const {
+  std::map<std::size_t, int> changes;
+  for (const ShareTask& task : tasks) {
+    const bool counts = task.operation == operation && task.added && task.share &&
+                        (!asked_only || task.share->donation > 0);
+    if (counts) ++changes[task.adding_at];
+  }
+  for (const Reply& reply : replies) {
+    if (reply.operation == operation) --changes[reply.removing_at];
+  }
+  for (const Failure& failure : failures) {
+    if (failure.operation == operation) --changes[failure.removing_at];
+  }
+  int count = 0;
+  bool idle = true;
+  for (const auto& [at, change] : changes) {
+    if (at > last) break;
+    if (at > first && idle) return true;
+    count += change;
+    idle = count <= 0;
+  }
+  return idle;
+}
+
 std::string PurgeStory::name(const Operation& operation) const {
   return "purge of " + std::to_string(operation.needed) + " bytes (" + operation.token + ")";
 }

@@ -53,6 +53,7 @@ struct Reply {
   std::size_t removing_at = kNowhere;
   unsigned removals = 0;
   unsigned signals = 0;
+  std::size_t signalled_at = kNowhere;
   std::size_t done_at = kNowhere;  ///< "took ... seconds"
   std::size_t operation = kNowhere;
 };
@@ -118,6 +119,10 @@ struct PurgeStory {
   /// Successful additions less removals of the service before `at`.
   [[nodiscard]] int inFlightBefore(std::size_t operation, const std::string& service,
                                    std::size_t at) const;
+  /// Whether nobody was in flight at some moment from `first` to `last`. A service that was added
+  /// with a share of 0 has nothing to answer; `asked_only` leaves those out.
+  [[nodiscard]] bool wasIdle(std::size_t operation, std::size_t first, std::size_t last,
+                             bool asked_only) const;
   [[nodiscard]] std::string name(const Operation& operation) const;
 };
 

@@ -144,6 +144,7 @@ class Reader {
         story_.oddities.push_back("a signal outside of the booking of a reply");
       } else {
         ++story_.replies[state.reply].signals;
+        story_.replies[state.reply].signalled_at = at;
       }
     } else if (line.format == formats::kTook && state.reply != kNowhere) {
       story_.replies[state.reply].done_at = at;
@@ -247,12 +248,16 @@ class Reader {
     for (const std::size_t i : possible) story_.operations[i].blurred = true;
   }
 
-  // Each asked urgency queues one computation for each service, each met share one more.
+  // Each asked urgency queues one computation for each service, each met share one more. In the
+  // very instant of its end a purge may have computations left even for services it has not named
+  // yet; time does not move on before they have run.
   [[nodiscard]] std::int64_t outstandingTasks(std::size_t operation, const ShareTask& next) const {
     const Operation& ended = story_.operations[operation];
+    const bool same_instant = story_.timeAt(ended.end_at) == story_.timeAt(next.at);
+    const bool may_be_asked = same_instant || ended.services.contains(next.service);
     std::int64_t count = 0;
     for (const Pass& pass : ended.passes) {
-      if (pass.asked_at != kNowhere && ended.services.contains(next.service)) ++count;
+      if (pass.asked_at != kNowhere && may_be_asked) ++count;
     }
     for (const Reply& reply : story_.replies) {
       if (reply.operation == operation && reply.service == next.service &&

@@ -27,6 +27,15 @@ bool mayFinishEarly(const Operation& operation) {
   return truthAt(operation.request, "SPACEKEEP_FINISH_EARLY");
 }
 
+/// Whether a purge that asked for it may have found, within these bounds, that it has what it needs
+/// and that nobody is at work for it.
+bool mayHaveFinished(const PurgeStory& story, const Operation& operation, std::size_t first,
+                     std::size_t last) {
+  if (!mayFinishEarly(operation) || !story.hadReached(operation, first, last)) return false;
+  const auto index = static_cast<std::size_t>(&operation - story.operations.data());
+  return operation.blurred || story.wasIdle(index, first, last, true);
+}
+
 bool isComplete(const Operation& operation) {
   return operation.end_at != kNowhere && operation.measured_at != kNowhere &&
          std::all_of(operation.passes.begin(), operation.passes.end(), [](const Pass& pass) {
@@ -75,10 +84,7 @@ void checkUrgencies(const PurgeStory& story, Findings& findings) {
     const std::size_t ran = operation.passes.size();
     if (ran == limit) continue;
     const std::size_t from = ran == 0 ? operation.begin_at : operation.passes.back().stats_at;
-    if (mayFinishEarly(operation) && ran < limit &&
-        story.hadReached(operation, from, operation.measured_at)) {
-      continue;
-    }
+    if (ran < limit && mayHaveFinished(story, operation, from, operation.measured_at)) continue;
     findings.push_back(story.name(operation) + " ran " + std::to_string(ran) + " urgencies of " +
                        std::to_string(limit));
   }
@@ -124,6 +130,12 @@ void checkOnlySignalsEndWaits(const PurgeStory& story, Findings& findings) {
     }
   }
   for (const Reply& reply : story.replies) {
+    if (reply.signals > 0 && reply.operation != kNowhere &&
+        !story.operations[reply.operation].blurred &&
+        !story.wasIdle(reply.operation, reply.removing_at, reply.signalled_at, false)) {
+      findings.push_back("a reply of " + reply.service +
+                         " signalled while services were still in flight");
+    }
     if (reply.signals <= 1) continue;
     findings.push_back("one reply of " + reply.service + " signalled " +
                        std::to_string(reply.signals) + " times");

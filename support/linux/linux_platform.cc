@@ -35,6 +35,17 @@ OpenMetricsStatistics::Schedule scheduleOn(std::shared_ptr<EventLoop> loop) {
   };
 }
 
+/// How soon it is looked whether there is room for the reserve again, while it is given away.
+constexpr std::uint64_t kReserveRetryNs = 300'000'000'000;
+
+void takeReserveWhenThereIsRoom(const std::shared_ptr<EventLoop>& loop,
+                                const std::shared_ptr<ReserveFile>& reserve) {
+  // The loop drops what is delayed when it stops, so it may be held by its own callback.
+  loop->postAfter(kReserveRetryNs, [loop, reserve] {
+    if (!reserve->take()) takeReserveWhenThereIsRoom(loop, reserve);
+  });
+}
+
 LinuxEventSources::Options eventOptions(const LinuxPaths& paths) {
   return {.launch_directories = {paths.administrator_directory + "/launch.d",
                                  paths.vendor_directory + "/launch.d"},
@@ -50,6 +61,7 @@ LinuxPlatform::LinuxPlatform(const ipc::InterfaceDescription& service_interface,
     : paths_(std::move(paths)),
       global_({}),
       loop_(std::make_shared<EventLoop>()),
+      reserve_(std::make_shared<ReserveFile>(paths_.state_directory + "/reserve")),
       volumes_(paths_.mount_table),
       access_(loadAllRules(paths_)),
       statistics_(paths_.metrics_file, scheduleOn(loop_)),
@@ -66,11 +78,23 @@ Platform LinuxPlatform::makePlatform() {
           .files = files_,
           .connector = connector_,
           .services = services_,
-          .openPreferencesSuite = [directory = paths_.state_directory](const std::string& name)
-              -> std::unique_ptr<PreferencesSuite> { return SqliteSuite::open(directory, name); },
+          .openPreferencesSuite = [this](const std::string& name) { return openSuite(name); },
           .makeListener =
               [this](ipc::ServedInterface interface) { return makeListener(std::move(interface)); },
           .createSpacekeepToken = [] { return Value(randomToken()); }};
+}
+
+std::unique_ptr<PreferencesSuite> LinuxPlatform::openSuite(const std::string& name) {
+  SqliteSuiteOptions options;
+  options.make_room = [loop = loop_, reserve = reserve_] {
+    if (!reserve->giveBack()) return false;
+    takeReserveWhenThereIsRoom(loop, reserve);
+    return true;
+  };
+  auto suite = SqliteSuite::open(paths_.state_directory, name, std::move(options));
+  // Opening makes the directory. Without the room for a reserve now it is tried again later.
+  if (!reserve_->take()) takeReserveWhenThereIsRoom(loop_, reserve_);
+  return suite;
 }
 
 std::unique_ptr<ipc::Listener> LinuxPlatform::makeListener(ipc::ServedInterface interface) {

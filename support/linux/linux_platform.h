@@ -15,6 +15,7 @@
 #include "support/ipc/linux/connector.h"
 #include "support/ipc/linux/ipc_loop.h"
 #include "support/linux/linux_paths.h"
+#include "support/linux/reserve_file.h"
 #include "support/platform.h"
 #include "support/queues/concurrent_queue.h"
 #include "support/queues/serial_queue.h"
@@ -43,11 +44,13 @@ class LinuxPlatform {
 
  private:
   [[nodiscard]] Platform makePlatform();
+  [[nodiscard]] std::unique_ptr<PreferencesSuite> openSuite(const std::string& name);
   [[nodiscard]] std::unique_ptr<ipc::Listener> makeListener(ipc::ServedInterface interface);
 
   const LinuxPaths paths_;
   ConcurrentQueue global_;
   const std::shared_ptr<EventLoop> loop_;
+  const std::shared_ptr<ReserveFile> reserve_;
   ipc::IpcLoop ipc_loop_;
   LinuxVolumes volumes_;
   access::EntitlementAccess access_;

@@ -88,11 +88,11 @@ TEST(LowSpaceStream, OneEventIsHandledAtATime) {
     std::atomic<int> running{0};
     LowSpaceStream stream(volume, queue, [&](const Dictionary&) {
       EXPECT_EQ(++running, 1);
-      rt::sleepNs(300 * kSecond);  // longer than the pause before the next event
+      rt::sleepNs(90 * kSecond);  // longer than the pause before the next event
       --running;
       handled.signal();
     });
-    for (int i = 0; i < 3; ++i) handled.wait();
+    for (int i = 0; i < 2; ++i) handled.wait();
   });
 }
 

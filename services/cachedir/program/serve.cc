@@ -1,7 +1,6 @@
 #include <spacekeep/service.h>
 
 #include <atomic>
-#include <chrono>
 #include <cstdio>
 
 #include "services/cachedir/program/cache_service.h"

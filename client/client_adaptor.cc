@@ -61,17 +61,18 @@ struct Route {
   ServeMode mode;
   std::string_view lane;
   std::size_t lane_width;
+  bool brief;
   Serve serve;
 };
 
 constexpr Route kRoutes[] = {
-    {"clientCheckin", ServeMode::kInOrder, "", 1, checkin},
-    {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, notSupportedYet},
-    {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, notSupportedYet},
-    {"clientPurge", ServeMode::kLane, "purge", kPurgeLaneWidth, purge},
-    {"clientCancelPurge", ServeMode::kLane, "cancel", kCancelLaneWidth, cancelPurge},
-    {"clientSetState", ServeMode::kInOrder, "", 1, notSupportedYet},
-    {"clientGetState", ServeMode::kInOrder, "", 1, notSupportedYet},
+    {"clientCheckin", ServeMode::kInOrder, "", 1, false, checkin},
+    {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, notSupportedYet},
+    {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, notSupportedYet},
+    {"clientPurge", ServeMode::kLane, "purge", kPurgeLaneWidth, false, purge},
+    {"clientCancelPurge", ServeMode::kLane, "cancel", kCancelLaneWidth, true, cancelPurge},
+    {"clientSetState", ServeMode::kInOrder, "", 1, true, notSupportedYet},
+    {"clientGetState", ServeMode::kInOrder, "", 1, true, notSupportedYet},
 };
 
 void serveCall(const Route& route, const std::weak_ptr<SpacekeepClientProtocol>& weak, Arguments in,
@@ -99,6 +100,7 @@ ipc::ServedInterface makeClientAdaptor(std::weak_ptr<SpacekeepClientProtocol> ex
                               .mode = route.mode,
                               .lane = route.lane,
                               .lane_width = route.lane_width,
+                              .brief = route.brief,
                               .serve = [&route, exported](Arguments in, Responder responder) {
                                 serveCall(route, exported, std::move(in), std::move(responder));
                               }});

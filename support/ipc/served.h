@@ -59,6 +59,9 @@ struct ServedMethod {
   ServeMode mode = ServeMode::kInOrder;
   std::string_view lane;        ///< lanes are shared by name
   std::size_t lane_width = 64;
+  /// Served by the thread that reads the messages: for handlers that are over in microseconds unless
+  /// they have to wait for a queue.
+  bool brief = false;
   std::function<void(Arguments, Responder)> serve;
 };
 

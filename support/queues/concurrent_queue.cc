@@ -4,6 +4,7 @@
 #include <system_error>
 #include <utility>
 
+#include "support/queues/borrowed_thread.h"
 #include "support/queues/run_task.h"
 
 namespace spacekeep {
@@ -57,6 +58,9 @@ ConcurrentQueue::~ConcurrentQueue() {
 }
 
 void ConcurrentQueue::async(Task task) {
+  if (BorrowedThread* self = BorrowedThread::current(); self != nullptr && self->take(*this, task)) {
+    return;
+  }
   const Lock lock(mutex_);
   pending_.push_back(std::move(task));
   provideWorker();
@@ -154,6 +158,7 @@ void ConcurrentQueue::workerUnblocks() {
 BlockingRegion::BlockingRegion()
     : worker_(static_cast<ConcurrentQueue::Worker*>(rt::threadSlot(rt::ThreadSlot::kPoolWorker))) {
   if (worker_ != nullptr && worker_->open_regions++ == 0) worker_->queue->workerBlocks();
+  if (BorrowedThread* self = BorrowedThread::current(); self != nullptr) self->aboutToWait();
 }
 
 BlockingRegion::~BlockingRegion() {

@@ -97,7 +97,7 @@ void sleepNs(std::uint64_t duration_ns);
 
 /// Per-thread storage for the few facts that belong to the running thread. Starts null in every
 /// thread; nothing is freed when the thread ends.
-enum class ThreadSlot { kCurrentQueue, kCurrentConnection, kPoolWorker, kCount };
+enum class ThreadSlot { kCurrentQueue, kCurrentConnection, kPoolWorker, kBorrowedThread, kCount };
 [[nodiscard]] void*& threadSlot(ThreadSlot slot);
 
 /// Ends the process after writing `reason` to standard error. For broken invariants of the program

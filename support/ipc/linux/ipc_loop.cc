@@ -7,12 +7,16 @@
 #include <mutex>
 #include <utility>
 
+#include "support/queues/borrowed_thread.h"
 #include "support/queues/waiting.h"
 
 namespace spacekeep::ipc {
 
 namespace {
+
+/// The loop whose duty this thread has.
 thread_local const IpcLoop* current_loop = nullptr;
+
 }  // namespace
 
 IpcLoop::IpcLoop() {
@@ -22,17 +26,36 @@ IpcLoop::IpcLoop() {
     rt::panic("IPC: the event loop takes no wake-up source");
   }
   inbox_ = std::make_shared<Inbox>(wake_fd_);
-  thread_ = rt::Thread("ipc", [this] { run(); });
+  startThread();
 }
 
 IpcLoop::~IpcLoop() {
   post([this] { stopping_ = true; });
-  thread_.join();
+  {
+    const BlockingRegion waiting;
+    const std::scoped_lock lock(threads_mutex_);
+    while (threads_ > 0) thread_ended_.wait(threads_mutex_);
+  }
   sd_event_unref(event_);
   ::close(wake_fd_);
 }
 
+void IpcLoop::startThread() {
+  {
+    const std::scoped_lock lock(threads_mutex_);
+    ++threads_;
+  }
+  rt::Thread("ipc", [this] {
+    run();
+    const std::scoped_lock lock(threads_mutex_);
+    --threads_;
+    // Notified under the lock: the destructor that waits for this goes on right after.
+    thread_ended_.notifyAll();
+  }).detach();
+}
+
 bool IpcLoop::Inbox::post(Task task) {
+  if (postFromDuty(task)) return true;
   const std::scoped_lock lock(mutex_);
   if (stopped_) return false;
   posted_.push_back(std::move(task));
@@ -41,6 +64,12 @@ bool IpcLoop::Inbox::post(Task task) {
   // descriptor is closed once stopped_ is set.
   const std::uint64_t one = 1;
   [[maybe_unused]] const ssize_t written = ::write(wake_fd_, &one, sizeof one);
+  return true;
+}
+
+bool IpcLoop::Inbox::postFromDuty(Task& task) {
+  if (current_loop == nullptr || current_loop->inbox_.get() != this) return false;
+  from_duty_.push_back(std::move(task));
   return true;
 }
 
@@ -79,17 +108,57 @@ void IpcLoop::runPosted() {
   }
 }
 
+void IpcLoop::runOwn() {
+  while (!inbox_->from_duty_.empty()) {
+    for (Task& task : std::exchange(inbox_->from_duty_, {})) {
+      task();
+      task = nullptr;
+    }
+  }
+}
+
+void IpcLoop::serveSoon(ConcurrentQueue* lent_to, Task task) {
+  to_serve_.push_back({lent_to, std::move(task)});
+}
+
+bool IpcLoop::serve() {
+  // Only what is there now: the answers go out before more is served.
+  for (std::size_t left = to_serve_.size(); left > 0; --left) {
+    ToServe next = std::move(to_serve_.front());
+    to_serve_.pop_front();
+    if (next.lent_to == nullptr) {
+      next.task();
+      continue;
+    }
+    BorrowedThread self(*next.lent_to, [this] { giveUpDuty(); });
+    if (!self.run(std::move(next.task))) return false;
+  }
+  return true;
+}
+
+void IpcLoop::giveUpDuty() {
+  current_loop = nullptr;
+  startThread();
+}
+
+bool IpcLoop::mayStop() {
+  if (!stopping_) return false;
+  const std::scoped_lock lock(inbox_->mutex_);
+  inbox_->stopped_ = inbox_->posted_.empty();
+  return inbox_->stopped_;
+}
+
 void IpcLoop::run() {
   current_loop = this;
   while (true) {
-    if (stopping_) {
-      const std::scoped_lock lock(inbox_->mutex_);
-      inbox_->stopped_ = inbox_->posted_.empty();
-      if (inbox_->stopped_) return;
-    }
-    if (sd_event_run(event_, UINT64_MAX) < 0) rt::panic("IPC: the event loop failed");
+    if (!serve()) return;
+    runOwn();
+    if (mayStop()) break;
+    const bool idle = to_serve_.empty() && inbox_->from_duty_.empty();
+    if (sd_event_run(event_, idle ? UINT64_MAX : 0) < 0) rt::panic("IPC: the event loop failed");
     wakeups_.fetch_add(1, std::memory_order_relaxed);
   }
+  current_loop = nullptr;
 }
 
 }  // namespace spacekeep::ipc

@@ -159,6 +159,13 @@ void ServedConnection::serve(sd_bus_message* call, const MethodDescription& meth
 }
 
 void ServedConnection::run(const ServedMethod& method, Task task) {
+  // Brief or not, by the same way, so that the calls of one connection keep their order.
+  context_->loop.serveSoon(method.brief ? &context_->global : nullptr,
+                           [self = shared_from_this(), served = &method,
+                            task = std::move(task)]() mutable { self->schedule(*served, std::move(task)); });
+}
+
+void ServedConnection::schedule(const ServedMethod& method, Task task) {
   switch (method.mode) {
     case ServeMode::kInOrder:
       if (in_order_ == nullptr) in_order_ = SerialQueue::create("ipc.connection", context_->global);

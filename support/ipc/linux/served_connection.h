@@ -43,6 +43,7 @@ class ServedConnection final : public BusLink::Owner,
   void dispatchServed(sd_bus_message* call, const std::string& member);
   void serve(sd_bus_message* call, const MethodDescription& method);
   void run(const ServedMethod& method, Task task);
+  void schedule(const ServedMethod& method, Task task);
   void sendText(sd_bus_message* call, const std::string& text);
   void sendEmpty(sd_bus_message* call);
   void refuse(sd_bus_message* call, const char* error_name, const std::string& text);

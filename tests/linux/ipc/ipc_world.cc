@@ -24,6 +24,8 @@ const InterfaceDescription& testInterface() {
        {"number", {{"number", kInt32}}, {{"number", kInt32}}},
        {"hold", {}, {{"text", kString}}},
        {"block", {}, {}},
+       {"numberBriefly", {{"number", kInt32}}, {{"number", kInt32}}},
+       {"blockBriefly", {}, {}},
        {"forget", {}, {}},
        {"whoAmI", {}, {{"uid", kOptionalValue}}}}};
   return interface;
@@ -107,6 +109,17 @@ ServedMethod TestServer::method(std::string_view name,
   return served;
 }
 
+namespace {
+
+/// The same method under another name, served by the thread that reads the messages.
+ServedMethod briefly(ServedMethod method, std::string_view name) {
+  method.name = name;
+  method.brief = true;
+  return method;
+}
+
+}  // namespace
+
 ServedInterface TestServer::interface() {
   ServedInterface served;
   served.description = &testInterface();
@@ -121,14 +134,15 @@ ServedInterface TestServer::interface() {
         }
         responder.reply({arguments.at(1)});
       }));
-  served.methods.push_back(
-      method("number", [this](Arguments arguments, const Responder& responder) {
-        {
-          const std::scoped_lock lock(mutex_);
-          numbers_.push_back(std::get<std::int32_t>(arguments.at(0)));
-        }
-        responder.reply(std::move(arguments));
-      }));
+  auto number = method("number", [this](Arguments arguments, const Responder& responder) {
+    {
+      const std::scoped_lock lock(mutex_);
+      numbers_.push_back(std::get<std::int32_t>(arguments.at(0)));
+    }
+    responder.reply(std::move(arguments));
+  });
+  served.methods.push_back(number);
+  served.methods.push_back(briefly(number, "numberBriefly"));
   served.methods.push_back(method("hold", [this](const Arguments&, Responder responder) {
     const std::scoped_lock lock(mutex_);
     held_.push_back(std::move(responder));
@@ -145,7 +159,8 @@ ServedInterface TestServer::interface() {
   block.mode = ServeMode::kLane;
   block.lane = "blocking";
   block.lane_width = 2;
-  served.methods.push_back(std::move(block));
+  served.methods.push_back(block);
+  served.methods.push_back(briefly(block, "blockBriefly"));
   served.methods.push_back(method("forget", [](const Arguments&, const Responder&) {}));
   served.methods.push_back(method("whoAmI", [](const Arguments&, const Responder& responder) {
     responder.reply({OptionalValue(Value(currentConnection()->identity().uid()))});

@@ -154,15 +154,19 @@ rt::ScheduleOptions scheduleFor(std::uint64_t seed) {
   return options;
 }
 
-PurgeRun runPurgeScenario(std::uint64_t seed) {
+PurgeRun playPurgeScenario(PurgeScenario scenario, const rt::ScheduleOptions& options) {
   PurgeRun run;
-  run.scenario = derivePurgeScenario(seed);
-  run.report = rt::runSchedule(scheduleFor(seed), [&run] {
+  run.scenario = std::move(scenario);
+  run.report = rt::runSchedule(options, [&run] {
     Stage stage(run);
     stage.play();
     stage.takeDown();
   });
   return run;
+}
+
+PurgeRun runPurgeScenario(std::uint64_t seed) {
+  return playPurgeScenario(derivePurgeScenario(seed), scheduleFor(seed));
 }
 
 }  // namespace spacekeep::sim

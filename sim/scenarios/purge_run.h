@@ -26,6 +26,9 @@ struct PurgeRun {
 
 /// Random and PCT schedules take turns.
 [[nodiscard]] rt::ScheduleOptions scheduleFor(std::uint64_t seed);
+[[nodiscard]] PurgeRun playPurgeScenario(PurgeScenario scenario,
+                                         const rt::ScheduleOptions& options);
+/// The scenario and the schedule of that seed.
 [[nodiscard]] PurgeRun runPurgeScenario(std::uint64_t seed);
 
 }  // namespace spacekeep::sim

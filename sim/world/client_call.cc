@@ -1,7 +1,7 @@
-#include <mutex>
 #include <utility>
 
 #include "sim/world/simulated_listener.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::sim {
 namespace {

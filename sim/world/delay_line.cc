@@ -1,6 +1,5 @@
 #include "sim/world/delay_line.h"
-
-#include <mutex>
+#include "support/runtime/locks.h"
 
 namespace spacekeep::sim {
 

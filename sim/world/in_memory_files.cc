@@ -1,8 +1,8 @@
 #include "sim/world/in_memory_files.h"
 
 #include <algorithm>
-#include <mutex>
 
+#include "support/runtime/locks.h"
 #include "support/values/plist.h"
 
 namespace spacekeep::sim {

@@ -1,6 +1,6 @@
 #include "sim/world/in_memory_preferences.h"
+#include "support/runtime/locks.h"
 
-#include <mutex>
 #include <utility>
 
 namespace spacekeep::sim {

@@ -1,6 +1,6 @@
 #include "sim/world/recording_statistics.h"
+#include "support/runtime/locks.h"
 
-#include <mutex>
 #include <set>
 
 namespace spacekeep::sim {

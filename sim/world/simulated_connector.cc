@@ -1,6 +1,6 @@
 #include "sim/world/simulated_connector.h"
+#include "support/runtime/locks.h"
 
-#include <mutex>
 #include <utility>
 
 namespace spacekeep::sim {

@@ -1,9 +1,9 @@
 #include "sim/world/simulated_listener.h"
 
-#include <mutex>
 #include <utility>
 
 #include "support/access/entitlements.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::sim {
 

@@ -1,10 +1,10 @@
 #include "sim/world/simulated_service.h"
 
 #include <algorithm>
-#include <mutex>
 #include <utility>
 
 #include "sim/world/simulated_connection.h"
+#include "support/runtime/locks.h"
 #include "support/values/text.h"
 
 namespace spacekeep::sim {

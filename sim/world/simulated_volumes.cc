@@ -1,7 +1,7 @@
 #include "sim/world/simulated_volumes.h"
+#include "support/runtime/locks.h"
 
 #include <algorithm>
-#include <mutex>
 #include <utility>
 
 namespace spacekeep::sim {

@@ -1,10 +1,10 @@
 #include "sim/world/trace.h"
 
 #include <cstdio>
-#include <mutex>
 #include <utility>
 
 #include "support/logging/log.h"
+#include "support/runtime/locks.h"
 #include "support/timebase.h"
 #include "support/values/text.h"
 

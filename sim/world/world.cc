@@ -1,10 +1,10 @@
 #include "sim/world/world.h"
 
-#include <mutex>
 #include <utility>
 
 #include "registry/service_protocol.h"
 #include "support/access/entitlements.h"
+#include "support/runtime/locks.h"
 #include "support/timebase.h"
 
 namespace spacekeep::sim {

@@ -1,9 +1,9 @@
 #include <spacekeep/service.h>
 
 #include <algorithm>
-#include <mutex>
 
 #include "support/queues/concurrent_queue.h"
+#include "support/runtime/locks.h"
 #include "support/runtime/runtime.h"
 
 namespace spacekeep::sdk {

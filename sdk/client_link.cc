@@ -3,7 +3,6 @@
 #include <fmt/core.h>
 
 #include <algorithm>
-#include <mutex>
 #include <optional>
 #include <utility>
 #include <vector>
@@ -12,6 +11,7 @@
 #include "sdk/deadline_timer.h"
 #include "sdk/failure.h"
 #include "support/ipc/linux/connector.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::sdk {
 

@@ -1,9 +1,9 @@
 #include "sdk/host_control.h"
 
-#include <mutex>
 #include <utility>
 
 #include "support/queues/concurrent_queue.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::sdk {
 

@@ -1,12 +1,12 @@
 #include "sdk/served_service.h"
 
 #include <exception>
-#include <mutex>
 #include <utility>
 #include <variant>
 #include <vector>
 
 #include "registry/service_protocol.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::sdk {
 namespace {

@@ -9,7 +9,7 @@
 #include <string>
 
 #include "client/client_protocol.h"
-#include "support/ipc/linux/bus_connection.h"
+#include "support/ipc/linux/connector.h"
 #include "support/ipc/linux/ipc_loop.h"
 #include "support/ipc/linux/sockets.h"
 #include "support/queues/waiting.h"
@@ -28,8 +28,8 @@ class BadDescriptor : public testing::Test {
 
   /// The error with which the daemon answers a check-in with this descriptor; empty for none.
   std::string checkInWith(int fd) {
-    ipc::IpcLoop loop;
     ConcurrentQueue global({.name = "test"});
+    ipc::IpcLoop loop;
     std::string why;
     auto connection = ipc::connectToPath(loop, global, sandbox_.socketPath(), why);
     if (!connection) return "no connection: " + why;

@@ -101,6 +101,7 @@ TEST_F(Hostile, GarbageInsteadOfAuthenticationIsClosed) {
   garbage.send("GET / HTTP/1.1\r\nHost: disk\r\n\r\n" + std::string(100'000, '\xff'));
   expectHonestPurgeSucceeds();
   EXPECT_TRUE(garbage.closedByPeer());
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "refused")) << sandbox_.daemonLog();
 }
 
 TEST_F(Hostile, HalfAnAuthenticationLeftOpenIsClosedByItsTimeLimit) {
@@ -108,7 +109,7 @@ TEST_F(Hostile, HalfAnAuthenticationLeftOpenIsClosedByItsTimeLimit) {
   half.send(std::string_view("\0AUTH EXTER", 11));
   expectHonestPurgeSucceeds();
   EXPECT_TRUE(half.closedByPeer());
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "authentication")) << sandbox_.daemonLog();
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "did not authenticate in time")) << sandbox_.daemonLog();
 }
 
 TEST_F(Hostile, AnOversizedMessageIsRefusedBeforeItIsRead) {
@@ -117,7 +118,7 @@ TEST_F(Hostile, AnOversizedMessageIsRefusedBeforeItIsRead) {
   large.send(std::string(8 * 1024 * 1024, 'x'));
   expectHonestPurgeSucceeds();
   EXPECT_TRUE(large.closedByPeer());
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "bytes")) << sandbox_.daemonLog();
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "it sent a message of 10485")) << sandbox_.daemonLog();
 }
 
 TEST_F(Hostile, DeeplyNestedMessagesAreRefused) {
@@ -177,7 +178,7 @@ TEST_F(Hostile, AThousandConnectionsOfOneUserLeaveRoomForOthers) {
   std::vector<RawPeer> crowd;
   for (int i = 0; i < 1000; ++i) crowd.push_back(authenticatedPeer());
   expectHonestPurgeSucceeds();
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "connections")) << sandbox_.daemonLog();
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "connections of this user are open")) << sandbox_.daemonLog();
   crowd.clear();
   EXPECT_NO_THROW(static_cast<void>(connect()));
 }

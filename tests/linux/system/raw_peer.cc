@@ -96,6 +96,12 @@ std::size_t RawPeer::send(std::string_view bytes) const {
 
 void RawPeer::authenticate() const {
   send(std::string_view("\0AUTH EXTERNAL 30\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n", 45));
+  std::string answers;
+  while (answers.find("AGREE_UNIX_FD\r\n") == std::string::npos) {
+    const std::string more = receive();
+    if (more.empty()) return;
+    answers += more;
+  }
 }
 
 bool RawPeer::closedByPeer() const {
@@ -113,7 +119,7 @@ std::string RawPeer::receive() const {
   std::string all;
   char buffer[65536];
   pollfd waiting = {fd_, POLLIN, 0};
-  while (poll(&waiting, 1, 500) > 0) {
+  for (int patience_ms = 2000; poll(&waiting, 1, patience_ms) > 0; patience_ms = 0) {
     const ssize_t got = recv(fd_, buffer, sizeof buffer, 0);
     if (got <= 0) break;
     all.append(buffer, static_cast<std::size_t>(got));

@@ -20,11 +20,11 @@ class RawPeer {
   [[nodiscard]] bool connected() const { return fd_ >= 0; }
   /// Sends what fits without waiting for long; answers how much went out.
   std::size_t send(std::string_view bytes) const;
-  /// The usual handshake up to BEGIN.
+  /// The usual handshake up to BEGIN, its answers read.
   void authenticate() const;
   /// True once the other end has closed, within a few seconds.
   [[nodiscard]] bool closedByPeer() const;
-  /// What arrives within a moment.
+  /// What arrives next; empty when nothing does within two seconds, or the other end has closed.
   [[nodiscard]] std::string receive() const;
 
  private:

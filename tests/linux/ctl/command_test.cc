@@ -69,8 +69,8 @@ class CommandTest : public testing::Test {
   }
 
   SocketDirectory directory_;
-  FakeDaemon daemon_{directory_.daemonSocket()};
   rt::Guarded<Dictionary> seen_;
+  FakeDaemon daemon_{directory_.daemonSocket()};
 };
 
 TEST_F(CommandTest, AReachedAmountExitsWithZeroAndPrintsTheTable) {

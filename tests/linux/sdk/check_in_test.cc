@@ -62,7 +62,7 @@ class CheckInTest : public testing::Test {
 
 TEST_F(CheckInTest, TheServiceAnswersThePingThatComesBeforeTheAnswerAndServesAfterwards) {
   daemon_.on("clientCheckin", daemon_.registering(registered_));
-  daemon_.start();
+  const auto running = daemon_.run();
   const ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kServing));
   EXPECT_EQ(service_->pings, 1);
@@ -80,7 +80,7 @@ TEST_F(CheckInTest, TheCheckInTellsWhatTheServiceDoes) {
   daemon_.on("clientCheckin", [&](const ipc::Arguments& in, const ipc::Responder&) {
     calls.update([&](auto& list) { list.push_back({in.at(0), in.at(2)}); });
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   auto given = options();
   given.does_purge = false;
   given.does_periodic = true;
@@ -97,13 +97,13 @@ TEST_F(CheckInTest, TheCheckInTellsWhatTheServiceDoes) {
 
 TEST_F(CheckInTest, AfterTheDaemonWentAwayTheServiceChecksInAgainByItself) {
   daemon_.on("clientCheckin", daemon_.registering(registered_));
-  daemon_.start();
+  const auto running = daemon_.run();
   const ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kServing));
   daemon_.stop();
   ASSERT_TRUE(reaches(HostState::kWaiting));
   EXPECT_THAT(lastTextOf(HostState::kWaiting), HasSubstr("trying again in "));
-  daemon_.start();
+  const auto running_again = daemon_.run();
   ASSERT_TRUE(reaches(HostState::kServing, 2));
   ASSERT_EQ(registered_.get().size(), 2U);
   EXPECT_TRUE(pings(*registered_.get().at(1)));
@@ -114,13 +114,13 @@ TEST_F(CheckInTest, AServiceThatStartsBeforeTheDaemonWaitsForIt) {
   ASSERT_TRUE(reaches(HostState::kWaiting));
   EXPECT_THAT(lastTextOf(HostState::kWaiting), HasSubstr(directory_.daemonSocket()));
   daemon_.on("clientCheckin", daemon_.registering(registered_));
-  daemon_.start();
+  const auto running = daemon_.run();
   EXPECT_TRUE(reaches(HostState::kServing));
 }
 
 TEST_F(CheckInTest, WhenOnlyTheServiceConnectionEndsBothAreMadeAnew) {
   daemon_.on("clientCheckin", daemon_.registering(registered_));
-  daemon_.start();
+  const auto running = daemon_.run();
   const ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kServing));
   daemon_.dropServices();
@@ -130,7 +130,7 @@ TEST_F(CheckInTest, WhenOnlyTheServiceConnectionEndsBothAreMadeAnew) {
 
 TEST_F(CheckInTest, ARunningPurgeIsCancelledWhenTheDaemonGoesAway) {
   daemon_.on("clientCheckin", daemon_.registering(registered_));
-  daemon_.start();
+  const auto running = daemon_.run();
   const ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kServing));
   service_->holding = true;
@@ -146,7 +146,7 @@ TEST_F(CheckInTest, ADeclaredIdIsRefusedAndNotTriedAgainUntilTheDaemonIsANewOne)
     ++calls;
     responder.reply({ipc::OptionalDictionary(), ipc::OptionalString()});
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   const ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kRefused));
   EXPECT_THAT(host.status().text, HasSubstr("\"org.example.cache\""));
@@ -154,7 +154,7 @@ TEST_F(CheckInTest, ADeclaredIdIsRefusedAndNotTriedAgainUntilTheDaemonIsANewOne)
   daemon_.stop();
   ASSERT_TRUE(reaches(HostState::kWaiting));
   EXPECT_EQ(calls, 1);
-  daemon_.start();
+  const auto running_again = daemon_.run();
   EXPECT_TRUE(eventually([&] { return calls == 2; }));
 }
 
@@ -166,7 +166,7 @@ TEST_F(CheckInTest, AnErrorInTheAnswerIsToldAndTriedAgain) {
     responder.reply(
         {ipc::OptionalDictionary(), ipc::OptionalString("no room for another service")});
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   const ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kServing));
   EXPECT_THAT(lastTextOf(HostState::kWaiting), HasSubstr("no room for another service"));
@@ -182,7 +182,7 @@ TEST_F(CheckInTest, ADaemonThatDoesNotAnswerIsReportedAndStillWaitedForWhilePing
     held.set(responder);
     arrived = true;
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   auto given = options();
   given.patience = milliseconds(20);
   const ServiceHost host = checkIn(given);
@@ -197,7 +197,7 @@ TEST_F(CheckInTest, ADaemonThatDoesNotAnswerIsReportedAndStillWaitedForWhilePing
 
 TEST_F(CheckInTest, ADaemonThatDropsTheCheckInWithoutAnAnswerIsToldAsAMissingRight) {
   daemon_.on("clientCheckin", [](const ipc::Arguments&, const ipc::Responder&) {});
-  daemon_.start();
+  const auto running = daemon_.run();
   const ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kWaiting));
   EXPECT_THAT(lastTextOf(HostState::kWaiting), HasSubstr("\"SERVICE_ENTITLEMENT\""));
@@ -211,7 +211,7 @@ TEST_F(CheckInTest, AStopDuringACheckInLetsTheDaemonFinishItsPing) {
         daemon_.connectTo(std::get<ipc::SharedDescriptor>(in.at(1)))));
     held.set(responder);
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   ServiceHost host = checkIn(options());
   ASSERT_TRUE(eventually([&] { return held.get().has_value(); }));
   host.stop();
@@ -225,7 +225,7 @@ TEST_F(CheckInTest, AStopDuringACheckInLetsTheDaemonFinishItsPing) {
 
 TEST_F(CheckInTest, AStopWhileTheDaemonStaysSilentEndsAfterAShortGrace) {
   daemon_.on("clientCheckin", [](const ipc::Arguments&, const ipc::Responder&) {});
-  daemon_.start();
+  const auto running = daemon_.run();
   ServiceHost host = checkIn(options());
   ASSERT_TRUE(reaches(HostState::kCheckingIn));
   host.stop();

@@ -41,7 +41,7 @@ TEST_F(ClientTest, APurgeRequestArrivesUnderTheDaemonsKeysAndItsOutcomeComesBack
     seen.set(std::get<Dictionary>(in.at(0)));
     responder.reply(outcome({{"SPACEKEEP_AMOUNT", 77}}));
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   PurgeRequest request;
   request.volume = "/data";
@@ -74,7 +74,7 @@ TEST_F(ClientTest, NoDictionaryIsARefusalAndAnEmptyOneIsNot) {
   daemon_.on("clientPurge", [&](const ipc::Arguments&, const ipc::Responder& responder) {
     responder.reply(calls++ == 0 ? noDictionary() : outcome({}));
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   EXPECT_TRUE(client.purge({}).refused());
   const Reply second = client.purge({});
@@ -83,7 +83,7 @@ TEST_F(ClientTest, NoDictionaryIsARefusalAndAnEmptyOneIsNot) {
 }
 
 TEST_F(ClientTest, AnOperationThatTheDaemonDoesNotOfferIsNotSupported) {
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   const Dictionary info{{"SPACEKEEP_VOLUME", "/"}};
   for (const Reply& reply : {client.purgeableSpace(info), client.itemizedPurgeableSpace(info),
@@ -105,7 +105,7 @@ TEST_F(ClientTest, EachOperationCallsItsOwnMember) {
       responder.reply(outcome({{"member", member}}));
     });
   }
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   const auto member = [](const Reply& reply) { return *stringAt(*reply.outcome, "member"); };
   EXPECT_EQ(member(client.call(Operation::kPurge, {})), "clientPurge");
@@ -120,7 +120,7 @@ TEST_F(ClientTest, ACancelRequestCarriesTheTokenAndIsAnswered) {
     seen.set(std::get<Dictionary>(in.at(0)));
     responder.reply({});
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   EXPECT_TRUE(client.cancel(Value("token")).ok());
   EXPECT_EQ(seen.get(), (Dictionary{{"SPACEKEEP_TOKEN", "token"}}));
@@ -142,7 +142,7 @@ TEST_F(ClientTest, ClientStateIsWrittenReadAndRemoved) {
     const auto found = state.find(std::get<std::string>(in.at(0)));
     responder.reply({found == state.end() ? ipc::OptionalValue() : found->second});
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   EXPECT_TRUE(client.setState("key", Value(Array{1, "two"})).ok());
   EXPECT_EQ(client.state("key").value, Value(Array{1, "two"}));
@@ -159,7 +159,7 @@ TEST_F(ClientTest, ADeadlineEndsTheWaitingAndTheConnectionGoesOn) {
   });
   daemon_.on("clientCancelPurge",
              [](const ipc::Arguments&, const ipc::Responder& responder) { responder.reply({}); });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   const Reply reply = client.purge({}, milliseconds(30));
   ASSERT_TRUE(reply.error);
@@ -176,7 +176,7 @@ TEST_F(ClientTest, AnAnswerBeforeTheDeadlineTakesTheTimerBack) {
   daemon_.on("clientPurge", [](const ipc::Arguments&, const ipc::Responder& responder) {
     responder.reply(outcome({}));
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   for (int i = 0; i < 200; ++i) {
     const Reply reply = client.purge({}, milliseconds(20'000));
@@ -188,7 +188,7 @@ TEST_F(ClientTest, AHandlerRunsOnceAndMayCallTheClientAgain) {
   daemon_.on("clientPurge", [](const ipc::Arguments&, const ipc::Responder& responder) {
     responder.reply(outcome({{"SPACEKEEP_AMOUNT", 5}}));
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   std::atomic<int> runs = 0;
   rt::Guarded<std::optional<Reply>> inner;
@@ -209,7 +209,7 @@ TEST_F(ClientTest, RequestsOfOneClientRunSideBySideAndFindTheirOwnAnswers) {
     const auto amount = unsignedAt(std::get<Dictionary>(in.at(0)), "SPACEKEEP_AMOUNT").value();
     held.update([&](auto& list) { list.emplace_back(amount, responder); });
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   rt::Guarded<std::map<std::uint64_t, std::uint64_t>> answers;
   for (std::uint64_t amount = 0; amount < 20; ++amount) {
@@ -238,7 +238,7 @@ TEST_F(ClientTest, WhenTheDaemonGoesAwayPendingCallsFailAndTheClientIsTold) {
   });
   daemon_.on("clientCancelPurge",
              [](const ipc::Arguments&, const ipc::Responder& responder) { responder.reply({}); });
-  daemon_.start();
+  const auto running = daemon_.run();
   std::atomic<int> disconnects = 0;
   Client client = connect([&] { ++disconnects; });
   ASSERT_TRUE(client.cancel(Value("t")).ok());  // the daemon has answered this connection
@@ -256,7 +256,7 @@ TEST_F(ClientTest, WhenTheDaemonGoesAwayPendingCallsFailAndTheClientIsTold) {
 
 TEST_F(ClientTest, ADaemonThatTurnsThePeerAwayIsToldFromOneThatIsGone) {
   daemon_.turnEverybodyAway();
-  daemon_.start();
+  const auto running = daemon_.run();
   Client client = connect();
   const Reply reply = client.purge({});
   ASSERT_TRUE(reply.error);
@@ -271,7 +271,7 @@ TEST_F(ClientTest, DestroyingAClientEndsItsPendingCallsAndDoesNotReportADisconne
     held.set(responder);
     arrived = true;
   });
-  daemon_.start();
+  const auto running = daemon_.run();
   std::atomic<int> disconnects = 0;
   std::optional<ErrorKind> kind;
   {
@@ -287,7 +287,7 @@ TEST_F(ClientTest, AClientCanBeMovedWhileACallIsPending) {
   rt::Guarded<std::optional<ipc::Responder>> held;
   daemon_.on("clientPurge",
              [&](const ipc::Arguments&, const ipc::Responder& responder) { held.set(responder); });
-  daemon_.start();
+  const auto running = daemon_.run();
   Client first = connect();
   std::atomic<bool> answered = false;
   first.purgeAsync({}, [&](const Reply& reply) { answered = reply.outcome.has_value(); });

@@ -94,6 +94,16 @@ class FakeDaemon {
     server_->serveListening(listening);
   }
 
+  /// start(), and stop() at the end of the scope: what the handlers refer to must be declared
+  /// before.
+  [[nodiscard]] auto run() {
+    start();
+    struct Stop {
+      void operator()(FakeDaemon* daemon) const { daemon->stop(); }
+    };
+    return std::unique_ptr<FakeDaemon, Stop>(this);
+  }
+
   /// As if the daemon's process had ended: every connection closes, nobody listens.
   void stop() {
     connections_.update([](auto& connections) {

@@ -156,7 +156,7 @@ TEST_P(Accounting, TheAmountIsTheChangeOfFreeSpaceAndWhatExceedsItIsExplained) {
 
 INSTANTIATE_TEST_SUITE_P(OnRealFileSystems, Accounting,
                          testing::Values("ext4", "xfs", "btrfs", "tmpfs"),
-                         [](const auto& info) { return std::string(info.param); });
+                         [](const testing::TestParamInfo<const char*>& kind) { return std::string(kind.param); });
 
 }  // namespace
 }  // namespace spacekeep::system_test

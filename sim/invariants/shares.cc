@@ -33,9 +33,13 @@ std::int64_t outstandingOffers(const PurgeStory& story, std::size_t operation,
   return offers;
 }
 
-// Only a service that has nothing left over from before tells its first share from its second.
+// Only a service that has nothing left over from before tells its first share from its second. A
+// share that is being computed as the urgency begins may be met, and offered again, at any time.
 bool isClean(const PurgeStory& story, std::size_t operation, const std::string& service,
              std::size_t at) {
+  for (const ShareTask* task : tasksOf(story, operation)) {
+    if (task->service == service && task->at < at && task->last_at > at) return false;
+  }
   return outstandingOffers(story, operation, service, at) == 0 &&
          story.inFlightBefore(operation, service, at) == 0;
 }

@@ -76,6 +76,8 @@ void SimulatedService::receive(IncomingCall incoming) {
   std::uint64_t call = 0;
   {
     const std::scoped_lock lock(mutex_);
+    // What was still under way when the connection ended reaches nobody, also not a new process.
+    if (incoming.connection->ended()) return;
     behaviour = behaviourFor(member);
     if (alive_ && behaviour.answer != Answer::kFailsBeforeCall) {
       const std::size_t record = recordArrival(incoming);

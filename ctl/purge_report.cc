@@ -85,6 +85,17 @@ void addUrgency(Out out, const UrgencyReport& urgency, std::size_t width) {
   }
 }
 
+/// A service that is asked several times at one urgency is listed with its last answer only.
+std::string earlierAnswers(const PurgeReport& report) {
+  std::uint64_t listed_bytes = 0;
+  for (const auto& urgency : report.urgencies) {
+    for (const auto& service : urgency.services) listed_bytes += service.reported_bytes;
+  }
+  if (listed_bytes >= report.reported_bytes) return "";
+  return fmt::format(", {} of it in answers before the last one of a service, which is listed above",
+                     printSize(report.reported_bytes - listed_bytes));
+}
+
 std::string verdict(const PurgeReport& report) {
   if (report.error) return "not done: " + harmless(*report.error);
   if (report.reached()) return "reached";
@@ -139,7 +150,8 @@ std::string tableOf(const PurgeReport& report) {
   fmt::format_to(out, "asked     {}\n", printSize(report.asked_bytes));
   fmt::format_to(out, "freed     {} ({} free before, {} after)\n", printSize(report.freed_bytes),
                  printSize(report.free_before_bytes), printSize(report.free_after_bytes));
-  fmt::format_to(out, "reported  {} by the services\n", printSize(report.reported_bytes));
+  fmt::format_to(out, "reported  {} by the services{}\n", printSize(report.reported_bytes),
+                 earlierAnswers(report));
   fmt::format_to(out, "took      {:.1f} s\n", report.elapsed_seconds);
   fmt::format_to(out, "result    {}\n", verdict(report));
   return text;

@@ -63,6 +63,17 @@ TEST(PurgeReport, TheTableShowsEveryUrgencyAndTheSums) {
             "result    not reached, 20.0 MiB missing\n");
 }
 
+TEST(PurgeReport, SaysWhatWasReportedBeforeTheLastAnswersThatTheTableLists) {
+  const Dictionary outcome{
+      {"SPACEKEEP_AMOUNT", 8 * kMiB},
+      {"SPACEKEEP_AMOUNT_REPORTED", 8 * kMiB},
+      {"SPACEKEEP_URGENCY_1_OPERATION_INFO",
+       Dictionary{{"SPACEKEEP_REPORTING_SERVICES", Dictionary{{"one", 5 * kMiB}}}}}};
+  EXPECT_NE(tableOf(purgeReport(outcome, 8 * kMiB)).find("reported  8.0 MiB by the services, 3.0 MiB of it "
+                                                         "in answers before the last one"),
+            std::string::npos);
+}
+
 TEST(PurgeReport, TheJsonHoldsTheSameInBytes) {
   EXPECT_EQ(jsonOf(purgeReport(outcomeWithASilentService(), 50 * kMiB)),
             R"({"asked_bytes":52428800,"cancelled":false,"elapsed_seconds":6.04,)"

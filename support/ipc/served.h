@@ -42,25 +42,27 @@ class ServingScope {
   void* previous_;
 };
 
-/// Answers one call, from any thread, at most once. Dropped without an answer, the caller gets none.
+/// Answers one call, from any thread, at most once. Dropped without an answer, the caller gets
+/// none.
 struct Responder {
   std::function<void(Arguments)> reply;
   std::function<void(const Error&)> fail;
 };
 
 enum class ServeMode {
-  kInOrder,  ///< one after another per connection, in order of arrival: for handlers that only enqueue
-  kLane,     ///< side by side on the global queue, at most `lane_width` of one lane at once, the rest
-             ///< waiting in order of arrival: for handlers that block
+  kInOrder,  ///< one after another per connection, in order of arrival: for handlers that only
+             ///< enqueue
+  kLane,  ///< side by side on the global queue, at most `lane_width` of one lane at once, the rest
+          ///< waiting in order of arrival: for handlers that block
 };
 
 struct ServedMethod {
   std::string_view name;
   ServeMode mode = ServeMode::kInOrder;
-  std::string_view lane;        ///< lanes are shared by name
+  std::string_view lane;  ///< lanes are shared by name
   std::size_t lane_width = 64;
-  /// Served by the thread that reads the messages: for handlers that are over in microseconds unless
-  /// they have to wait for a queue.
+  /// Served by the thread that reads the messages: for handlers that are over in microseconds
+  /// unless they have to wait for a queue.
   bool brief = false;
   std::function<void(Arguments, Responder)> serve;
 };

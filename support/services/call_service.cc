@@ -57,7 +57,8 @@ void ServiceCaller::CallService(std::shared_ptr<const ServiceReference> service,
                                 FailureHandler failure) {
   // Shared, because the one that signals may still be inside signal() when the wait has ended.
   const auto returned = std::make_shared<CountingSemaphore>(0U);
-  start(std::move(service), std::move(call), std::move(failure), [returned] { returned->signal(); });
+  start(std::move(service), std::move(call), std::move(failure),
+        [returned] { returned->signal(); });
   returned->wait();
 }
 
@@ -78,8 +79,8 @@ void ServiceCaller::start(std::shared_ptr<const ServiceReference> service, CallH
       global_.async([attempt] { attempt->fail(); });
       return;
     }
-    auto proxy = connection->remoteProxy([service, attempt](const ipc::Error& error) {
-      logTrace("%s calling %@ failed: %@", "CallService", service->ID, error.text);
+    auto proxy = connection->remoteProxy([id = service->ID, attempt](const ipc::Error& error) {
+      logTrace("%s calling %@ failed: %@", "CallService", id, error.text);
       attempt->fail();
     });
     call(std::move(proxy), [attempt] { attempt->done(); });

@@ -56,7 +56,8 @@ Authentication::Authentication(Role role, int fd, uid_t peer_uid)
 bool Authentication::begin() {
   if (role_ == Role::kServer) return true;
   // The empty token means "whoever the kernel says I am", which also holds across user namespaces.
-  constexpr std::string_view kOpening("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n", 48);
+  constexpr std::string_view kOpening("\0AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n",
+                                      48);
   static_assert(kOpening.back() == '\n');
   return send(kOpening);
 }

@@ -1,8 +1,9 @@
 // Thread safety: confined to the thread that made it.
 //
 // The handshake that opens a D-Bus connection ("Authentication Protocol" of the D-Bus
-// specification, mechanism EXTERNAL), read to the byte. sd-bus could do it, but it reads ahead while
-// it does, and so might hold the beginning of a message of any size before anybody has judged it.
+// specification, mechanism EXTERNAL), read to the byte. sd-bus could do it, but it reads ahead
+// while it does, and so might hold the beginning of a message of any size before anybody has judged
+// it.
 #pragma once
 
 #include <sys/types.h>

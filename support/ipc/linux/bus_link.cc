@@ -52,7 +52,8 @@ void BusLink::start(int fd, uid_t peer_uid) {
     return;
   }
   socket_ = std::make_shared<Descriptor>(fd_);
-  // The other side of a passed descriptor may have changed the mode, and the IPC thread never waits.
+  // The other side of a passed descriptor may have changed the mode, and the IPC thread never
+  // waits.
   ::fcntl(fd_, F_SETFL, ::fcntl(fd_, F_GETFL) | O_NONBLOCK);
   authentication_ = std::make_unique<Authentication>(role_, fd_, peer_uid);
   const std::uint64_t usec = std::max<std::uint64_t>(limits_.authentication_ns / 1000, 1);
@@ -249,8 +250,9 @@ std::optional<std::uint64_t> BusLink::send(sd_bus_message* message, std::size_t 
   queued_bytes_ += bytes;
   forgetWritten();
   if (queued_sizes_.size() > limits_.queued_messages || queued_bytes_ > limits_.queued_bytes) {
-    end(LinkEnd::kRefused, "it left " + std::to_string(queued_sizes_.size()) + " messages of about " +
-                               std::to_string(queued_bytes_) + " bytes unread");
+    end(LinkEnd::kRefused, "it left " + std::to_string(queued_sizes_.size()) +
+                               " messages of about " + std::to_string(queued_bytes_) +
+                               " bytes unread");
     return std::nullopt;
   }
   if (!processing_) updateEvents();

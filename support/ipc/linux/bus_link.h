@@ -98,9 +98,9 @@ class BusLink {
   std::uint32_t events_ = 0;
   bool processing_ = false;
   bool ended_ = false;
-  bool in_message_ = false;        // its header was judged, it has not arrived as a whole
-  std::size_t message_size_ = 0;   // of that message
-  std::size_t message_read_ = 0;   // of it, what sd-bus has read at least
+  bool in_message_ = false;       // its header was judged, it has not arrived as a whole
+  std::size_t message_size_ = 0;  // of that message
+  std::size_t message_read_ = 0;  // of it, what sd-bus has read at least
   std::deque<std::size_t> queued_sizes_;
   std::size_t queued_bytes_ = 0;
 };

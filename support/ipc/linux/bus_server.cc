@@ -73,8 +73,7 @@ void BusServer::State::serve(const SharedDescriptor& connected, std::function<vo
   open.fetch_add(1);
   ++open_by_uid[uid];
   auto connection = std::make_shared<ServedConnection>(
-      context, peer,
-      [self = weak_from_this(), id, uid, on_end = std::move(on_end)]() mutable {
+      context, peer, [self = weak_from_this(), id, uid, on_end = std::move(on_end)]() mutable {
         if (const auto alive = self.lock()) alive->ended(id, uid, std::move(on_end));
       });
   connections.emplace(id, connection);
@@ -141,10 +140,8 @@ void BusServer::serveListening(SharedDescriptor listening) {
 }
 
 void BusServer::serveConnected(SharedDescriptor connected, std::function<void()> on_end) {
-  state_->context->loop.post(
-      [state = state_, connected = std::move(connected), on_end = std::move(on_end)] {
-        state->serve(connected, on_end);
-      });
+  state_->context->loop.post([state = state_, connected = std::move(connected),
+                              on_end = std::move(on_end)] { state->serve(connected, on_end); });
 }
 
 std::size_t BusServer::connections() const { return state_->open; }

@@ -210,8 +210,7 @@ void ConnectionCore::answered(sd_bus_message* message, Call call) {
 void ConnectionCore::refuse(sd_bus_message* request) {
   if (sd_bus_message_get_expect_reply(request) <= 0) return;
   sd_bus_message* answer = nullptr;
-  const sd_bus_error error =
-      SD_BUS_ERROR_MAKE_CONST(kErrorUnknownObject, "Nothing is served on this end");
+  const sd_bus_error error{kErrorUnknownObject, "Nothing is served on this end", 0};
   if (sd_bus_message_new_method_error(request, &answer, &error) < 0) return;
   link_.send(answer, 256);
   sd_bus_message_unref(answer);

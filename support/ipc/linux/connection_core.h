@@ -1,5 +1,5 @@
-// Thread safety: what is marked "IPC thread" only there; the rest from any thread. The last reference
-// is given up on the IPC thread.
+// Thread safety: what is marked "IPC thread" only there; the rest from any thread. The last
+// reference is given up on the IPC thread.
 //
 // A connection as a caller: the calls that wait for their answers, and how the connection ends.
 #pragma once

@@ -17,9 +17,9 @@
 namespace spacekeep::ipc {
 
 struct ConnectionLimits {
-  std::size_t pending_calls = 256;                 ///< per connection; beyond it is ended
-  std::size_t message_bytes = 1024 * 1024;         ///< of an answer
-  std::size_t queued_bytes = 4 * 1024 * 1024;      ///< estimated, not yet taken by the peer
+  std::size_t pending_calls = 256;                   ///< per connection; beyond it is ended
+  std::size_t message_bytes = 1024 * 1024;           ///< of an answer
+  std::size_t queued_bytes = 4 * 1024 * 1024;        ///< estimated, not yet taken by the peer
   std::uint64_t authentication_ns = 30'000'000'000;  ///< services that are started on first use
                                                      ///< answer only once they run
   std::uint64_t peer_death_ns = 100'000'000;  ///< how long after the end of the stream the death of

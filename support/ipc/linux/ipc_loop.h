@@ -1,10 +1,11 @@
 // Thread safety: post(), isCurrent() and runAndWait() may be called from any thread; what is marked
 // "IPC thread" only from tasks and handlers that run on that thread.
 //
-// The IPC thread: a duty that one thread has at a time, under which every sd_bus object of the process
-// lives (sd-bus is not thread-safe). It moves messages, decodes and encodes, and never waits. Short
-// requests it serves itself, between two looks at the sockets; should one of them have to wait after
-// all, the thread gives its duty to a fresh one first. Without traffic it sleeps without any timer.
+// The IPC thread: a duty that one thread has at a time, under which every sd_bus object of the
+// process lives (sd-bus is not thread-safe). It moves messages, decodes and encodes, and never
+// waits. Short requests it serves itself, between two looks at the sockets; should one of them have
+// to wait after all, the thread gives its duty to a fresh one first. Without traffic it sleeps
+// without any timer.
 #pragma once
 
 #include <atomic>
@@ -12,7 +13,6 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
-#include <memory>
 #include <memory>
 #include <utility>
 #include <vector>
@@ -53,24 +53,25 @@ class IpcLoop {
   /// Starts the thread. Panics when the kernel refuses an epoll or event descriptor, since a
   /// process without its IPC can do nothing.
   IpcLoop();
-  /// Runs the tasks posted so far, then ends the thread. Servers must have gone before; a connection
-  /// that is still held never answers or fails again. The global queue of the connections must be
-  /// there longer. Never call it on the IPC thread.
+  /// Runs the tasks posted so far, then ends the thread. Servers must have gone before; a
+  /// connection that is still held never answers or fails again. The global queue of the
+  /// connections must be there longer. Never call it on the IPC thread.
   ~IpcLoop();
   IpcLoop(const IpcLoop&) = delete;
   IpcLoop& operator=(const IpcLoop&) = delete;
 
-  /// Runs `task` on the IPC thread; what one thread posts runs in its order. Tasks must be short. The queue has no
-  /// limit of its own: whoever posts is limited (unanswered calls per connection, pending calls).
+  /// Runs `task` on the IPC thread; what one thread posts runs in its order. Tasks must be short.
+  /// The queue has no limit of its own: whoever posts is limited (unanswered calls per connection,
+  /// pending calls).
   void post(Task task) { inbox_->post(std::move(task)); }
   [[nodiscard]] const std::shared_ptr<Inbox>& inbox() const { return inbox_; }
   /// As post, and returns once it has run. On the IPC thread it runs at once.
   void runAndWait(const Task& task);
   [[nodiscard]] bool isCurrent() const;
 
-  /// IPC thread. Runs `task` on this thread once the messages at hand have been read, in the order of
-  /// these calls. With a `lent_to`, the thread also runs what the task submits to that queue, for as
-  /// long as none of it has to wait; without one the task itself must not wait.
+  /// IPC thread. Runs `task` on this thread once the messages at hand have been read, in the order
+  /// of these calls. With a `lent_to`, the thread also runs what the task submits to that queue,
+  /// for as long as none of it has to wait; without one the task itself must not wait.
   void serveSoon(ConcurrentQueue* lent_to, Task task);
 
   /// IPC thread.

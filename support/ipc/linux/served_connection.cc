@@ -52,7 +52,8 @@ std::string documentOfParent(std::string_view path) {
   const std::string prefix = path == "/" ? "/" : std::string(path) + "/";
   if (!object.starts_with(prefix)) return "";
   const std::string_view rest = object.substr(prefix.size());
-  return "<node>\n  <node name=\"" + std::string(rest.substr(0, rest.find('/'))) + "\"/>\n</node>\n";
+  return "<node>\n  <node name=\"" + std::string(rest.substr(0, rest.find('/'))) +
+         "\"/>\n</node>\n";
 }
 
 }  // namespace
@@ -102,7 +103,8 @@ void ServedConnection::dispatchStandard(sd_bus_message* call, const std::string&
   sd_id128_t machine{};
   if (interface == kPeer && member == "Ping") {
     sendEmpty(call);
-  } else if (interface == kPeer && member == "GetMachineId" && sd_id128_get_machine(&machine) >= 0) {
+  } else if (interface == kPeer && member == "GetMachineId" &&
+             sd_id128_get_machine(&machine) >= 0) {
     char text[SD_ID128_STRING_MAX];
     sendText(call, sd_id128_to_string(machine, text));
   } else if (interface == kIntrospectable && member == "Introspect") {
@@ -146,9 +148,9 @@ void ServedConnection::serve(sd_bus_message* call, const MethodDescription& meth
   auto open = std::make_shared<OpenCall>(context_, weak_from_this(), method, serial,
                                          sd_bus_message_get_expect_reply(call) > 0);
   const auto& methods = context_->interface.methods;
-  const auto served = std::find_if(methods.begin(), methods.end(), [&method](const auto& candidate) {
-    return candidate.name == method.name;
-  });
+  const auto served =
+      std::find_if(methods.begin(), methods.end(),
+                   [&method](const auto& candidate) { return candidate.name == method.name; });
   run(*served, [context = context_, peer = peer_, served = &*served, open = std::move(open),
                 arguments = std::move(*arguments)]() mutable {
     const GatePass pass(context->gate);
@@ -160,9 +162,11 @@ void ServedConnection::serve(sd_bus_message* call, const MethodDescription& meth
 
 void ServedConnection::run(const ServedMethod& method, Task task) {
   // Brief or not, by the same way, so that the calls of one connection keep their order.
-  context_->loop.serveSoon(method.brief ? &context_->global : nullptr,
-                           [self = shared_from_this(), served = &method,
-                            task = std::move(task)]() mutable { self->schedule(*served, std::move(task)); });
+  context_->loop.serveSoon(
+      method.brief ? &context_->global : nullptr,
+      [self = shared_from_this(), served = &method, task = std::move(task)]() mutable {
+        self->schedule(*served, std::move(task));
+      });
 }
 
 void ServedConnection::schedule(const ServedMethod& method, Task task) {
@@ -224,7 +228,7 @@ void ServedConnection::refuse(sd_bus_message* call, const char* error_name,
 bool ServedConnection::sendError(sd_bus_message* call, const char* error_name,
                                  const std::string& text) {
   const std::string words = wireText(std::string_view(text).substr(0, kMaxErrorText));
-  const sd_bus_error error = SD_BUS_ERROR_MAKE_CONST(error_name, words.c_str());
+  const sd_bus_error error{error_name, words.c_str(), 0};
   sd_bus_message* made = nullptr;
   if (sd_bus_message_new_method_error(call, &made, &error) < 0) return false;
   const OwnedMessage message(made);

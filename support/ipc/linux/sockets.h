@@ -17,7 +17,8 @@ namespace spacekeep::ipc {
 [[nodiscard]] SharedDescriptor bindListeningSocket(const std::string& path, mode_t mode,
                                                    std::string& why);
 
-/// The listening socket that the service manager passed (sd_listen_fds(3)), null when there is none.
+/// The listening socket that the service manager passed (sd_listen_fds(3)), null when there is
+/// none.
 [[nodiscard]] SharedDescriptor listeningSocketFromServiceManager();
 
 /// A connected, non-blocking socket. Null on failure, with the reason in `why`. Never waits: a full
@@ -26,7 +27,8 @@ namespace spacekeep::ipc {
 
 struct EndpointRules {
   bool refuse_own_process = true;
-  std::string own_address;  ///< address (as in sun_path) on which this process listens, may be empty
+  std::string
+      own_address;  ///< address (as in sun_path) on which this process listens, may be empty
 };
 
 /// What is wrong with a descriptor on whose other end a service is to answer, empty when nothing:

@@ -270,7 +270,8 @@ std::optional<Dictionary> WireReader::readDictionary(const char* contents, int d
   return fromEntries(std::move(entries));
 }
 
-bool WireReader::readEntry(std::vector<Dictionary::Entry>& entries, const char* contents, int depth) {
+bool WireReader::readEntry(std::vector<Dictionary::Entry>& entries, const char* contents,
+                           int depth) {
   if (sd_bus_message_enter_container(message_, 'e', contents) <= 0) {
     malformed();
     return false;

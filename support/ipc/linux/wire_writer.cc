@@ -70,7 +70,8 @@ bool WireWriter::writeArgument(ArgumentKind kind, const Argument& argument) {
 bool WireWriter::writeDictionary(const Dictionary& dictionary, int depth) {
   if (depth > kMaxValueDepth || !open('a', "{sv}")) return false;
   for (const Dictionary::Entry& entry : dictionary) {
-    if (!open('e', "sv") || !writeText(entry.key) || !writeVariant(entry.value, depth) || !close()) {
+    if (!open('e', "sv") || !writeText(entry.key) || !writeVariant(entry.value, depth) ||
+        !close()) {
       return false;
     }
   }

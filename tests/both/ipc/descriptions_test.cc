@@ -35,10 +35,11 @@ TEST(InterfaceDescriptionMethod, IsFoundByItsExactName) {
 
 TEST(Matches, TakesExactlyTheDescribedKindsInOrder) {
   const std::vector<ArgumentDescription> described = {
-      {"a", kInt32},         {"b", kString},        {"c", kDictionary}, {"d", kOptionalDictionary},
+      {"a", kInt32},         {"b", kString},         {"c", kDictionary}, {"d", kOptionalDictionary},
       {"e", kOptionalValue}, {"f", kOptionalString}, {"g", kDescriptor}};
-  const Arguments good = {std::int32_t{1},      std::string("s"), Dictionary{},     OptionalDictionary(),
-                          OptionalValue(), OptionalString(), SharedDescriptor()};
+  const Arguments good = {std::int32_t{1},      std::string("s"), Dictionary{},
+                          OptionalDictionary(), OptionalValue(),  OptionalString(),
+                          SharedDescriptor()};
   EXPECT_TRUE(matches(described, good));
   EXPECT_TRUE(matches({}, {}));
   for (std::size_t i = 0; i < good.size(); ++i) {

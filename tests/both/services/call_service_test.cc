@@ -188,15 +188,16 @@ TEST(CallServiceAsync, KeepsTheOrderOfCallsToOneService) {
 
 TEST(CallServiceAsync, OneServiceDoesNotHoldUpAnother) {
   inEverySchedule(100, [] {
+    CountingSemaphore release(0);  // outlives the queue whose task waits for it
     World world;
-    CountingSemaphore release(0);
     world.caller.CallServiceAsync(
         world.service,
         [&release](const std::shared_ptr<RemoteProxy>&, const ServiceCaller::Done&) {
           release.wait();
         },
         nullptr);
-    world.ask(std::make_shared<const ServiceReference>(ServiceReference{"other", world.connection}));
+    world.ask(
+        std::make_shared<const ServiceReference>(ServiceReference{"other", world.connection}));
     world.called.wait();
     release.signal();
   });

@@ -43,8 +43,7 @@ SharedDescriptor connectedTo(const std::string& path) {
 TEST(ConnectionEnd, APeerThatClosesWhileItLivesIsAnInvalidation) {
   TestServer server;
   Ends ends;
-  const auto connection =
-      watched(server.loop, server.global, connectedTo(server.path()), ends);
+  const auto connection = watched(server.loop, server.global, connectedTo(server.path()), ends);
   PendingCall pending(connection, "hold", {});
   ASSERT_TRUE(eventually([&] { return server.held() == 1; }));
   server.stop();
@@ -68,7 +67,7 @@ class OtherProcess {
     while (fd < 0) fd = ::accept(listening->fd(), nullptr, nullptr);
     sd_bus_new(&bus);
     sd_bus_set_fd(bus, fd, fd);
-    sd_bus_set_server(bus, 1, SD_ID128_MAKE(1, 2, 3, 4, 5, 6, 7, 8, 9, a, b, c, d, e, f, 0));
+    sd_bus_set_server(bus, 1, sd_id128_t{{1}});
     sd_bus_start(bus);
     while (true) {
       if (sd_bus_process(bus, nullptr) < 0) ::_exit(1);

@@ -1,4 +1,5 @@
-// Services that a descriptor file declares: their sockets, whom to trust, and one shared connection.
+// Services that a descriptor file declares: their sockets, whom to trust, and one shared
+// connection.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>

@@ -40,8 +40,7 @@ TEST_F(PassedDescriptor, AServiceOnItCanBeCalled) {
   const SocketPair pair = makeSocketPair();
   server.server().serveConnected(pair.first);
   EXPECT_EQ(refusalOf(server, pair.second), "");
-  const auto connection =
-      connectionFromDescriptor(server.loop, server.global, server.descriptor());
+  const auto connection = connectionFromDescriptor(server.loop, server.global, server.descriptor());
   connection->setRemoteInterface(testInterface());
   connection->resume();
   EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
@@ -88,8 +87,8 @@ TEST(PassedDescriptorOfThisProcess, IsRefused) {
 }
 
 TEST_F(PassedDescriptor, NoneCanBeSentInPlaceOfOne) {
-  const Outcome outcome = callAndWait(server.connect(), "takeDescriptor",
-                                      {SharedDescriptor(), std::string("text")});
+  const Outcome outcome =
+      callAndWait(server.connect(), "takeDescriptor", {SharedDescriptor(), std::string("text")});
   EXPECT_TRUE(outcome.error);
   EXPECT_EQ(server.served(), 0U);
 }

@@ -182,8 +182,7 @@ TEST_F(ForeignClient, IsToldWhatDoesNotExist) {
   EXPECT_EQ(client.errorOf(client.newCall("echo", "org.example.Other")), kUnknownInterface);
   EXPECT_EQ(client.errorOf(client.newCall("echo", "com.quorvel.IpcTest", "/other")),
             kUnknownObject);
-  EXPECT_EQ(client.errorOf(client.newCall("Nothing", "org.freedesktop.DBus.Peer")),
-            kUnknownMethod);
+  EXPECT_EQ(client.errorOf(client.newCall("Nothing", "org.freedesktop.DBus.Peer")), kUnknownMethod);
 }
 
 TEST_F(ForeignClient, MayLeaveTheInterfaceOut) {

@@ -115,7 +115,8 @@ TEST(HostilePeer, ABrokenMessageBeforeALargeOneDoesNotHideIt) {
   // 16 bytes of header fields that make no sense: sd-bus drops such a message and reads on.
   peer.send(header(0, 16) + std::string(16, '\xEE') + header(100U << 20U, 64));
   EXPECT_TRUE(peer.isCutOff());
-  EXPECT_GE(log.count(kLogProblem, "broken message") + log.count(kLogProblem, "cannot be read"), 1U);
+  EXPECT_GE(log.count(kLogProblem, "broken message") + log.count(kLogProblem, "cannot be read"),
+            1U);
   expectHonestClientIsServed(server);
 }
 

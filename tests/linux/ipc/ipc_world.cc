@@ -13,10 +13,12 @@ namespace spacekeep::ipc::test {
 
 const InterfaceDescription& testInterface() {
   using enum ArgumentKind;
-  static const std::vector<ArgumentDescription> all = {
-      {"number", kInt32},        {"text", kString},         {"info", kDictionary},
-      {"maybe_info", kOptionalDictionary}, {"maybe_value", kOptionalValue},
-      {"maybe_text", kOptionalString}};
+  static const std::vector<ArgumentDescription> all = {{"number", kInt32},
+                                                       {"text", kString},
+                                                       {"info", kDictionary},
+                                                       {"maybe_info", kOptionalDictionary},
+                                                       {"maybe_value", kOptionalValue},
+                                                       {"maybe_text", kOptionalString}};
   static const InterfaceDescription interface = {
       "com.quorvel.IpcTest",
       {{"echo", all, all},
@@ -224,7 +226,7 @@ sd_bus_message* BareClient::newCall(const char* member, const char* interface, c
 }
 
 std::string BareClient::errorOf(sd_bus_message* call, std::string* text) {
-  sd_bus_error error = SD_BUS_ERROR_NULL;
+  sd_bus_error error{};
   sd_bus_message* reply = nullptr;
   const int result = sd_bus_call(bus_, call, kLongNs / 1000, &error, &reply);
   std::string name;

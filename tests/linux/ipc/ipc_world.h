@@ -1,8 +1,8 @@
 // Thread safety: each object belongs to the thread of its test unless a member says otherwise.
 //
-// What the tests of the IPC layer share: an interface with every kind of argument, a server of it on
-// a socket in a directory of its own, and three kinds of clients: the system's own connection, a bare
-// sd-bus one, and a raw socket.
+// What the tests of the IPC layer share: an interface with every kind of argument, a server of it
+// on a socket in a directory of its own, and three kinds of clients: the system's own connection, a
+// bare sd-bus one, and a raw socket.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -32,7 +32,8 @@ inline constexpr std::uint64_t kLongNs = 30'000'000'000;  // only ever waited fo
 
 /// echo: one argument of each kind but the descriptor, answered as they came. takeDescriptor: an
 /// endpoint and a text. number: in order, answers its argument. hold: keeps the responder.
-/// block: in a lane of width 2, waits until released. numberBriefly, blockBriefly: the same, brief. forget: drops the responder. whoAmI: the uid.
+/// block: in a lane of width 2, waits until released. numberBriefly, blockBriefly: the same, brief.
+/// forget: drops the responder. whoAmI: the uid.
 [[nodiscard]] const InterfaceDescription& testInterface();
 
 /// True once `condition` holds; gives up after kLongNs.
@@ -70,9 +71,9 @@ class TestServer {
 
   std::string path_;
   mutable rt::Mutex mutex_;
-  std::vector<Responder> held_;          // protected by mutex_
-  std::vector<std::int32_t> numbers_;    // protected by mutex_
-  SharedDescriptor descriptor_;          // protected by mutex_
+  std::vector<Responder> held_;        // protected by mutex_
+  std::vector<std::int32_t> numbers_;  // protected by mutex_
+  SharedDescriptor descriptor_;        // protected by mutex_
   std::atomic<std::size_t> served_{0};
   std::atomic<std::size_t> blocked_{0};
   std::atomic<std::size_t> most_blocked_{0};

@@ -27,8 +27,7 @@ class OneRight : public Access {
 };
 
 ServedInterface pingInterface() {
-  static const InterfaceDescription description = {"com.quorvel.IpcTest",
-                                                   {{"number", {}, {}}}};
+  static const InterfaceDescription description = {"com.quorvel.IpcTest", {{"number", {}, {}}}};
   ServedInterface served;
   served.description = &description;
   ServedMethod method;

@@ -12,8 +12,8 @@ namespace {
 Arguments arguments(Dictionary info, OptionalDictionary maybe_info = std::nullopt,
                     OptionalValue maybe_value = std::nullopt,
                     OptionalString maybe_text = std::nullopt) {
-  return {std::int32_t{-5}, std::string("text \xC3\xA4"), std::move(info), std::move(maybe_info),
-          std::move(maybe_value), std::move(maybe_text)};
+  return {std::int32_t{-5},      std::string("text \xC3\xA4"), std::move(info),
+          std::move(maybe_info), std::move(maybe_value),       std::move(maybe_text)};
 }
 
 class RoundTrip : public ::testing::Test {
@@ -101,9 +101,9 @@ TEST_F(RoundTrip, NestingBeyondTheLimitFailsTheCallAndNothingElse) {
 
 TEST_F(RoundTrip, TextThatIsNoUtf8IsRepairedAndNotRefused) {
   const Arguments received = echo(arguments({{"key\xFF", "a\xC3(\xED\xA0\x80"}}));
-  EXPECT_EQ(std::get<Dictionary>(received.at(2)),
-            (Dictionary{{"key\xEF\xBF\xBD",
-                         "a\xEF\xBF\xBD(\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"}}));
+  EXPECT_EQ(
+      std::get<Dictionary>(received.at(2)),
+      (Dictionary{{"key\xEF\xBF\xBD", "a\xEF\xBF\xBD(\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD"}}));
 }
 
 TEST_F(RoundTrip, AMessageNearTheSizeLimitPasses) {

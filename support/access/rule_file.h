@@ -2,11 +2,18 @@
 //
 // A rule file is a property list holding one dictionary:
 //
-//   "MATCH_USER"     user names (strings) or numbers, one or an array: the peer's user is one of
-//   them "MATCH_GROUP"    the same for groups, primary or supplementary "MATCH_UNIT"     system
-//   services ("cache.service"), one or an array "MATCH_LABEL"    security labels, one or an array
+//   "MATCH_USER"     user names (strings) or numbers, one or an array
+//
+//   "MATCH_GROUP"    the same for groups, primary or supplementary
+//
+//   "MATCH_UNIT"     system services ("cache.service"), one or an array
+//
+//   "MATCH_LABEL"    security labels, one or an array
+//
 //   "MATCH_ANYBODY"  true: the rule is about every peer; goes with no other match key
+//
 //   "GRANT"          array of entitlements
+//
 //   "DENY"           array of entitlements; wins over every grant, of this and of other files
 //
 // All match keys that are present must hold. A rule with none of them matches nobody. A file with

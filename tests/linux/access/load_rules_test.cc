@@ -184,7 +184,8 @@ TEST(ShippedRules, GrantWhatTheyPromise) {
   using List = std::vector<std::string_view>;
   EXPECT_EQ(held(0, 0), List(kAllEntitlements.begin(), kAllEntitlements.end()));
   EXPECT_EQ(held(1000, 400), (List{"CLIENT_ENTITLEMENT", "PURGEABLE_ENTITLEMENT"}));
-  EXPECT_EQ(held(1000, 401), (List{"CLIENT_ENTITLEMENT", "SERVICE_ENTITLEMENT"}));
+  EXPECT_EQ(held(1000, 401),
+            (List{"CLIENT_ENTITLEMENT", "PURGEABLE_ENTITLEMENT", "SERVICE_ENTITLEMENT"}));
   EXPECT_EQ(held(1000, 1000), List{});
 }
 

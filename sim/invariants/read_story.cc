@@ -297,6 +297,9 @@ class Reader {
 
 }  // namespace
 
-PurgeStory::PurgeStory(const PurgeRun& run_given) : run(run_given) { Reader(*this).read(); }
+// A run that was broken off has no story, only a great many events.
+PurgeStory::PurgeStory(const PurgeRun& run_given) : run(run_given) {
+  if (run.report.end == rt::ScheduleEnd::kFinished) Reader(*this).read();
+}
 
 }  // namespace spacekeep::sim

@@ -12,6 +12,22 @@ namespace {
 constexpr std::uint64_t kSecond = 1'000'000'000;
 // Longer than any delay that a scenario draws: afterwards only what never comes is outstanding.
 constexpr std::uint64_t kAftermathNs = 300 * kSecond;
+// A run takes about 3000. What takes that many goes round in circles.
+constexpr std::uint64_t kMaxSteps = 500'000;
+
+/// Joined also when the schedule is broken off.
+struct Clients {
+  Clients() = default;
+  ~Clients() {
+    for (rt::Thread& client : threads) {
+      if (client.joinable()) client.join();
+    }
+  }
+  Clients(const Clients&) = delete;
+  Clients& operator=(const Clients&) = delete;
+
+  std::vector<rt::Thread> threads;
+};
 
 /// The cast of one run. Lives inside the schedule.
 class Stage {
@@ -37,11 +53,11 @@ class Stage {
   void play() {
     for (std::size_t i = 0; i < services_.size(); ++i) startService(i);
     for (const PlannedWrite& write : run_.scenario.writes) startWrite(write);
-    std::vector<rt::Thread> clients;
+    Clients clients;
     for (std::size_t i = 0; i < run_.scenario.purges.size(); ++i) {
-      clients.emplace_back("client", [this, i] { playClient(i); });
+      clients.threads.emplace_back("client", [this, i] { playClient(i); });
     }
-    for (rt::Thread& client : clients) client.join();
+    for (rt::Thread& client : clients.threads) client.join();
     rt::sleepNs(kAftermathNs);
     lookAtTheEnd();
   }
@@ -150,6 +166,7 @@ rt::ScheduleOptions scheduleFor(std::uint64_t seed) {
   rt::ScheduleOptions options;
   options.seed = seed;
   options.strategy = seed % 2 == 0 ? rt::Strategy::kRandom : rt::Strategy::kPct;
+  options.max_steps = kMaxSteps;
   options.pct_depth = 2 + static_cast<unsigned>(seed / 2 % 4);
   return options;
 }

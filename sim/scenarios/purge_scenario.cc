@@ -1,5 +1,6 @@
 #include "sim/scenarios/purge_scenario.h"
 
+#include <algorithm>
 #include <set>
 #include <utility>
 
@@ -160,11 +161,16 @@ PlannedPurge drawPurge(Random& random, std::size_t index, std::size_t services,
   return purge;
 }
 
-PlannedWrite drawWrite(Random& random) {
+// Much space taken while few bytes are needed means thousands of small requests, one after another.
+std::uint64_t largestWrite(const std::set<std::uint64_t>& amounts) {
+  return std::clamp<std::uint64_t>(*amounts.begin() * 20, 1, 15'000);
+}
+
+PlannedWrite drawWrite(Random& random, std::uint64_t largest_bytes) {
   PlannedWrite write;
   write.after_ns = drawDelay(random);
   write.volume = random.percent(80) ? kRoot : kOther;
-  write.bytes = random.between(1, 15'000);
+  write.bytes = random.between(1, largest_bytes);
   write.frees = random.percent(35);
   return write;
 }
@@ -225,7 +231,7 @@ PurgeScenario derivePurgeScenario(std::uint64_t seed) {
   }
   const std::size_t writes = random.percent(50) ? 0 : random.between(1, 4);
   for (std::size_t index = 0; index < writes; ++index) {
-    scenario.writes.push_back(drawWrite(random));
+    scenario.writes.push_back(drawWrite(random, largestWrite(amounts)));
   }
   return scenario;
 }

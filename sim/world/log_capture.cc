@@ -4,8 +4,6 @@
 #include <span>
 #include <utility>
 
-#include "support/runtime/runtime.h"
-
 namespace spacekeep::sim {
 namespace {
 
@@ -39,8 +37,9 @@ void captureLine(const LogHandle*, std::int32_t level, const char*, const char* 
 
 }  // namespace
 
-LogCapture::LogCapture(Trace& trace) : previous_handle_(getLogHandle()) {
-  if (g_trace.exchange(&trace) != nullptr) rt::panic("two log captures in one process");
+LogCapture::LogCapture(Trace& trace) : trace_(trace), previous_handle_(getLogHandle()) {
+  // One that is still there was given up together with its schedule, and never comes back.
+  g_trace.store(&trace);
   handle_.level = kLogTrace;
   previous_write_ = gMOLogWrite.exchange(&captureLine);
   setLogHandle(&handle_);
@@ -49,7 +48,8 @@ LogCapture::LogCapture(Trace& trace) : previous_handle_(getLogHandle()) {
 LogCapture::~LogCapture() {
   setLogHandle(previous_handle_);
   gMOLogWrite.store(previous_write_);
-  g_trace.store(nullptr);
+  Trace* mine = &trace_;
+  g_trace.compare_exchange_strong(mine, nullptr);
 }
 
 }  // namespace spacekeep::sim

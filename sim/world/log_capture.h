@@ -19,6 +19,7 @@ class LogCapture {
   [[nodiscard]] LogHandle& handle() { return handle_; }
 
  private:
+  Trace& trace_;
   LogHandle handle_;
   LogHandle* previous_handle_;
   LogWrite previous_write_;

@@ -1,5 +1,5 @@
 // A client of few words for tests that need one under another user: prints one line that says how
-// the daemon answered. Usage: test-peer purge VOLUME BYTES | check-in ID PATIENCE_MS
+// the daemon answered. Usage: test-peer purge VOLUME BYTES [wait-all] | check-in ID PATIENCE_MS
 #include <spacekeep/client.h>
 #include <spacekeep/service.h>
 
@@ -15,13 +15,13 @@ using spacekeep::sdk::Client;
 using spacekeep::sdk::HostState;
 using spacekeep::sdk::ServiceHost;
 
-int purge(const char* volume, const char* bytes) {
+int purge(const char* volume, const char* bytes, bool finish_early) {
   auto client = Client::connect();
   if (!client) return std::printf("no connection\n"), 1;
   spacekeep::sdk::PurgeRequest request;
   request.volume = volume;
   request.amount = std::strtoull(bytes, nullptr, 10);
-  request.finish_early = true;
+  request.finish_early = finish_early;
   const auto reply = client->purge(request);
   if (reply.error) return std::printf("error: %s\n", reply.error->text.c_str()), 1;
   std::printf(reply.refused() ? "no dictionary\n" : "outcome\n");
@@ -45,7 +45,7 @@ int checkIn(const char* id, const char* patience_ms) {
 
 int main(int count, char** arguments) {
   const std::string command = count > 3 ? arguments[1] : "";
-  if (command == "purge") return purge(arguments[2], arguments[3]);
+  if (command == "purge") return purge(arguments[2], arguments[3], count == 4);
   if (command == "check-in") return checkIn(arguments[2], arguments[3]);
   return 2;
 }

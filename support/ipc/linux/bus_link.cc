@@ -144,11 +144,13 @@ void BusLink::process() {
 /// Lets sd-bus read at most one message, and only one whose size is known to be within the limit.
 /// Answers whether there may be more to do.
 bool BusLink::processOnce() {
+  bool size_is_known = false;
   if (!in_message_) {
     switch (lookAhead()) {
       case Ahead::kRefused:
         return false;
       case Ahead::kMessage:
+        size_is_known = true;
         in_message_ = true;
         message_read_ = 0;
         break;
@@ -173,7 +175,10 @@ bool BusLink::processOnce() {
   } else if (in_message_ && messageWasDropped(available)) {
     end(LinkEnd::kRefused, "it sent a broken message");
   }
-  return !ended_ && progress > 0;
+  if (ended_ || progress <= 0) return false;
+  // When this message was all there was, the next one wakes the loop by itself, and looking for it
+  // now would be a system call for nothing.
+  return !size_is_known || available != message_size_ || !queued_sizes_.empty();
 }
 
 BusLink::Ahead BusLink::lookAhead() {

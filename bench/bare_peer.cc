@@ -42,9 +42,11 @@ int main(int count, char** arguments) {
   if (count != 2) return 2;
   const char* path = arguments[1];
   unlink(path);
-  const int fd = bench::check(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0), "socket");
+  const int fd =
+      bench::check(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0), "socket");
   const sockaddr_un address = bench::addressOf(path);
-  if (bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) < 0 || listen(fd, 64) < 0) {
+  if (bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) < 0 ||
+      listen(fd, 64) < 0) {
     bench::check(-errno, path);
   }
   sd_event* event = nullptr;

@@ -16,7 +16,8 @@ namespace {
 constexpr int kFilesPerDirectory = 500;
 constexpr time_t kDayS = 86'400;
 
-bool writeFile(int directory, const std::string& name, const std::vector<char>& content, int number) {
+bool writeFile(int directory, const std::string& name, const std::vector<char>& content,
+               int number) {
   const int fd = openat(directory, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0644);
   if (fd < 0) return false;
   const bool written =

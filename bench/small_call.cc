@@ -21,10 +21,10 @@ double nowUs() {
 
 void callOnce(sd_bus* bus) {
   sd_bus_message* raw = nullptr;
-  bench::check(sd_bus_message_new_method_call(bus, &raw, nullptr, "/com/quorvel/Spacekeep",
-                                              "com.quorvel.SpacekeepClientProtocol",
-                                              "clientCancelPurge"),
-               "new call");
+  bench::check(
+      sd_bus_message_new_method_call(bus, &raw, nullptr, "/com/quorvel/Spacekeep",
+                                     "com.quorvel.SpacekeepClientProtocol", "clientCancelPurge"),
+      "new call");
   const bench::Message call(raw);
   bench::check(sd_bus_message_append(raw, "a{sv}", 1, "SPACEKEEP_TOKEN", "s", "none"), "append");
   sd_bus_message* reply = nullptr;
@@ -62,9 +62,11 @@ int main(int count, char** arguments) {
     runRound(peer.get(), peer_us);
     runRound(floor.get(), floor_us);
   }
-  fmt::print("{} calls each; daemon p50 {:.1f} us p99 {:.1f} us; bare sd-bus p50 {:.1f} us p99 {:.1f} us\n",
-             peer_us.size(), percentile(peer_us, 0.5), percentile(peer_us, 0.99),
-             percentile(floor_us, 0.5), percentile(floor_us, 0.99));
+  fmt::print(
+      "{} calls each; daemon p50 {:.1f} us p99 {:.1f} us; bare sd-bus p50 {:.1f} us p99 {:.1f} "
+      "us\n",
+      peer_us.size(), percentile(peer_us, 0.5), percentile(peer_us, 0.99),
+      percentile(floor_us, 0.5), percentile(floor_us, 0.99));
   fmt::print("figure small_call_p50_ratio {:.3f} 1.2\n",
              percentile(peer_us, 0.5) / percentile(floor_us, 0.5));
   fmt::print("figure small_call_p99_ratio {:.3f} -\n",

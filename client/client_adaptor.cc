@@ -68,7 +68,8 @@ struct Route {
 constexpr Route kRoutes[] = {
     {"clientCheckin", ServeMode::kInOrder, "", 1, false, checkin},
     {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, notSupportedYet},
-    {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, notSupportedYet},
+    {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false,
+     notSupportedYet},
     {"clientPurge", ServeMode::kLane, "purge", kPurgeLaneWidth, false, purge},
     {"clientCancelPurge", ServeMode::kLane, "cancel", kCancelLaneWidth, true, cancelPurge},
     {"clientSetState", ServeMode::kInOrder, "", 1, true, notSupportedYet},

@@ -92,8 +92,9 @@ std::string earlierAnswers(const PurgeReport& report) {
     for (const auto& service : urgency.services) listed_bytes += service.reported_bytes;
   }
   if (listed_bytes >= report.reported_bytes) return "";
-  return fmt::format(", {} of it in answers before the last one of a service, which is listed above",
-                     printSize(report.reported_bytes - listed_bytes));
+  return fmt::format(
+      ", {} of it in answers before the last one of a service, which is listed above",
+      printSize(report.reported_bytes - listed_bytes));
 }
 
 std::string verdict(const PurgeReport& report) {

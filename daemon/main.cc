@@ -19,9 +19,9 @@ namespace {
 /// they are busy for minutes while all is well.
 std::unique_ptr<QueueProbe> probeOfShortQueues() {
   const auto daemon = Spacekeep::sharedSpacekeep();
-  return std::make_unique<QueueProbe>(std::vector<std::shared_ptr<SerialQueue>>{
-      daemon->collection_queue(), daemon->daemons_queue(), daemon->defaults_queue(),
-      daemon->notify_queue()});
+  return std::make_unique<QueueProbe>(
+      std::vector<std::shared_ptr<SerialQueue>>{daemon->collection_queue(), daemon->daemons_queue(),
+                                                daemon->defaults_queue(), daemon->notify_queue()});
 }
 
 int run() {

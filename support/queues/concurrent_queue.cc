@@ -58,7 +58,8 @@ ConcurrentQueue::~ConcurrentQueue() {
 }
 
 void ConcurrentQueue::async(Task task) {
-  if (BorrowedThread* self = BorrowedThread::current(); self != nullptr && self->take(*this, task)) {
+  if (BorrowedThread* self = BorrowedThread::current();
+      self != nullptr && self->take(*this, task)) {
     return;
   }
   const Lock lock(mutex_);

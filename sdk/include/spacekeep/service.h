@@ -44,8 +44,8 @@ struct Job {
   std::string volume;  ///< the mount point that the request concerns; empty when it names none
   std::uint64_t amount = 0;  ///< purge: the bytes asked for. Giving more than this costs cached
                              ///< data for nothing.
-  int urgency = 0;  ///< 1, give what nobody will miss, to 4, give all that can be given
-  Dictionary info;  ///< the whole request
+  int urgency = 0;           ///< 1, give what nobody will miss, to 4, give all that can be given
+  Dictionary info;           ///< the whole request
   Cancellation cancellation;
 };
 

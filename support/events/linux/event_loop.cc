@@ -158,7 +158,8 @@ void BootTimer::cancel() {
 std::uint64_t bootClockNs() {
   timespec now{};
   // The seam's counter stands still during suspend, this one must not.
-  if (::clock_gettime(CLOCK_BOOTTIME, &now) < 0) rt::panic("no boot clock");  // tidy-allow: see above
+  const int result = ::clock_gettime(CLOCK_BOOTTIME, &now);  // tidy-allow: see above
+  if (result < 0) rt::panic("no boot clock");
   return static_cast<std::uint64_t>(now.tv_sec) * kNsPerSecond +
          static_cast<std::uint64_t>(now.tv_nsec);
 }

@@ -69,8 +69,9 @@ TEST(PurgeReport, SaysWhatWasReportedBeforeTheLastAnswersThatTheTableLists) {
       {"SPACEKEEP_AMOUNT_REPORTED", 8 * kMiB},
       {"SPACEKEEP_URGENCY_1_OPERATION_INFO",
        Dictionary{{"SPACEKEEP_REPORTING_SERVICES", Dictionary{{"one", 5 * kMiB}}}}}};
-  EXPECT_NE(tableOf(purgeReport(outcome, 8 * kMiB)).find("reported  8.0 MiB by the services, 3.0 MiB of it "
-                                                         "in answers before the last one"),
+  EXPECT_NE(tableOf(purgeReport(outcome, 8 * kMiB))
+                .find("reported  8.0 MiB by the services, 3.0 MiB of it "
+                      "in answers before the last one"),
             std::string::npos);
 }
 

@@ -24,7 +24,6 @@ constexpr std::uint64_t kFileBytes = 128 * 1024;
 constexpr std::uint64_t kAskedBytes = 20ULL * 1024 * 1024 + 12345;
 constexpr int kFilesEach = 300;
 
-
 std::uint64_t freeBytes(const std::string& path) {
   struct statvfs space = {};
   if (statvfs(path.c_str(), &space) != 0) return 0;
@@ -86,7 +85,8 @@ class Accounting : public testing::TestWithParam<const char*> {
     const std::string disk = sandbox_.volume("disk");
     for (const std::string id : {"one", "two"}) {
       std::filesystem::create_directory(disk + "/" + id);
-      for (int i = 0; i < kFilesEach; ++i) writeOld(disk + "/" + id + "/" + std::to_string(i), 40 + i);
+      for (int i = 0; i < kFilesEach; ++i)
+        writeOld(disk + "/" + id + "/" + std::to_string(i), 40 + i);
     }
     // The oldest of all, so they would be the first to go.
     for (const std::string name : {"linked", "linked-too", "held", "locked"}) {
@@ -102,9 +102,9 @@ class Accounting : public testing::TestWithParam<const char*> {
     daemon_ = sandbox_.startDaemon();
     for (const std::string id : {"one", "two"}) {
       sandbox_.write("/tmp/" + id + ".plist", rules(id));
-      services_.push_back(sandbox_.spawn(
-          {"/programs/services/spacekeep-cachedir", "--rules", "/tmp/" + id + ".plist", "--check-in"},
-          id + ".log"));
+      services_.push_back(sandbox_.spawn({"/programs/services/spacekeep-cachedir", "--rules",
+                                          "/tmp/" + id + ".plist", "--check-in"},
+                                         id + ".log"));
       ASSERT_TRUE(sandbox_.waitForText("/tmp/" + id + ".log", "serving"));
     }
   }
@@ -125,8 +125,12 @@ TEST_P(Accounting, TheAmountIsTheChangeOfFreeSpaceAndWhatExceedsItIsExplained) {
   ASSERT_TRUE(client) << client.error().text;
   const std::string disk = sandbox_.volume("disk");
   const std::uint64_t before = freeBytes(disk);
-  const sdk::Reply reply = client->purge({.volume = "/volumes/disk", .amount = kAskedBytes, .urgency = 2,
-                                          .timeout_seconds = 20, .token = {}, .finish_early = true});
+  const sdk::Reply reply = client->purge({.volume = "/volumes/disk",
+                                          .amount = kAskedBytes,
+                                          .urgency = 2,
+                                          .timeout_seconds = 20,
+                                          .token = {},
+                                          .finish_early = true});
   const std::uint64_t after = freeBytes(disk);
   ASSERT_TRUE(reply.outcome);
   const Dictionary& outcome = *reply.outcome;
@@ -142,13 +146,14 @@ TEST_P(Accounting, TheAmountIsTheChangeOfFreeSpaceAndWhatExceedsItIsExplained) {
   const std::uint64_t reported = unsignedAt(outcome, "SPACEKEEP_AMOUNT_REPORTED").value_or(0);
   EXPECT_EQ(reported, answers.replies_total);
   EXPECT_LE(answers.most_beyond_share, kFileBytes) << "a request took more than one file too many";
-  std::printf("%-6s asked %llu freed %llu; beyond the asked amount %lld = shares handed out beyond it "
-              "%lld + files cut off late %lld + the file system's own %lld\n",
-              GetParam(), static_cast<unsigned long long>(kAskedBytes),
-              static_cast<unsigned long long>(freed), static_cast<long long>(freed - kAskedBytes),
-              static_cast<long long>(answers.shares_total - kAskedBytes),
-              static_cast<long long>(answers.replies_total - answers.shares_total),
-              static_cast<long long>(freed - answers.replies_total));
+  std::printf(
+      "%-6s asked %llu freed %llu; beyond the asked amount %lld = shares handed out beyond it "
+      "%lld + files cut off late %lld + the file system's own %lld\n",
+      GetParam(), static_cast<unsigned long long>(kAskedBytes),
+      static_cast<unsigned long long>(freed), static_cast<long long>(freed - kAskedBytes),
+      static_cast<long long>(answers.shares_total - kAskedBytes),
+      static_cast<long long>(answers.replies_total - answers.shares_total),
+      static_cast<long long>(freed - answers.replies_total));
   for (const std::string name : {"linked", "linked-too", "held", "locked"}) {
     EXPECT_TRUE(std::filesystem::exists(disk + "/one/" + name)) << name;
   }
@@ -156,7 +161,9 @@ TEST_P(Accounting, TheAmountIsTheChangeOfFreeSpaceAndWhatExceedsItIsExplained) {
 
 INSTANTIATE_TEST_SUITE_P(OnRealFileSystems, Accounting,
                          testing::Values("ext4", "xfs", "btrfs", "tmpfs"),
-                         [](const testing::TestParamInfo<const char*>& kind) { return std::string(kind.param); });
+                         [](const testing::TestParamInfo<const char*>& kind) {
+                           return std::string(kind.param);
+                         });
 
 }  // namespace
 }  // namespace spacekeep::system_test

@@ -43,7 +43,8 @@ class BadDescriptor : public testing::Test {
           answered->signal();
         })
         ->call("clientCheckin",
-               {std::string("bad"), std::make_shared<ipc::Descriptor>(fd), Dictionary{{"PURGE", true}}},
+               {std::string("bad"), std::make_shared<ipc::Descriptor>(fd),
+                Dictionary{{"PURGE", true}}},
                [answered](const ipc::Arguments&) { answered->signal(); });
     EXPECT_EQ(answered->waitForNs(20'000'000'000), WaitResult::kSignalled);
     connection->invalidate();
@@ -54,8 +55,12 @@ class BadDescriptor : public testing::Test {
     EXPECT_EQ(checkInWith(fd), "org.freedesktop.DBus.Error.InvalidArgs");
     auto client = sdk::Client::connect({.socket_path = sandbox_.socketPath(), .on_disconnect = {}});
     ASSERT_TRUE(client);
-    const sdk::Reply reply = client->purge({.volume = "/volumes/tmp", .amount = 0, .urgency = 1,
-                                            .timeout_seconds = {}, .token = {}, .finish_early = true});
+    const sdk::Reply reply = client->purge({.volume = "/volumes/tmp",
+                                            .amount = 0,
+                                            .urgency = 1,
+                                            .timeout_seconds = {},
+                                            .token = {},
+                                            .finish_early = true});
     EXPECT_TRUE(reply.outcome);
     EXPECT_TRUE(daemon_.running());
   }

@@ -33,7 +33,9 @@ class OneFileEach : public sdk::Service {
   }
 
  private:
-  [[nodiscard]] std::string pathOf(int number) const { return directory_ + "/" + std::to_string(number); }
+  [[nodiscard]] std::string pathOf(int number) const {
+    return directory_ + "/" + std::to_string(number);
+  }
   std::string directory_;
   std::atomic<int> next_{0};
 };
@@ -63,8 +65,8 @@ TEST(Flood, TwoThousandPurgesFromTwoHundredConnectionsAreAllAnsweredInBoundedSpa
 
   sdk::CheckInOptions options;
   options.socket_path = sandbox.socketPath();
-  auto host = sdk::ServiceHost::checkIn("one-file-each",
-                                        std::make_shared<OneFileEach>(sandbox.volume("tmp")), options);
+  auto host = sdk::ServiceHost::checkIn(
+      "one-file-each", std::make_shared<OneFileEach>(sandbox.volume("tmp")), options);
   ASSERT_TRUE(host);
   ASSERT_TRUE(sandbox.waitForText("/tmp/daemon.log", "ping got pong"));
 
@@ -81,11 +83,19 @@ TEST(Flood, TwoThousandPurgesFromTwoHundredConnectionsAreAllAnsweredInBoundedSpa
     if (reply.outcome && unsignedAt(*reply.outcome, "SPACEKEEP_AMOUNT") >= 4096U) ++reached;
     ++answered;
   };
-  sdk::PurgeRequest slow{.volume = "/volumes/tmp", .amount = 0, .urgency = 1, .timeout_seconds = 2,
-                         .token = {}, .finish_early = false};
+  sdk::PurgeRequest slow{.volume = "/volumes/tmp",
+                         .amount = 0,
+                         .urgency = 1,
+                         .timeout_seconds = 2,
+                         .token = {},
+                         .finish_early = false};
   clients[0].purgeAsync(slow, [&](const sdk::Reply&) { ++answered; });
-  sdk::PurgeRequest one{.volume = "/volumes/tmp", .amount = 4096, .urgency = 1, .timeout_seconds = 5,
-                        .token = {}, .finish_early = true};
+  sdk::PurgeRequest one{.volume = "/volumes/tmp",
+                        .amount = 4096,
+                        .urgency = 1,
+                        .timeout_seconds = 5,
+                        .token = {},
+                        .finish_early = true};
   for (int i = 0; i < kPurgesEach; ++i) {
     for (sdk::Client& client : clients) client.purgeAsync(one, book);
   }

@@ -66,8 +66,12 @@ class Hostile : public testing::Test {
 
   void expectHonestPurgeSucceeds() {
     hoard_->grow();
-    const sdk::Reply reply = honest_->purge({.volume = "/volumes/tmp", .amount = kFileBytes, .urgency = 1,
-                                             .timeout_seconds = 10, .token = {}, .finish_early = true});
+    const sdk::Reply reply = honest_->purge({.volume = "/volumes/tmp",
+                                             .amount = kFileBytes,
+                                             .urgency = 1,
+                                             .timeout_seconds = 10,
+                                             .token = {},
+                                             .finish_early = true});
     ASSERT_TRUE(reply.outcome) << (reply.error ? reply.error->text : "refused");
     EXPECT_GE(unsignedAt(*reply.outcome, "SPACEKEEP_AMOUNT").value_or(0), kFileBytes);
   }
@@ -109,7 +113,8 @@ TEST_F(Hostile, HalfAnAuthenticationLeftOpenIsClosedByItsTimeLimit) {
   half.send(std::string_view("\0AUTH EXTER", 11));
   expectHonestPurgeSucceeds();
   EXPECT_TRUE(half.closedByPeer());
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "did not authenticate in time")) << sandbox_.daemonLog();
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "did not authenticate in time"))
+      << sandbox_.daemonLog();
 }
 
 TEST_F(Hostile, AnOversizedMessageIsRefusedBeforeItIsRead) {
@@ -118,7 +123,8 @@ TEST_F(Hostile, AnOversizedMessageIsRefusedBeforeItIsRead) {
   large.send(std::string(8 * 1024 * 1024, 'x'));
   expectHonestPurgeSucceeds();
   EXPECT_TRUE(large.closedByPeer());
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "it sent a message of 10485")) << sandbox_.daemonLog();
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "it sent a message of 10485"))
+      << sandbox_.daemonLog();
 }
 
 TEST_F(Hostile, DeeplyNestedMessagesAreRefused) {
@@ -132,8 +138,9 @@ TEST_F(Hostile, DeeplyNestedMessagesAreRefused) {
 
 TEST_F(Hostile, WrongTypesForEveryArgumentOfEveryOperationGetAnError) {
   const std::vector<std::string> members = {
-      "clientCheckin", "clientPurgeableSpace", "clientItemizedPurgeableSpace", "clientPurge",
-      "clientCancelPurge", "clientSetState", "clientGetState"};
+      "clientCheckin", "clientPurgeableSpace", "clientItemizedPurgeableSpace",
+      "clientPurge",   "clientCancelPurge",    "clientSetState",
+      "clientGetState"};
   const std::string number("\x2a\0\0\0\0\0\0\0", 8);
   for (const std::string& member : members) {
     for (const std::string signature : {"", "u", "t", "x", "d", "ai", "as", "a{ss}", "(u)", "v"}) {
@@ -178,7 +185,8 @@ TEST_F(Hostile, AThousandConnectionsOfOneUserLeaveRoomForOthers) {
   std::vector<RawPeer> crowd;
   for (int i = 0; i < 1000; ++i) crowd.push_back(authenticatedPeer());
   expectHonestPurgeSucceeds();
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "connections of this user are open")) << sandbox_.daemonLog();
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "connections of this user are open"))
+      << sandbox_.daemonLog();
   crowd.clear();
   EXPECT_NO_THROW(static_cast<void>(connect()));
 }

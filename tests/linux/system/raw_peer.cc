@@ -129,7 +129,8 @@ std::string RawPeer::receive() const {
 
 std::string methodCall(std::string_view member, std::string_view signature, std::string_view body,
                        std::string_view sender) {
-  return header(member, signature, static_cast<std::uint32_t>(body.size()), sender) + std::string(body);
+  return header(member, signature, static_cast<std::uint32_t>(body.size()), sender) +
+         std::string(body);
 }
 
 std::string callClaiming(std::string_view member, std::string_view signature,

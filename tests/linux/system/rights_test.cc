@@ -14,21 +14,26 @@ constexpr uid_t kServiceUser = 4002;  // may connect and check in
 constexpr uid_t kStranger = 4003;     // no rule names it
 
 std::string rule(uid_t user, const std::string& grants) {
-  return "<plist version=\"1.0\"><dict><key>MATCH_USER</key><array><integer>" + std::to_string(user) +
-         "</integer></array><key>GRANT</key><array>" + grants + "</array></dict></plist>";
+  return "<plist version=\"1.0\"><dict><key>MATCH_USER</key><array><integer>" +
+         std::to_string(user) + "</integer></array><key>GRANT</key><array>" + grants +
+         "</array></dict></plist>";
 }
 
-std::string granted(const std::string& entitlement) { return "<string>" + entitlement + "</string>"; }
+std::string granted(const std::string& entitlement) {
+  return "<string>" + entitlement + "</string>";
+}
 
 class Rights : public testing::Test {
  protected:
   void SetUp() override {
     sandbox_.addVolume("tmp", "tmpfs", 16);
     sandbox_.start();
-    sandbox_.write("/etc/spacekeep/entitlements.d/clients.plist",
-                   rule(kClientUser, granted("CLIENT_ENTITLEMENT") + granted("PURGEABLE_ENTITLEMENT")));
-    sandbox_.write("/etc/spacekeep/entitlements.d/services.plist",
-                   rule(kServiceUser, granted("CLIENT_ENTITLEMENT") + granted("SERVICE_ENTITLEMENT")));
+    sandbox_.write(
+        "/etc/spacekeep/entitlements.d/clients.plist",
+        rule(kClientUser, granted("CLIENT_ENTITLEMENT") + granted("PURGEABLE_ENTITLEMENT")));
+    sandbox_.write(
+        "/etc/spacekeep/entitlements.d/services.plist",
+        rule(kServiceUser, granted("CLIENT_ENTITLEMENT") + granted("SERVICE_ENTITLEMENT")));
     daemon_ = sandbox_.startDaemon();
   }
 
@@ -47,7 +52,8 @@ class Rights : public testing::Test {
 TEST_F(Rights, APeerWithoutTheClientEntitlementIsRefusedAtTheDoor) {
   const std::string answer = answerTo(kStranger, {"purge", "/volumes/tmp", "0"});
   EXPECT_NE(answer.find("error: "), std::string::npos) << answer;
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "CLIENT_ENTITLEMENT")) << sandbox_.daemonLog();
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "CLIENT_ENTITLEMENT"))
+      << sandbox_.daemonLog();
   EXPECT_NE(sandbox_.daemonLog().find(std::to_string(kStranger)), std::string::npos);
 }
 
@@ -65,19 +71,21 @@ TEST_F(Rights, WithoutTheServiceEntitlementACheckInGetsNoReply) {
   Process peer = sandbox_.spawn({"/programs/tests/test-peer", "check-in", "refused", "300"},
                                 "refused.log", kClientUser, kClientUser);
   EXPECT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "clientCheckin Connection is not entitled!"));
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/refused.log", "without an answer")) << sandbox_.read("/tmp/refused.log");
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/refused.log", "without an answer"))
+      << sandbox_.read("/tmp/refused.log");
   EXPECT_EQ(sandbox_.read("/tmp/refused.log").find("serving"), std::string::npos);
 }
 
 TEST_F(Rights, WithTheServiceEntitlementACheckInIsServed) {
   Process peer = sandbox_.spawn({"/programs/tests/test-peer", "check-in", "welcome", "300"},
                                 "welcome.log", kServiceUser, kServiceUser);
-  EXPECT_TRUE(sandbox_.waitForText("/tmp/welcome.log", "serving")) << sandbox_.read("/tmp/welcome.log");
+  EXPECT_TRUE(sandbox_.waitForText("/tmp/welcome.log", "serving"))
+      << sandbox_.read("/tmp/welcome.log");
 }
 
 TEST_F(Rights, TheTerminationSignalEndsTheDaemonWithStatusZeroInTheMiddleOfAPurge) {
-  Process purge = sandbox_.spawn({"/programs/ctl/spacekeepctl", "purge", "/volumes/tmp", "1M", "--wait-all"},
-                                 "purge.log");
+  Process purge = sandbox_.spawn(
+      {"/programs/ctl/spacekeepctl", "purge", "/volumes/tmp", "1M", "--wait-all"}, "purge.log");
   ASSERT_TRUE(sandbox_.waitForText("/tmp/daemon.log", "waiting for 2 seconds"));
   daemon_.signal(SIGTERM);
   EXPECT_EQ(daemon_.wait(), 0);

@@ -30,7 +30,8 @@ void shell(const std::string& command) {
 /// Mounts made by this process are its own from here on, and go with it.
 void leaveTheMachinesMounts() {
   static const bool done = [] {
-    if (unshare(CLONE_NEWNS) != 0 || mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
+    if (unshare(CLONE_NEWNS) != 0 ||
+        mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
       throw std::runtime_error("these tests need root: they mount file systems of their own");
     }
     return true;
@@ -135,10 +136,10 @@ void Sandbox::addVolume(const std::string& name, const std::string& type, unsign
 
 void Sandbox::start() {
   const std::string log = directory_ + "/holder.log";
-  holder_ = Process(launch({std::string(SPACEKEEP_SOURCE_DIR) + "/tests/sandbox/enter", directory_,
-                            SPACEKEEP_BUILD_DIR, "--", "/bin/sh", "-c",
-                            "echo ready >/tmp/ready; exec sleep 3600"},
-                           log));
+  holder_ = Process(launch(
+      {std::string(SPACEKEEP_SOURCE_DIR) + "/tests/sandbox/enter", directory_, SPACEKEEP_BUILD_DIR,
+       "--", "/bin/sh", "-c", "echo ready >/tmp/ready; exec sleep 3600"},
+      log));
   if (!waitUntil([this] { return fs::exists(outside("/tmp/ready")) || !holder_.running(); }) ||
       !holder_.running()) {
     throw std::runtime_error("the sandbox did not start: " + slurp(log));
@@ -163,8 +164,7 @@ std::string Sandbox::read(const std::string& inside) const { return slurp(outsid
 Process Sandbox::spawn(const std::vector<std::string>& command, const std::string& log, uid_t uid,
                        gid_t gid) const {
   const std::string target = std::to_string(holder_.pid());
-  std::vector<std::string> whole = {"nsenter", "--mount",  "--root", "--wdns=/",
-                                    "--target", target};
+  std::vector<std::string> whole = {"nsenter", "--mount", "--root", "--wdns=/", "--target", target};
   if (uid != 0 || gid != 0) {
     whole.insert(whole.end(), {"setpriv", "--reuid=" + std::to_string(uid),
                                "--regid=" + std::to_string(gid), "--clear-groups"});

@@ -16,9 +16,9 @@ namespace fs = std::filesystem;
 
 const std::vector<std::string> kDaemonRooms = {"daemon",     "registry", "client",
                                                "operations", "purge",    "purgeable"};
-const std::vector<std::string> kProductionRooms = {
-    "daemon", "registry", "client", "operations", "purge", "purgeable",
-    "support", "sdk",     "ctl",    "services",   "sim"};
+const std::vector<std::string> kProductionRooms = {"daemon", "registry",  "client",  "operations",
+                                                   "purge",  "purgeable", "support", "sdk",
+                                                   "ctl",    "services",  "sim"};
 
 struct SourceFile {
   std::string path;  // relative to the source tree
@@ -72,12 +72,16 @@ TEST(Tidy, TheTreeIsFound) { EXPECT_GT(filesIn(kProductionRooms).size(), 50U); }
 
 TEST(Tidy, TheDaemonsRoomsIncludeOnlyTheStandardLibraryAndTheProject) {
   const std::set<std::string> standard = {
-      "algorithm", "array",    "atomic",      "bit",         "cctype",   "cmath",   "compare",
-      "concepts",  "cstddef",  "cstdint",     "cstdlib",     "cstring",  "deque",   "exception",
-      "functional", "initializer_list",       "iterator",    "limits",   "list",    "map",
-      "memory",    "new",      "numeric",     "optional",    "queue",    "ratio",   "set",
-      "span",      "stdexcept", "string",     "string_view", "tuple",    "type_traits", "typeinfo",
-      "utility",   "variant",  "vector"};
+      "algorithm",   "array",     "atomic",      "bit",
+      "cctype",      "cmath",     "compare",     "concepts",
+      "cstddef",     "cstdint",   "cstdlib",     "cstring",
+      "deque",       "exception", "functional",  "initializer_list",
+      "iterator",    "limits",    "list",        "map",
+      "memory",      "new",       "numeric",     "optional",
+      "queue",       "ratio",     "set",         "span",
+      "stdexcept",   "string",    "string_view", "tuple",
+      "type_traits", "typeinfo",  "utility",     "variant",
+      "vector"};
   const std::regex system_include("^\\s*#\\s*include\\s*<([^>]+)>");
   const std::regex own_include("^\\s*#\\s*include\\s*\"([^\"]+)\"");
   std::ostringstream found;
@@ -104,14 +108,17 @@ TEST(Tidy, TheDaemonsRoomsIncludeOnlyTheStandardLibraryAndTheProject) {
 
 TEST(Tidy, ThreadsBlockingAndClocksAreKnownOnlyThroughTheRuntimeSeam) {
   const std::string banned =
-      "#include <(thread|mutex|condition_variable|shared_mutex|future|semaphore|latch|barrier|random|"
+      "#include "
+      "<(thread|mutex|condition_variable|shared_mutex|future|semaphore|latch|barrier|random|"
       "pthread\\.h)>";
   EXPECT_EQ(matches(withoutPrefix(filesIn(kProductionRooms), "support/"), banned), "")
       << "use support/runtime/locks.h, support/runtime/runtime.h and support/queues/";
   const auto files = withoutPrefix(filesIn(kProductionRooms), "support/runtime/");
-  EXPECT_EQ(matches(files, "(steady|system|high_resolution)_clock"), "") << "use rt::ticks, rt::wallClockNs";
-  EXPECT_EQ(matches(files, "\\b(usleep|nanosleep|clock_nanosleep|clock_gettime|gettimeofday|"
-                           "sleep_for|sleep_until|pthread_\\w+)\\s*\\("),
+  EXPECT_EQ(matches(files, "(steady|system|high_resolution)_clock"), "")
+      << "use rt::ticks, rt::wallClockNs";
+  EXPECT_EQ(matches(files,
+                    "\\b(usleep|nanosleep|clock_nanosleep|clock_gettime|gettimeofday|"
+                    "sleep_for|sleep_until|pthread_\\w+)\\s*\\("),
             "")
       << "use rt::sleepNs, rt::ticks, rt::wallClockNs";
 }
@@ -139,9 +146,9 @@ TEST(Tidy, EveryHeaderBeginsWithItsThreadSafety) {
 
 TEST(Tidy, NoFileIsLongerThanFiveHundredLines) {
   std::ostringstream found;
-  for (const SourceFile& file : filesIn({"daemon", "support", "registry", "client", "operations",
-                                         "purge", "purgeable", "sdk", "ctl", "services", "sim",
-                                         "tests", "bench", "fuzz"})) {
+  for (const SourceFile& file :
+       filesIn({"daemon", "support", "registry", "client", "operations", "purge", "purgeable",
+                "sdk", "ctl", "services", "sim", "tests", "bench", "fuzz"})) {
     if (file.lines.size() > 500) found << file.path << ": " << file.lines.size() << " lines\n";
   }
   EXPECT_EQ(found.str(), "") << "split by idea";
@@ -171,8 +178,9 @@ TEST(Tidy, EveryHeaderIsIncludedSomewhere) {
 
 TEST(Tidy, PropertyListFilesCarryNoDoctype) {
   const std::string doctype = std::string("<!DOC") + "TYPE plist";
-  EXPECT_EQ(matches(filesIn({"packaging", "services", "tests", "demo", "docs", "fuzz"}, {}), doctype),
-            "");
+  EXPECT_EQ(
+      matches(filesIn({"packaging", "services", "tests", "demo", "docs", "fuzz"}, {}), doctype),
+      "");
 }
 
 }  // namespace

@@ -16,6 +16,14 @@
 namespace spacekeep::system_test {
 namespace {
 
+// A sanitizer keeps freed memory back and a shadow of all of it: the bound is about the program as
+// it ships.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool kIsAsShipped = false;
+#else
+constexpr bool kIsAsShipped = true;
+#endif
+
 constexpr int kConnections = 200;
 constexpr int kPurgesEach = 10;
 
@@ -110,7 +118,9 @@ TEST(Flood, TwoThousandPurgesFromTwoHundredConnectionsAreAllAnsweredInBoundedSpa
   EXPECT_EQ(answered, expected);
   EXPECT_EQ(reached, expected - 1);
   EXPECT_LE(peak.threads, 100);
-  EXPECT_LE(peak.resident_kib, 64 * 1024);
+  if (kIsAsShipped) {
+    EXPECT_LE(peak.resident_kib, 64 * 1024);
+  }
   RecordProperty("peak_threads", std::to_string(peak.threads));
   RecordProperty("peak_resident_kib", std::to_string(peak.resident_kib));
   std::printf("peak threads %ld, peak resident %ld KiB\n", peak.threads, peak.resident_kib);

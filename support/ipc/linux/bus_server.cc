@@ -37,6 +37,7 @@ struct BusServer::State : public std::enable_shared_from_this<BusServer::State> 
 
   void serve(const SharedDescriptor& connected, std::function<void()> on_end);
   std::string refusal(const AcceptedPeer& peer) const;
+  std::string admissionRefusal(AcceptedPeer& peer) const;
   void ended(std::uint64_t id, std::uint32_t uid, std::function<void()> on_end);
   void close();
 
@@ -60,9 +61,7 @@ void BusServer::State::serve(const SharedDescriptor& connected, std::function<vo
   }
   const auto peer = std::make_shared<AcceptedPeer>(std::move(identity));
   std::string why = refusal(*peer);
-  if (why.empty() && context->options.admit && !context->options.admit(*peer, why) && why.empty()) {
-    why = "it is not admitted";
-  }
+  if (why.empty()) why = admissionRefusal(*peer);
   if (!why.empty()) {
     context->refusals.write(peer->identity().describe(), why);
     if (on_end) context->global.async(std::move(on_end));
@@ -90,6 +89,13 @@ std::string BusServer::State::refusal(const AcceptedPeer& peer) const {
     return std::to_string(of_uid->second) + " connections of this user are open";
   }
   return "";
+}
+
+/// Only the answer of `admit` decides; what it wrote counts when it said no.
+std::string BusServer::State::admissionRefusal(AcceptedPeer& peer) const {
+  std::string why;
+  if (!context->options.admit || context->options.admit(peer, why)) return "";
+  return why.empty() ? "it is not admitted" : why;
 }
 
 /// Its place is free at once; the object itself goes later, since it may be on the stack.

@@ -110,5 +110,15 @@ TEST_F(ListenerTest, PausesWhenDescriptorsAreUsedUpAndGoesOnAfterwards) {
   EXPECT_TRUE(eventually([&] { return listener.connections() == 3; }));
 }
 
+TEST(BusServer, AnAdmittedPeerIsServedWhateverTheAdmissionWrote) {
+  ServerOptions options = TestServer::defaultOptions();
+  options.admit = [](PeerConnection&, std::string& why) {
+    why = "a remark, not a refusal";
+    return true;
+  };
+  TestServer server(std::move(options));
+  expectHonestClientIsServed(server);
+}
+
 }  // namespace
 }  // namespace spacekeep::ipc::test

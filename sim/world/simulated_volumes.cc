@@ -78,6 +78,16 @@ std::uint64_t SimulatedVolumes::volumeFreespace(const Value* volume) {
   return path == nullptr ? 0 : freeBytes(*path);
 }
 
+void SimulatedVolumes::setLowSpaceSettings(const LowSpaceSettings& settings) {
+  const std::scoped_lock lock(mutex_);
+  low_space_settings_ = settings;
+}
+
+std::optional<LowSpaceSettings> SimulatedVolumes::lowSpaceSettings() const {
+  const std::scoped_lock lock(mutex_);
+  return low_space_settings_;
+}
+
 void SimulatedVolumes::addFree(const std::string& volume, std::uint64_t bytes) {
   const std::scoped_lock lock(mutex_);
   const auto found = volumes_.find(volume);

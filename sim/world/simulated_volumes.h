@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -31,11 +32,15 @@ class SimulatedVolumes final : public Volumes {
   void setFree(const std::string& volume, std::uint64_t free_bytes);
   void setLowSpace(std::vector<std::string> volumes);
   [[nodiscard]] std::uint64_t freeBytes(const std::string& volume) const;
+  /// The last settings given, none when there were none yet. They decide nothing here: which volumes
+  /// are short is what setLowSpace() says.
+  [[nodiscard]] std::optional<LowSpaceSettings> lowSpaceSettings() const;
 
   [[nodiscard]] std::vector<std::string> getLocalVolumes() override;
   [[nodiscard]] std::vector<std::string> lowSpaceVolumes() override;
   [[nodiscard]] bool validateVolume(const Dictionary& info) override;
   [[nodiscard]] std::uint64_t volumeFreespace(const Value* volume) override;
+  void setLowSpaceSettings(const LowSpaceSettings& settings) override;
 
  private:
   struct Volume {
@@ -53,6 +58,7 @@ class SimulatedVolumes final : public Volumes {
   std::map<std::string, Volume> volumes_;
   std::vector<std::string> mount_order_;
   std::vector<std::string> low_space_;
+  std::optional<LowSpaceSettings> low_space_settings_;
 };
 
 }  // namespace spacekeep::sim

@@ -80,6 +80,7 @@ LowSpaceWatch::Watched LowSpaceWatch::observe(const VolumeSample& sample,
                     elapsed_ns, limits_.slowest_inodes_per_second, limits_.rate_half_life_ns);
   }
   watched.space = sample.space;
+  watched.thresholds = sample.thresholds;
   watched.looked_at_ns = now_ns;
   return watched;
 }
@@ -109,7 +110,7 @@ std::uint64_t LowSpaceWatch::pauseFor(const Watched& watched, SpaceLevel level,
   // Nothing worse can come; that it recovers needs no haste.
   if (level == SpaceLevel::kVeryLow) return std::max(until_report, limits_.shortest_pause_ns);
 
-  const SpaceThresholds thresholds = spaceThresholds(watched.space);
+  const SpaceThresholds& thresholds = watched.thresholds;
   const bool is_low = level == SpaceLevel::kLow;
   const std::uint64_t bytes_left = above(watched.space.available_bytes,
                                          is_low ? thresholds.very_low_bytes : thresholds.low_bytes);

@@ -58,6 +58,7 @@ class LowSpaceWatch {
  private:
   struct Watched {
     VolumeSpace space;
+    SpaceThresholds thresholds;
     std::uint64_t looked_at_ns = 0;
     double bytes_per_second = 0;
     double inodes_per_second = 0;

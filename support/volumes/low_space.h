@@ -5,6 +5,8 @@
 
 #include <cstdint>
 
+#include "support/volumes/low_space_settings.h"
+
 namespace spacekeep {
 
 /// What statvfs(3) tells of a file system, in bytes. "available" is what an unprivileged writer can
@@ -25,14 +27,19 @@ struct SpaceThresholds {
   std::uint64_t very_low_bytes = 0;
   std::uint64_t low_inodes = 0;
   std::uint64_t very_low_inodes = 0;
+  bool operator==(const SpaceThresholds&) const = default;
 };
 
-/// min(5 % of the size, 500 MiB), and a third of that; 5 % and 1.7 % of the inodes. A percentage
-/// alone would keep tens of gigabytes free on a large volume.
-[[nodiscard]] SpaceThresholds spaceThresholds(const VolumeSpace& space);
+/// Low below min(percent of the size, bytes), very low below a third of that; by default 5 % and
+/// 500 MiB. A percentage alone would keep tens of gigabytes free on a large volume. The same for
+/// the inodes, whose very low threshold is the fraction 1.7/5 of the low one (by default 5 % and
+/// 1.7 %). Percentages count in steps of 0.0001.
+[[nodiscard]] SpaceThresholds spaceThresholds(const VolumeSpace& space,
+                                              const LowSpaceSettings& settings);
 
 /// A volume that was at `previous` leaves it upwards only at 1.5 times its threshold, so that one
 /// which hovers at the threshold does not set off one purge after another.
-[[nodiscard]] SpaceLevel spaceLevel(const VolumeSpace& space, SpaceLevel previous);
+[[nodiscard]] SpaceLevel spaceLevel(const VolumeSpace& space, const SpaceThresholds& thresholds,
+                                    SpaceLevel previous);
 
 }  // namespace spacekeep

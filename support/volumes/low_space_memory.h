@@ -16,15 +16,21 @@ namespace spacekeep {
 
 class LowSpaceMemory {
  public:
-  /// Sets the level of each sample. `samples` are all volumes there are now: the others are
-  /// forgotten, so the memory never outgrows the mount table.
+  /// Sets the thresholds and the level of each sample. `samples` are all volumes there are now: the
+  /// others are forgotten, so the memory never outgrows the mount table.
   void judge(std::vector<VolumeSample>& samples);
+
+  /// Holds from the next judge() on, which starts afresh: who was short by other thresholds says
+  /// nothing now. Answers whether anything changed.
+  bool setSettings(const LowSpaceSettings& settings);
 
  private:
   using Key = std::pair<std::string, std::uint64_t>;  // mount point, file system
 
   rt::Mutex mutex_;
-  std::map<Key, SpaceLevel> short_;  // protected by mutex_; only volumes that are not kEnough
+  // Protected by mutex_.
+  LowSpaceSettings settings_;
+  std::map<Key, SpaceLevel> short_;  // only volumes that are not kEnough
 };
 
 }  // namespace spacekeep

@@ -3,6 +3,7 @@
 // A look at the space of all local volumes at once, for whoever watches them.
 #pragma once
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -14,6 +15,7 @@ struct VolumeSample {
   std::string volume = {};        ///< mount point
   std::uint64_t file_system = 0;  ///< tells apart what was mounted there one after another
   VolumeSpace space = {};
+  SpaceThresholds thresholds = {};
   SpaceLevel level = SpaceLevel::kEnough;
 };
 
@@ -23,6 +25,11 @@ class SpaceSource {
   /// Every local volume, each file system once, in mount order. A volume that cannot be asked is
   /// left out.
   [[nodiscard]] virtual std::vector<VolumeSample> sampleLocalVolumes() = 0;
+
+  /// `changed` is called when the thresholds have changed, so that waiting for the next look would
+  /// miss what is short now; it must return soon and not come back here. There is one, an empty one
+  /// takes it away: when this returns, the one before is not running and will not be called.
+  virtual void setThresholdsChangedHandler(std::function<void()> changed) = 0;
 };
 
 }  // namespace spacekeep

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "support/values/value.h"
+#include "support/volumes/low_space_settings.h"
 
 namespace spacekeep {
 
@@ -24,6 +25,8 @@ class Volumes {
   [[nodiscard]] virtual bool validateVolume(const Dictionary& info) = 0;
   /// Bytes that an unprivileged writer can still use; 0 for an absent or unknown volume.
   [[nodiscard]] virtual std::uint64_t volumeFreespace(const Value* volume) = 0;
+  /// From the next look at the volumes on, which comes at once.
+  virtual void setLowSpaceSettings(const LowSpaceSettings& settings) = 0;
 
   /// Bytes by which the free space of "SPACEKEEP_VOLUME" has grown since
   /// "SPACEKEEP_FREESPACE_BEGIN"; never negative.

@@ -54,9 +54,11 @@ LinuxEventSources::LinuxEventSources(std::shared_ptr<EventLoop> loop, Concurrent
                   }),
       mount_table_(::open(options_.mount_table_path.c_str(), O_RDONLY | O_CLOEXEC)) {
   loop_->post([this] { watchMountTable(); });
+  space_.setThresholdsChangedHandler([this] { lookAtVolumesNow(); });
 }
 
 LinuxEventSources::~LinuxEventSources() {
+  space_.setThresholdsChangedHandler({});
   loop_->stop();
   streams_.clear();
   activities_.clear();
@@ -121,14 +123,14 @@ void LinuxEventSources::park() {
 
 void LinuxEventSources::watchMountTable() {
   const bool watched = mount_table_ >= 0 && loop_->watch(mount_table_, EPOLLPRI | EPOLLET,
-                                                         [this] { mountTableChanged(); });
+                                                         [this] { lookAtVolumesNow(); });
   if (!watched) {
     logProblem("%s cannot watch %s, new mounts are noticed at the next look", "watchMountTable",
                options_.mount_table_path);
   }
 }
 
-void LinuxEventSources::mountTableChanged() {
+void LinuxEventSources::lookAtVolumesNow() {
   const std::scoped_lock lock(mutex_);
   for (const auto& stream : streams_) stream->lookNow();
 }

@@ -57,7 +57,7 @@ class LinuxEventSources final : public EventSources {
 
  private:
   void watchMountTable();
-  void mountTableChanged();
+  void lookAtVolumesNow();
 
   ConcurrentQueue& global_;
   SpaceSource& space_;

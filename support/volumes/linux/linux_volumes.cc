@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <set>
+#include <utility>
 
 namespace spacekeep {
 namespace {
@@ -52,6 +53,17 @@ std::uint64_t LinuxVolumes::volumeFreespace(const Value* volume) {
   if (mount == nullptr) return 0;
   const auto space = measureSpace(*mount);
   return space ? space->available_bytes : 0;
+}
+
+void LinuxVolumes::setLowSpaceSettings(const LowSpaceSettings& settings) {
+  if (!memory_.setSettings(settings)) return;
+  thresholds_changed_.update([](const std::function<void()>& changed) {
+    if (changed) changed();
+  });
+}
+
+void LinuxVolumes::setThresholdsChangedHandler(std::function<void()> changed) {
+  thresholds_changed_.set(std::move(changed));
 }
 
 std::vector<VolumeSample> LinuxVolumes::sampleLocalVolumes() {

@@ -4,10 +4,12 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
 #include <vector>
 
+#include "support/runtime/guarded.h"
 #include "support/volumes/linux/mount_table.h"
 #include "support/volumes/low_space_memory.h"
 #include "support/volumes/space_source.h"
@@ -28,7 +30,10 @@ class LinuxVolumes final : public Volumes, public SpaceSource {
   [[nodiscard]] bool validateVolume(const Dictionary& info) override;
   [[nodiscard]] std::uint64_t volumeFreespace(const Value* volume) override;
 
+  void setLowSpaceSettings(const LowSpaceSettings& settings) override;
+
   [[nodiscard]] std::vector<VolumeSample> sampleLocalVolumes() override;
+  void setThresholdsChangedHandler(std::function<void()> changed) override;
 
   /// How often the mount table was read so far.
   [[nodiscard]] std::uint64_t mountTableReadings() const { return table_.readings(); }
@@ -36,6 +41,7 @@ class LinuxVolumes final : public Volumes, public SpaceSource {
  private:
   MountTable table_;
   LowSpaceMemory memory_;
+  rt::Guarded<std::function<void()>> thresholds_changed_;
 };
 
 }  // namespace spacekeep

@@ -22,11 +22,14 @@ class OneVolume final : public SpaceSource {
   }
   void set(std::uint64_t available, SpaceLevel level) {
     const std::scoped_lock lock(mutex_);
+    const VolumeSpace space{.size_bytes = 10240 * kMiB, .available_bytes = available};
     sample_ = {.volume = "/data",
                .file_system = 1,
-               .space = {.size_bytes = 10240 * kMiB, .available_bytes = available},
+               .space = space,
+               .thresholds = spaceThresholds(space, {}),
                .level = level};
   }
+  void setThresholdsChangedHandler(std::function<void()>) override {}
 
  private:
   rt::Mutex mutex_;

@@ -13,9 +13,11 @@ constexpr std::uint64_t kHour = 3600 * kSecond;
 /// A volume of 64 GiB (low below 500 MiB, very low below a third of that).
 std::vector<VolumeSample> volume(std::uint64_t available, SpaceLevel level = SpaceLevel::kEnough,
                                  const std::string& path = "/data") {
+  const VolumeSpace space{.size_bytes = 64 * kGiB, .available_bytes = available};
   return {{.volume = path,
            .file_system = 1,
-           .space = {.size_bytes = 64 * kGiB, .available_bytes = available},
+           .space = space,
+           .thresholds = spaceThresholds(space, {}),
            .level = level}};
 }
 
@@ -98,6 +100,7 @@ TEST(LowSpaceWatch, InodesAreUsedUpToo) {
   auto samples = volume(500 * kGiB);
   samples[0].space.inodes = 1'000'000;
   samples[0].space.available_inodes = 250'000;  // 200,000 above the threshold at 200 a second
+  samples[0].thresholds = spaceThresholds(samples[0].space, {});
   EXPECT_EQ(watch.look(samples, 0).pause_ns, 1000 * kSecond);
   samples[0].space.available_inodes = 99'999;  // near
   EXPECT_LE(watch.look(samples, kSecond).pause_ns, 60 * kSecond);

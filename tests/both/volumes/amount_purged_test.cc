@@ -14,6 +14,7 @@ class OneVolume final : public Volumes {
   std::uint64_t volumeFreespace(const Value* volume) override {
     return volume != nullptr && *volume == Value("/data") ? free_bytes_ : 0;
   }
+  void setLowSpaceSettings(const LowSpaceSettings&) override {}
 
  private:
   const std::uint64_t free_bytes_;

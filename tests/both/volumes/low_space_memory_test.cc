@@ -25,6 +25,29 @@ TEST(LowSpaceMemory, RemembersWhoIsShort) {
   EXPECT_EQ(levelIn(memory, "/data", 700), SpaceLevel::kEnough);
 }
 
+TEST(LowSpaceMemory, SaysByWhichThresholdsItJudged) {
+  LowSpaceMemory memory;
+  std::vector<VolumeSample> samples = {{.volume = "/data", .space = {.size_bytes = 12000}}};
+  memory.judge(samples);
+  EXPECT_EQ(samples[0].thresholds, (SpaceThresholds{.low_bytes = 600, .very_low_bytes = 200}));
+}
+
+TEST(LowSpaceMemory, NewSettingsHoldFromTheNextLookAndForgetWhoWasShort) {
+  LowSpaceMemory memory;
+  EXPECT_EQ(levelIn(memory, "/data", 599), SpaceLevel::kLow);
+  EXPECT_TRUE(memory.setSettings({.percent = 4}));  // low below 480, and until 720
+  EXPECT_EQ(levelIn(memory, "/data", 599), SpaceLevel::kEnough);
+  EXPECT_TRUE(memory.setSettings({.percent = 5}));
+  EXPECT_EQ(levelIn(memory, "/data", 599), SpaceLevel::kLow);
+}
+
+TEST(LowSpaceMemory, TheSameSettingsAgainChangeNothing) {
+  LowSpaceMemory memory;
+  EXPECT_EQ(levelIn(memory, "/data", 599), SpaceLevel::kLow);
+  EXPECT_FALSE(memory.setSettings({}));
+  EXPECT_EQ(levelIn(memory, "/data", 700), SpaceLevel::kLow);
+}
+
 TEST(LowSpaceMemory, AVolumeThatWasGoneStartsAfresh) {
   LowSpaceMemory memory;
   EXPECT_EQ(levelIn(memory, "/data", 599), SpaceLevel::kLow);

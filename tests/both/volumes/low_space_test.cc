@@ -11,25 +11,54 @@ constexpr std::uint64_t kMiB = 1024 * 1024;
 constexpr std::uint64_t kGiB = 1024 * kMiB;
 using enum SpaceLevel;
 
+SpaceThresholds defaults(const VolumeSpace& space) { return spaceThresholds(space, {}); }
+
+SpaceLevel levelByDefaults(const VolumeSpace& space, SpaceLevel previous) {
+  return spaceLevel(space, defaults(space), previous);
+}
+
 TEST(SpaceThresholds, FivePercentUpToFiveHundredMebibytes) {
-  EXPECT_EQ(spaceThresholds({.size_bytes = 1000}).low_bytes, 50U);
-  EXPECT_EQ(spaceThresholds({.size_bytes = 10000 * kMiB}).low_bytes, 500 * kMiB);
-  EXPECT_EQ(spaceThresholds({.size_bytes = 10000 * kMiB - 20}).low_bytes, 500 * kMiB - 1);
-  EXPECT_EQ(spaceThresholds({.size_bytes = 100'000 * kGiB}).low_bytes, 500 * kMiB);
-  EXPECT_EQ(spaceThresholds({.size_bytes = UINT64_MAX}).low_bytes, 500 * kMiB);
+  EXPECT_EQ(defaults({.size_bytes = 1000}).low_bytes, 50U);
+  EXPECT_EQ(defaults({.size_bytes = 10000 * kMiB}).low_bytes, 500 * kMiB);
+  EXPECT_EQ(defaults({.size_bytes = 10000 * kMiB - 20}).low_bytes, 500 * kMiB - 1);
+  EXPECT_EQ(defaults({.size_bytes = 100'000 * kGiB}).low_bytes, 500 * kMiB);
+  EXPECT_EQ(defaults({.size_bytes = UINT64_MAX}).low_bytes, 500 * kMiB);
 }
 
 TEST(SpaceThresholds, VeryLowIsAThird) {
-  EXPECT_EQ(spaceThresholds({.size_bytes = 6000}).very_low_bytes, 100U);
-  EXPECT_EQ(spaceThresholds({.size_bytes = kGiB * 100}).very_low_bytes, 500 * kMiB / 3);
+  EXPECT_EQ(defaults({.size_bytes = 6000}).very_low_bytes, 100U);
+  EXPECT_EQ(defaults({.size_bytes = kGiB * 100}).very_low_bytes, 500 * kMiB / 3);
 }
 
 TEST(SpaceThresholds, InodesFivePercentAndOnePointSeven) {
-  const SpaceThresholds thresholds = spaceThresholds({.inodes = 10000});
+  const SpaceThresholds thresholds = defaults({.inodes = 10000});
   EXPECT_EQ(thresholds.low_inodes, 500U);
   EXPECT_EQ(thresholds.very_low_inodes, 170U);
-  EXPECT_EQ(spaceThresholds({.inodes = UINT64_MAX}).very_low_inodes,
+  EXPECT_EQ(defaults({.inodes = UINT64_MAX}).very_low_inodes,
             UINT64_MAX / 1000 * 17 + UINT64_MAX % 1000 * 17 / 1000);
+}
+
+TEST(SpaceThresholds, SettingsMoveThem) {
+  const VolumeSpace space{.size_bytes = 100 * kGiB, .inodes = 1'000'000};
+  EXPECT_EQ(spaceThresholds(space, {.bytes = 3 * kGiB, .percent = 50, .inodes_percent = 10}),
+            (SpaceThresholds{.low_bytes = 3 * kGiB,
+                             .very_low_bytes = kGiB,
+                             .low_inodes = 100'000,
+                             .very_low_inodes = 34'000}));
+  EXPECT_EQ(spaceThresholds(space, {.bytes = 100 * kGiB, .percent = 12.5}).low_bytes,
+            12 * kGiB + kGiB / 2);
+  EXPECT_EQ(spaceThresholds(space, {.percent = 0.01}).low_bytes, 100 * kGiB / 10'000);
+  EXPECT_EQ(spaceThresholds(space, {.percent = 1e-9}).low_bytes, 100 * kGiB / 1'000'000);
+}
+
+TEST(SpaceThresholds, ZeroPercentIsNeverLowByThatMeasure) {
+  const VolumeSpace full{.size_bytes = kGiB, .available_bytes = 0, .inodes = 1000};
+  const auto level = [&](const LowSpaceSettings& settings) {
+    return spaceLevel(full, spaceThresholds(full, settings), kEnough);
+  };
+  EXPECT_EQ(level({.percent = 0, .inodes_percent = 0}), kEnough);
+  EXPECT_EQ(level({.percent = 0, .inodes_percent = 5}), kVeryLow);
+  EXPECT_EQ(level({.percent = 5, .inodes_percent = 0}), kVeryLow);
 }
 
 struct LevelCase {
@@ -58,19 +87,20 @@ TEST(SpaceLevel, ByBytesWithHysteresis) {
       {"from very low straight to enough", 900, kVeryLow, kEnough},
   };
   for (const LevelCase& each : cases) {
-    EXPECT_EQ(spaceLevel({.size_bytes = 12000, .available_bytes = each.available}, each.previous),
-              each.expected)
+    EXPECT_EQ(
+        levelByDefaults({.size_bytes = 12000, .available_bytes = each.available}, each.previous),
+        each.expected)
         << each.what;
   }
 }
 
 TEST(SpaceLevel, ByInodesThoughThereAreBytes) {
   const auto level = [](std::uint64_t inodes_left, SpaceLevel previous) {
-    return spaceLevel({.size_bytes = 1000,
-                       .available_bytes = 1000,
-                       .inodes = 10000,
-                       .available_inodes = inodes_left},
-                      previous);
+    return levelByDefaults({.size_bytes = 1000,
+                            .available_bytes = 1000,
+                            .inodes = 10000,
+                            .available_inodes = inodes_left},
+                           previous);
   };
   EXPECT_EQ(level(500, kEnough), kEnough);
   EXPECT_EQ(level(499, kEnough), kLow);
@@ -81,18 +111,18 @@ TEST(SpaceLevel, ByInodesThoughThereAreBytes) {
 
 TEST(SpaceLevel, TheWorseOfBytesAndInodesCounts) {
   EXPECT_EQ(
-      spaceLevel(
+      levelByDefaults(
           {.size_bytes = 12000, .available_bytes = 199, .inodes = 10000, .available_inodes = 499},
           kEnough),
       kVeryLow);
 }
 
 TEST(SpaceLevel, AFileSystemThatDoesNotCountInodesIsNotShortOfThem) {
-  EXPECT_EQ(spaceLevel({.size_bytes = 1000, .available_bytes = 1000}, kEnough), kEnough);
+  EXPECT_EQ(levelByDefaults({.size_bytes = 1000, .available_bytes = 1000}, kEnough), kEnough);
 }
 
 TEST(SpaceLevel, AFileSystemWithoutALimitIsNeverShort) {
-  EXPECT_EQ(spaceLevel({}, kEnough), kEnough);
+  EXPECT_EQ(levelByDefaults({}, kEnough), kEnough);
 }
 
 }  // namespace

@@ -12,6 +12,7 @@
 #include <cstdlib>
 
 #include "support/queues/waiting.h"
+#include "support/runtime/guarded.h"
 #include "tests/helpers/log_capture.h"
 #include "tests/linux/events/event_world.h"
 
@@ -28,13 +29,19 @@ class Space final : public SpaceSource {
  public:
   std::vector<VolumeSample> sampleLocalVolumes() override {
     ++looks;
+    const VolumeSpace space{.size_bytes = 1ULL << 40, .available_bytes = 1ULL << 39};
     return {{.volume = "/data",
              .file_system = 1,
-             .space = {.size_bytes = 1ULL << 40, .available_bytes = 1ULL << 39},
+             .space = space,
+             .thresholds = spaceThresholds(space, {}),
              .level = is_low ? SpaceLevel::kLow : SpaceLevel::kEnough}};
+  }
+  void setThresholdsChangedHandler(std::function<void()> changed) override {
+    thresholds_changed.set(std::move(changed));
   }
   std::atomic<int> looks{0};
   std::atomic<bool> is_low{false};
+  rt::Guarded<std::function<void()>> thresholds_changed;
 };
 
 class EventSourcesOnLinux : public ::testing::Test {
@@ -92,6 +99,19 @@ TEST_F(EventSourcesOnLinux, AMountMakesTheStreamLookAtOnce) {
   handled.wait();  // the next look of its own would be hours away
   EXPECT_EQ(event, (Dictionary{{"_Flags", 4}}));
   ASSERT_EQ(::umount2(directory_.path().c_str(), MNT_DETACH), 0);
+}
+
+TEST_F(EventSourcesOnLinux, ChangedThresholdsMakeTheStreamLookAtOnce) {
+  auto sources = make();
+  CountingSemaphore handled(0);
+  sources->setStreamHandler(kVolumeEventStream, global_,
+                            [&](const Dictionary&) { handled.signal(); });
+  ASSERT_TRUE(comesTrue([&] { return space_.looks >= 1; }));
+  space_.is_low = true;
+  space_.thresholds_changed.get()();
+  handled.wait();
+  sources.reset();
+  EXPECT_EQ(space_.thresholds_changed.get(), nullptr);  // nobody to tell any more
 }
 
 TEST_F(EventSourcesOnLinux, ReadinessGoesToTheServiceManager) {

@@ -31,6 +31,7 @@ class OneVolume : public Volumes {
     return volume != nullptr && *volume == "/data";
   }
   std::uint64_t volumeFreespace(const Value*) override { return free_bytes; }
+  void setLowSpaceSettings(const LowSpaceSettings&) override {}
 
   std::atomic<std::uint64_t> free_bytes = 1000;
 };
@@ -113,6 +114,7 @@ class RealDaemon {
       .services = services_,
       .openPreferencesSuite = [](const std::string&) { return nullptr; },
       .makeListener = [this](ipc::ServedInterface i) { return listen(std::move(i)); },
+      .after = [](std::uint64_t, const Task&) {},
       .createSpacekeepToken = [] { return Value("token"); }};
 
  public:

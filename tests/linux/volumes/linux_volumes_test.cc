@@ -127,6 +127,24 @@ TEST_F(Volumes, ARunOutOfInodesIsShort) {
   ::umount2(path.c_str(), MNT_DETACH);
 }
 
+TEST_F(Volumes, NewSettingsDecideWhoIsShortAndAreToldOnce) {
+  const std::string path = world_.mountFresh("tmpfs", "v", 100);
+  VolumeWorld::fill(path + "/file", 80 * kMiB);
+  int told = 0;
+  volumes_.setThresholdsChangedHandler([&] { ++told; });
+  EXPECT_FALSE(holds(volumes_.lowSpaceVolumes(), path));
+  volumes_.setLowSpaceSettings({.percent = 30});
+  EXPECT_TRUE(holds(volumes_.lowSpaceVolumes(), path));
+  volumes_.setLowSpaceSettings({.percent = 30});
+  EXPECT_EQ(told, 1);
+  volumes_.setLowSpaceSettings({.bytes = 10 * kMiB, .percent = 30});
+  EXPECT_FALSE(holds(volumes_.lowSpaceVolumes(), path));
+  EXPECT_EQ(told, 2);
+  volumes_.setThresholdsChangedHandler({});
+  volumes_.setLowSpaceSettings({});
+  EXPECT_EQ(told, 2);
+}
+
 TEST_F(Volumes, OnlyTheExactMountPointNamesAVolume) {
   const std::string path = world_.mountFresh("tmpfs", "v", 16);
   ASSERT_TRUE(volumes_.validateVolume(request(path)));

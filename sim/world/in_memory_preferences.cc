@@ -46,8 +46,7 @@ InMemoryPreferencesSuite::InMemoryPreferencesSuite(InMemoryDisk& disk, std::stri
     : disk_(disk), name_(std::move(name)), known_(disk.read(name_)) {}
 
 std::optional<std::string> InMemoryPreferencesSuite::synchronize() {
-  if (auto failure = disk_.synchronizeFailure()) return failure;
-  known_ = disk_.read(name_);
+  if (auto failure = refresh()) return failure;
   if (unwritten_.empty()) return std::nullopt;
   for (auto& [key, value] : unwritten_) {
     known_.erase(key);
@@ -55,6 +54,12 @@ std::optional<std::string> InMemoryPreferencesSuite::synchronize() {
   }
   unwritten_.clear();
   disk_.write(name_, known_);
+  return std::nullopt;
+}
+
+std::optional<std::string> InMemoryPreferencesSuite::refresh() {
+  if (auto failure = disk_.synchronizeFailure()) return failure;
+  known_ = disk_.read(name_);
   return std::nullopt;
 }
 
@@ -68,6 +73,10 @@ std::optional<Value> InMemoryPreferencesSuite::get(std::string_view key) {
 
 void InMemoryPreferencesSuite::set(std::string_view key, std::optional<Value> value) {
   unwritten_.insert_or_assign(std::string(key), std::move(value));
+}
+
+void InMemoryPreferencesSuite::discard(std::string_view key) {
+  if (const auto set = unwritten_.find(key); set != unwritten_.end()) unwritten_.erase(set);
 }
 
 }  // namespace spacekeep::sim

@@ -26,7 +26,7 @@ class InMemoryDisk {
   [[nodiscard]] std::uint64_t writes() const;
   /// From now on opening a suite fails, or works again.
   void refuseToOpen(bool refuse);
-  /// From now on synchronize() fails with this text; empty: works again.
+  /// From now on synchronize() and refresh() fail with this text; empty: works again.
   void failSynchronize(std::string reason);
   [[nodiscard]] bool refusesToOpen() const;
   [[nodiscard]] std::optional<std::string> synchronizeFailure() const;
@@ -45,8 +45,10 @@ class InMemoryPreferencesSuite final : public PreferencesSuite {
   InMemoryPreferencesSuite(InMemoryDisk& disk, std::string name);
 
   [[nodiscard]] std::optional<std::string> synchronize() override;
+  [[nodiscard]] std::optional<std::string> refresh() override;
   [[nodiscard]] std::optional<Value> get(std::string_view key) override;
   void set(std::string_view key, std::optional<Value> value) override;
+  void discard(std::string_view key) override;
 
  private:
   InMemoryDisk& disk_;

@@ -19,9 +19,14 @@ class PreferencesSuite {
   /// Writes out what was set since the last call, durably, and picks up what is on disk. Answers
   /// none on success, else what went wrong in words.
   [[nodiscard]] virtual std::optional<std::string> synchronize() = 0;
+  /// Picks up what is on disk and writes nothing: a read does not pay for a write that was put off.
+  /// Answers as synchronize().
+  [[nodiscard]] virtual std::optional<std::string> refresh() = 0;
   [[nodiscard]] virtual std::optional<Value> get(std::string_view key) = 0;
   /// Seen by get() at once, on disk after synchronize(). None removes the key.
   virtual void set(std::string_view key, std::optional<Value> value) = 0;
+  /// Forgets what was set for `key` and is not on disk yet, so that it never gets there.
+  virtual void discard(std::string_view key) = 0;
 };
 
 }  // namespace spacekeep

@@ -6,6 +6,7 @@
 
 #include "support/logging/log.h"
 #include "support/preferences/linux/suite_file.h"
+#include "support/queues/concurrent_queue.h"
 #include "support/values/plist.h"
 #include "support/values/text.h"
 
@@ -16,44 +17,6 @@ std::string listOf(const std::set<std::string>& keys) {
   Array array;
   for (const std::string& key : keys) array.push_back(key);
   return textOf(Value(std::move(array)));
-}
-
-int bindText(sqlite3_stmt* statement, int place, const std::string& text) {
-  return sqlite3_bind_text64(statement, place, text.data(), text.size(), SQLITE_TRANSIENT,
-                             SQLITE_UTF8);
-}
-
-int runToEnd(sqlite3_stmt* statement) {
-  const int code = sqlite3_step(statement);
-  return code == SQLITE_DONE ? SQLITE_OK : code;
-}
-
-int removeKey(sqlite3* database, const std::string& key) {
-  const Statement remove = prepare(database, "DELETE FROM preferences WHERE key = ?1");
-  if (!remove) return sqlite3_extended_errcode(database);
-  const int code = bindText(remove.get(), 1, key);
-  return code == SQLITE_OK ? runToEnd(remove.get()) : code;
-}
-
-int storeKey(sqlite3* database, const std::string& key, const std::vector<std::uint8_t>& bytes) {
-  const Statement store =
-      prepare(database, "INSERT OR REPLACE INTO preferences (key, value) VALUES (?1, ?2)");
-  if (!store) return sqlite3_extended_errcode(database);
-  int code = bindText(store.get(), 1, key);
-  if (code == SQLITE_OK) {
-    code = sqlite3_bind_blob64(store.get(), 2, bytes.data(), bytes.size(), SQLITE_TRANSIENT);
-  }
-  return code == SQLITE_OK ? runToEnd(store.get()) : code;
-}
-
-// In the first transaction and not when the file is opened, so that opening writes nothing.
-int makeTable(sqlite3* database) {
-  static const std::string sql =
-      "PRAGMA application_id = " + std::to_string(kSuiteApplicationId) +
-      "; PRAGMA user_version = " + std::to_string(kSuiteVersion) +
-      "; CREATE TABLE IF NOT EXISTS preferences"
-      " (key TEXT PRIMARY KEY NOT NULL, value BLOB NOT NULL) WITHOUT ROWID";
-  return execute(database, sql.c_str());
 }
 
 // A rollback journal that stays (no inode is needed for a commit once it is there), every commit
@@ -94,7 +57,9 @@ std::unique_ptr<SqliteSuite> SqliteSuite::open(const std::string& directory,
   std::unique_ptr<SqliteSuite> suite(
       new SqliteSuite(std::move(database), path, std::move(options)));
   Failure failure = suite->failure(configured);
-  if (failure.code == SQLITE_OK) failure = suite->loadIfChanged();
+  if (failure.code == SQLITE_OK) {
+    failure = suite->refreshLocked(suite->statements_.changeCounter());
+  }
   if (failure.code == SQLITE_OK) return suite;
   logProblem("%s the suite %@ cannot be opened: %@", "openPreferencesSuite", name, failure.reason);
   return nullptr;
@@ -110,7 +75,14 @@ void SqliteSuite::set(std::string_view key, std::optional<Value> value) {
   pending_.insert_or_assign(std::string(key), std::move(value));
 }
 
+void SqliteSuite::discard(std::string_view key) {
+  if (const auto set = pending_.find(key); set != pending_.end()) pending_.erase(set);
+}
+
 std::optional<std::string> SqliteSuite::synchronize() {
+  if (pending_.empty()) return refresh();
+  // The disk makes this thread wait, so it must not keep others from being served meanwhile.
+  const BlockingRegion region;
   std::set<std::string> given_up;
   Failure failure = commitPending(given_up);
   if ((failure.code & 0xff) == SQLITE_FULL && options_.make_room()) {
@@ -120,10 +92,25 @@ std::optional<std::string> SqliteSuite::synchronize() {
   if (failure.code != SQLITE_OK) {
     return path_ + " cannot be written, what was set is kept for the next try: " + failure.reason;
   }
-  failure = loadIfChanged();
-  if (failure.code != SQLITE_OK) return path_ + " cannot be read: " + failure.reason;
   if (given_up.empty()) return std::nullopt;
   return path_ + ": too deep or too large to be stored and given up: " + listOf(given_up);
+}
+
+std::optional<std::string> SqliteSuite::refresh() {
+  const auto counter = statements_.changeCounter();
+  if (counter && counter == change_counter_) return std::nullopt;
+  const BlockingRegion region;
+  const Failure failure = refreshLocked(counter);
+  if (failure.code == SQLITE_OK) return std::nullopt;
+  return path_ + " cannot be read: " + failure.reason;
+}
+
+// The counter was read before: what is committed while this looks moves it again and is seen the
+// next time.
+SqliteSuite::Failure SqliteSuite::refreshLocked(std::optional<std::uint32_t> counter) {
+  Failure failure = loadIfChanged();
+  change_counter_ = failure.code == SQLITE_OK ? counter : std::nullopt;
+  return failure;
 }
 
 SqliteSuite::Failure SqliteSuite::failure(int code) const {
@@ -131,34 +118,49 @@ SqliteSuite::Failure SqliteSuite::failure(int code) const {
 }
 
 SqliteSuite::Failure SqliteSuite::commitPending(std::set<std::string>& given_up) {
-  if (pending_.empty()) return {};
-  int code = execute(database_.get(), "BEGIN IMMEDIATE");
-  if (code != SQLITE_OK) return failure(code);
-  code = writePending(given_up);
-  if (code == SQLITE_OK) code = execute(database_.get(), "COMMIT");
-  if (code != SQLITE_OK) {
-    Failure what = failure(code);
-    // Some errors have rolled back already; the one that matters is kept above.
-    static_cast<void>(execute(database_.get(), "ROLLBACK"));
+  Failure what = failure(statements_.begin());
+  if (what.code == SQLITE_OK) what = writeAndCommit(given_up);
+  if (what.code != SQLITE_OK) {
+    statements_.rollback();
+    change_counter_.reset();
     return what;
   }
   keepCommitted(given_up);
   return {};
 }
 
+// What is on disk is picked up in the same transaction: nothing can come in between, and no second
+// look is needed after the commit.
+SqliteSuite::Failure SqliteSuite::writeAndCommit(std::set<std::string>& given_up) {
+  Failure what = loadIfChanged();
+  if (what.code != SQLITE_OK) return what;
+  const auto counter = statements_.changeCounter();
+  const int pages_before = statements_.pagesWritten();
+  int code = writePending(given_up);
+  if (code == SQLITE_OK) code = statements_.commit();
+  if (code != SQLITE_OK) return failure(code);
+  has_table_ = true;
+  // Not read from the file: by now it may be the next writer's. A commit that changes nothing writes
+  // nothing and leaves the counter alone.
+  const bool moved = statements_.pagesWritten() > pages_before;
+  change_counter_ = counter ? std::optional(*counter + (moved ? 1 : 0)) : std::nullopt;
+  return {};
+}
+
 int SqliteSuite::writePending(std::set<std::string>& given_up) {
-  int code = makeTable(database_.get());
+  // Not when the file is opened, so that opening writes nothing.
+  int code = has_table_ ? SQLITE_OK : statements_.makeTable();
   for (const auto& [key, value] : pending_) {
     if (code != SQLITE_OK) return code;
     if (!value) {
-      code = removeKey(database_.get(), key);
+      code = statements_.remove(key);
       continue;
     }
     const std::vector<std::uint8_t> bytes = binaryPlist(*value);
     if (bytes.empty()) {
       given_up.insert(key);
     } else {
-      code = storeKey(database_.get(), key, bytes);
+      code = statements_.store(key, bytes);
     }
   }
   return code;
@@ -176,11 +178,9 @@ void SqliteSuite::keepCommitted(const std::set<std::string>& given_up) {
   pending_.clear();
 }
 
-// The counter moves when another connection commits, not when this one does (pragma data_version).
 SqliteSuite::Failure SqliteSuite::loadIfChanged() {
-  int code = SQLITE_OK;
-  const std::int64_t version = queryInteger(database_.get(), "PRAGMA data_version", code);
-  if (code != SQLITE_ROW) return failure(code);
+  std::int64_t version = 0;
+  if (const int code = statements_.dataVersion(version); code != SQLITE_OK) return failure(code);
   if (data_version_ == version) return {};
   Failure result = load();
   if (result.code == SQLITE_OK) data_version_ = version;
@@ -199,6 +199,7 @@ SqliteSuite::Failure SqliteSuite::load() {
     for (; code == SQLITE_ROW; code = sqlite3_step(rows.get())) loadRow(rows.get(), loaded);
     if (code != SQLITE_DONE) return failure(code);
   }
+  has_table_ = tables > 0;
   stored_ = std::move(loaded);
   return {};
 }

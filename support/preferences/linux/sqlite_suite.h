@@ -13,6 +13,7 @@
 #include <string_view>
 
 #include "support/preferences/linux/sqlite.h"
+#include "support/preferences/linux/suite_statements.h"
 #include "support/preferences/preferences_suite.h"
 
 namespace spacekeep {
@@ -41,14 +42,20 @@ class SqliteSuite : public PreferencesSuite {
   /// A failed commit keeps what was set for the next call. A value that no property list can hold
   /// (see binaryPlist) is given up, and the answer names its key.
   [[nodiscard]] std::optional<std::string> synchronize() override;
+  /// Costs one small read while nobody else has changed the file.
+  [[nodiscard]] std::optional<std::string> refresh() override;
   [[nodiscard]] std::optional<Value> get(std::string_view key) override;
   void set(std::string_view key, std::optional<Value> value) override;
+  void discard(std::string_view key) override;
 
  private:
   using Pending = std::map<std::string, std::optional<Value>, std::less<>>;
 
   SqliteSuite(Database database, std::string path, SqliteSuiteOptions options)
-      : database_(std::move(database)), path_(std::move(path)), options_(std::move(options)) {}
+      : database_(std::move(database)),
+        path_(std::move(path)),
+        options_(std::move(options)),
+        statements_(database_.get()) {}
 
   struct Failure {
     int code = SQLITE_OK;
@@ -56,7 +63,9 @@ class SqliteSuite : public PreferencesSuite {
   };
 
   [[nodiscard]] Failure failure(int code) const;
+  Failure refreshLocked(std::optional<std::uint32_t> counter);
   Failure commitPending(std::set<std::string>& given_up);
+  Failure writeAndCommit(std::set<std::string>& given_up);
   int writePending(std::set<std::string>& given_up);
   void keepCommitted(const std::set<std::string>& given_up);
   Failure loadIfChanged();
@@ -66,9 +75,13 @@ class SqliteSuite : public PreferencesSuite {
   const Database database_;
   const std::string path_;
   const SqliteSuiteOptions options_;
+  SuiteStatements statements_;
   std::map<std::string, Value, std::less<>> stored_;  // what is in the file
   Pending pending_;                                   // set and not yet committed
-  std::optional<std::int64_t> data_version_;          // of the file when stored_ was read
+  bool has_table_ = false;                            // the file has, when stored_ was read
+  // Of the file when stored_ was read, in two measures; see SuiteStatements.
+  std::optional<std::int64_t> data_version_;
+  std::optional<std::uint32_t> change_counter_;
 };
 
 }  // namespace spacekeep

@@ -7,6 +7,7 @@
 
 #include <csignal>
 
+#include "support/queues/borrowed_thread.h"
 #include "tests/helpers/log_capture.h"
 #include "tests/helpers/temporary_directory.h"
 
@@ -162,6 +163,113 @@ TEST(SqliteSuite, WhatAnotherProcessWroteIsPickedUpBySynchronize) {
   EXPECT_EQ(suite->synchronize(), std::nullopt);
   EXPECT_EQ(suite->get("mine"), Value(4));
   EXPECT_EQ(suite->get("theirs"), Value(5));
+}
+
+TEST(SqliteSuite, RefreshPicksUpWhatAnotherProcessWroteAndWritesNothingOfItsOwn) {
+  const TemporaryDirectory directory;
+  store(directory, "k", 1);
+  auto suite = open(directory);
+  suite->set("mine", 4);
+  store(directory, "k", 2);
+  EXPECT_EQ(suite->refresh(), std::nullopt);
+  EXPECT_EQ(suite->get("k"), Value(2));
+  EXPECT_EQ(suite->get("mine"), Value(4));
+  EXPECT_EQ(fetch(directory, "mine"), std::nullopt);
+  EXPECT_EQ(suite->synchronize(), std::nullopt);
+  EXPECT_EQ(fetch(directory, "mine"), Value(4));
+}
+
+// The counter that says "nothing changed" moves by one with every commit, one's own included.
+TEST(SqliteSuite, ForeignCommitsAreSeenHoweverTheyMixWithOwnOnes) {
+  const TemporaryDirectory directory;
+  auto suite = open(directory);
+  auto other = open(directory);
+  for (int round = 0; round < 20; ++round) {
+    suite->set("mine", round);
+    EXPECT_EQ(suite->synchronize(), std::nullopt);
+    if (round % 2 == 0) {  // changes nothing, and must not be counted as if it had
+      suite->set("mine", round);
+      suite->set("never there", std::nullopt);
+      EXPECT_EQ(suite->synchronize(), std::nullopt);
+    }
+    other->set("theirs", round);
+    EXPECT_EQ(other->synchronize(), std::nullopt);
+    EXPECT_EQ(other->get("mine"), Value(round));
+    EXPECT_EQ(suite->refresh(), std::nullopt);
+    EXPECT_EQ(suite->get("theirs"), Value(round));
+  }
+}
+
+TEST(SqliteSuite, AFileTurnedToAWriteAheadLogIsStillFollowed) {
+  const TemporaryDirectory directory;
+  store(directory, "k", 1);
+  auto suite = open(directory);
+  const Database other = outside(fileOf(directory));
+  ASSERT_EQ(execute(other.get(), "PRAGMA journal_mode = WAL"), SQLITE_OK);
+  for (int round = 0; round < 3; ++round) {
+    ASSERT_EQ(execute(other.get(),
+                      "UPDATE preferences SET value = CAST('<plist version=\"1.0\">"
+                      "<string>w</string></plist>' AS BLOB)"),
+              SQLITE_OK);
+    EXPECT_EQ(suite->refresh(), std::nullopt);
+    EXPECT_EQ(suite->get("k"), Value("w"));
+    suite->set("k", round);
+    EXPECT_EQ(suite->synchronize(), std::nullopt);
+  }
+}
+
+TEST(SqliteSuite, RefreshOfAFileThatSomebodyHoldsSaysSo) {
+  const TemporaryDirectory directory;
+  store(directory, "k", 1);
+  auto suite = open(directory, {.busy_timeout_ms = 1});
+  store(directory, "k", 2);
+  const Database holder = outside(fileOf(directory));
+  ASSERT_EQ(execute(holder.get(), "BEGIN EXCLUSIVE"), SQLITE_OK);
+  EXPECT_EQ(suite->refresh(), fileOf(directory) + " cannot be read: database is locked (SQLite 5)");
+  EXPECT_EQ(suite->get("k"), Value(1));
+  ASSERT_EQ(execute(holder.get(), "ROLLBACK"), SQLITE_OK);
+  EXPECT_EQ(suite->refresh(), std::nullopt);
+  EXPECT_EQ(suite->get("k"), Value(2));
+}
+
+TEST(SqliteSuite, WhatWasDiscardedAfterAFailedCommitNeverComesUpAgain) {
+  const TemporaryDirectory directory;
+  store(directory, "k", 1);
+  auto suite = open(directory, {.busy_timeout_ms = 1});
+  const Database holder = outside(fileOf(directory));
+  ASSERT_EQ(execute(holder.get(), "BEGIN EXCLUSIVE"), SQLITE_OK);
+  suite->set("k", 2);
+  suite->set("other", 3);
+  ASSERT_NE(suite->synchronize(), std::nullopt);
+  suite->discard("k");
+  suite->discard("never set");
+  EXPECT_EQ(suite->get("k"), Value(1));
+  EXPECT_EQ(suite->get("other"), Value(3));
+  ASSERT_EQ(execute(holder.get(), "ROLLBACK"), SQLITE_OK);
+  EXPECT_EQ(suite->synchronize(), std::nullopt);
+  EXPECT_EQ(suite->get("k"), Value(1));
+  EXPECT_EQ(fetch(directory, "k"), Value(1));
+  EXPECT_EQ(fetch(directory, "other"), Value(3));
+}
+
+TEST(SqliteSuite, OnlyACommitCountsAsWaiting) {
+  const TemporaryDirectory directory;
+  auto suite = open(directory);
+  std::size_t given_up = 0;
+  std::size_t after_reads = 99;
+  {
+    ConcurrentQueue queue({});
+    BorrowedThread thread(queue, [&] { ++given_up; });
+    thread.run([&] {
+      EXPECT_EQ(suite->refresh(), std::nullopt);
+      EXPECT_EQ(suite->synchronize(), std::nullopt);
+      after_reads = given_up;
+      suite->set("k", 1);
+      EXPECT_EQ(suite->synchronize(), std::nullopt);
+    });
+  }
+  EXPECT_EQ(after_reads, 0u);
+  EXPECT_EQ(given_up, 1u);
 }
 
 TEST(SqliteSuite, AFailedCommitKeepsWhatWasSetAndSaysSo) {

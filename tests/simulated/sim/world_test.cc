@@ -134,6 +134,34 @@ TEST(InMemoryPreferences, AFailedSynchronizeKeepsWhatIsUnwritten) {
   EXPECT_EQ(disk.read("s").size(), 1U);
 }
 
+TEST(InMemoryPreferences, RefreshReadsAndWritesNothing) {
+  InMemoryDisk disk;
+  InMemoryPreferencesSuite suite(disk, "s");
+  suite.set("mine", Value(1));
+  disk.write("s", {{"theirs", Value(2)}});
+  EXPECT_EQ(suite.get("theirs"), std::nullopt);
+  EXPECT_EQ(suite.refresh(), std::nullopt);
+  EXPECT_EQ(suite.get("theirs"), Value(2));
+  EXPECT_EQ(suite.get("mine"), Value(1));
+  EXPECT_EQ(disk.writes(), 1U);
+  disk.failSynchronize("no disk");
+  EXPECT_EQ(suite.refresh(), "no disk");
+}
+
+TEST(InMemoryPreferences, WhatWasDiscardedNeverGetsToTheDisk) {
+  InMemoryDisk disk;
+  disk.write("s", {{"key", Value("old")}});
+  InMemoryPreferencesSuite suite(disk, "s");
+  suite.set("key", Value("new"));
+  suite.set("other", Value(1));
+  suite.discard("key");
+  suite.discard("never set");
+  EXPECT_EQ(suite.get("key"), Value("old"));
+  EXPECT_EQ(suite.synchronize(), std::nullopt);
+  const InMemoryDisk::Contents expected{{"key", Value("old")}, {"other", Value(1)}};
+  EXPECT_EQ(disk.read("s"), expected);
+}
+
 TEST(RecordingStatistics, KeepsObservationsAndSums) {
   Trace trace;
   RecordingStatistics statistics(trace);

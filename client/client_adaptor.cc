@@ -3,14 +3,15 @@
 #include <string_view>
 #include <utility>
 
-#include "support/logging/log.h"
-
 namespace spacekeep {
 namespace {
 
 using ipc::Arguments;
 using ipc::Responder;
 using ipc::ServeMode;
+
+/// The name of the error that answers a state change which is not on the disk.
+constexpr const char* kNotStoredError = "com.quorvel.Spacekeep.Error.NotStored";
 
 constexpr std::size_t kPurgeLaneWidth = 64;
 constexpr std::size_t kQueryLaneWidth = 64;
@@ -48,10 +49,29 @@ void cancelPurge(SpacekeepClientProtocol& exported, Arguments in, Responder resp
                              takingNothing(std::move(responder)));
 }
 
-// The operations behind these members are still to come; the caller is told so.
-void notSupportedYet(SpacekeepClientProtocol&, Arguments, Responder responder) {
-  logProblem("%s request is not supported yet", "clientAdaptor");
-  responder.fail({"org.freedesktop.DBus.Error.NotSupported", "not supported yet"});
+void purgeableSpace(SpacekeepClientProtocol& exported, Arguments in, Responder responder) {
+  exported.clientPurgeableSpace(std::get<Dictionary>(std::move(in[0])),
+                                takingDictionary(std::move(responder)));
+}
+
+void itemizedPurgeableSpace(SpacekeepClientProtocol& exported, Arguments in, Responder responder) {
+  exported.clientItemizedPurgeableSpace(std::get<Dictionary>(std::move(in[0])),
+                                        takingDictionary(std::move(responder)));
+}
+
+void setState(SpacekeepClientProtocol& exported, Arguments in, Responder responder) {
+  exported.clientSetState(std::get<ipc::OptionalValue>(std::move(in[0])),
+                          std::get<std::string>(std::move(in[1])), takingNothing(responder),
+                          [responder](std::string why) {
+                            responder.fail({kNotStoredError, std::move(why)});
+                          });
+}
+
+void getState(SpacekeepClientProtocol& exported, Arguments in, Responder responder) {
+  exported.clientGetState(std::get<std::string>(std::move(in[0])),
+                          [responder = std::move(responder)](ipc::OptionalValue value) {
+                            responder.reply({std::move(value)});
+                          });
 }
 
 using Serve = void (*)(SpacekeepClientProtocol&, Arguments, Responder);
@@ -67,13 +87,13 @@ struct Route {
 
 constexpr Route kRoutes[] = {
     {"clientCheckin", ServeMode::kInOrder, "", 1, false, checkin},
-    {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, notSupportedYet},
+    {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, purgeableSpace},
     {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false,
-     notSupportedYet},
+     itemizedPurgeableSpace},
     {"clientPurge", ServeMode::kLane, "purge", kPurgeLaneWidth, false, purge},
     {"clientCancelPurge", ServeMode::kLane, "cancel", kCancelLaneWidth, true, cancelPurge},
-    {"clientSetState", ServeMode::kInOrder, "", 1, true, notSupportedYet},
-    {"clientGetState", ServeMode::kInOrder, "", 1, true, notSupportedYet},
+    {"clientSetState", ServeMode::kInOrder, "", 1, true, setState},
+    {"clientGetState", ServeMode::kInOrder, "", 1, true, getState},
 };
 
 void serveCall(const Route& route, const std::weak_ptr<SpacekeepClientProtocol>& weak, Arguments in,

@@ -21,6 +21,8 @@ class SpacekeepClientProtocol {
   using CheckinReply = std::function<void(ipc::OptionalDictionary, ipc::OptionalString error)>;
   using EmptyReply = std::function<void()>;
   using ValueReply = std::function<void(ipc::OptionalValue)>;
+  /// Gets, in words, why a value could not be stored.
+  using StoreFailure = std::function<void(std::string why)>;
 
   virtual ~SpacekeepClientProtocol() = default;
 
@@ -34,8 +36,10 @@ class SpacekeepClientProtocol {
   virtual void clientPurge(Dictionary info, DictionaryReply reply) = 0;
   /// `reply` may be empty.
   virtual void clientCancelPurge(Dictionary info, EmptyReply reply) = 0;
-  /// No value removes the key.
-  virtual void clientSetState(ipc::OptionalValue value, std::string key, EmptyReply reply) = 0;
+  /// No value removes the key. Exactly one of the two runs: `reply` once the change is on the disk,
+  /// `failed` when it could not be brought there; the state is then as it was.
+  virtual void clientSetState(ipc::OptionalValue value, std::string key, EmptyReply reply,
+                              StoreFailure failed) = 0;
   virtual void clientGetState(std::string key, ValueReply reply) = 0;
 };
 

@@ -3,7 +3,9 @@
 
 #include "daemon/spacekeep.h"
 #include "operations/info_keys.h"
+#include "operations/periodic_operation.h"
 #include "purge/purge_operation.h"
+#include "purgeable/purgeable_operation.h"
 #include "support/logging/log.h"
 #include "support/queues/waiting.h"
 #include "support/runtime/guarded.h"
@@ -36,6 +38,26 @@ class OutcomeSlot {
 
 }  // namespace
 
+std::optional<Dictionary> Spacekeep::totalAvailable(const Value& info) {
+  struct Waiting {
+    TaskGroup group;
+    std::optional<Dictionary> outcome;  // written by the task, read after it has ended
+  };
+  const auto waiting = std::make_shared<Waiting>();
+  waiting->group.enter();
+  purgeable_queue_->async([self = shared_from_this(), waiting, info] {
+    const auto operation = makeOperation<SpacekeepPurgeableOperation>(self->platform_, info,
+                                                                      *self->copyServices(), self);
+    if (operation) {
+      operation->startOperation(
+          [waiting](const Dictionary& outcome) { waiting->outcome = outcome; });
+    }
+    waiting->group.leave();
+  });
+  waiting->group.wait();
+  return std::move(waiting->outcome);
+}
+
 std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletion callback) {
   struct Waiting {
     TaskGroup group;
@@ -44,6 +66,7 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
   const auto waiting = std::make_shared<Waiting>();
   const Value* asked_token = info.dictionary() ? info.dictionary()->find(keys::kToken) : nullptr;
   const auto operation = makeOperation<SpacekeepPurgeOperation>(platform_, info, *copyServices());
+  if (operation) operation->setFinishEarlyByDefault(finish_early_);
   const Value token = asked_token ? *asked_token : platform_.createSpacekeepToken();
 
   waiting->group.enter();
@@ -82,8 +105,14 @@ std::uint64_t Spacekeep::requestsInFlight(const Array& collection) const {
   return count;
 }
 
+// On the calling thread: the daily pass visits one volume after the other.
 void Spacekeep::performPeriodicsWithInfo(const Value& info) {
-  logProblem("%s periodic work is not supported yet: %@", "performPeriodicsWithInfo", info);
+  const auto operation =
+      makeOperation<SpacekeepPeriodicOperation>(platform_, info, *copyServices());
+  if (!operation) return;
+  operation->startOperation([](const Dictionary& outcome) {
+    logTrace("%s result: %@", "performPeriodicsWithInfo", outcome);
+  });
 }
 
 }  // namespace spacekeep

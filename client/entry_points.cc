@@ -7,13 +7,6 @@
 #include "support/logging/log.h"
 
 namespace spacekeep {
-namespace {
-
-// Until the work behind an entry point exists, its callers get no answer from here; the adaptor
-// tells them before it comes to this.
-void logNotSupportedYet(const char* operation) { logProblem("%s is not supported yet", operation); }
-
-}  // namespace
 
 void Spacekeep::clientPurge(Dictionary info, DictionaryReply reply) {
   std::optional<Dictionary> answer;
@@ -31,18 +24,40 @@ void Spacekeep::clientCancelPurge(Dictionary info, EmptyReply reply) {
   if (reply) reply();
 }
 
-void Spacekeep::clientPurgeableSpace(Dictionary, DictionaryReply) {
-  logNotSupportedYet("clientPurgeableSpace");
+// Plain and itemized differ only in the right that they take: both answers name every service.
+void Spacekeep::clientPurgeableSpace(Dictionary info, DictionaryReply reply) {
+  answerQuery(std::move(info), entitlements::kPurgeable, "clientPurgeableSpace", std::move(reply));
 }
 
-void Spacekeep::clientItemizedPurgeableSpace(Dictionary, DictionaryReply) {
-  logNotSupportedYet("clientItemizedPurgeableSpace");
+void Spacekeep::clientItemizedPurgeableSpace(Dictionary info, DictionaryReply reply) {
+  answerQuery(std::move(info), entitlements::kItemizedPurgeable, "clientItemizedPurgeableSpace",
+              std::move(reply));
 }
 
-void Spacekeep::clientSetState(ipc::OptionalValue, std::string, EmptyReply) {
-  logNotSupportedYet("clientSetState");
+void Spacekeep::answerQuery(const Value& info, std::string_view entitlement, const char* operation,
+                            DictionaryReply reply) {
+  std::optional<Dictionary> answer;
+  if (connectionIsEntitled(entitlement)) {
+    answer = totalAvailable(info);
+  } else {
+    logProblem("%s Connection is not entitled!", operation);
+  }
+  platform_.global.async([reply = std::move(reply), answer = std::move(answer)]() mutable {
+    reply(std::move(answer));
+  });
 }
 
-void Spacekeep::clientGetState(std::string, ValueReply) { logNotSupportedYet("clientGetState"); }
+void Spacekeep::clientSetState(ipc::OptionalValue value, std::string key, EmptyReply reply,
+                               StoreFailure failed) {
+  defaults_queue_->async([self = shared_from_this(), value = std::move(value), key = std::move(key),
+                          reply = std::move(reply), failed = std::move(failed)]() mutable {
+    self->_clientSetState(std::move(value), key, reply, failed);
+  });
+}
+
+void Spacekeep::clientGetState(std::string key, ValueReply reply) {
+  defaults_queue_->async([self = shared_from_this(), key = std::move(key),
+                          reply = std::move(reply)] { self->_clientGetState(key, reply); });
+}
 
 }  // namespace spacekeep

@@ -37,6 +37,7 @@ void Spacekeep::init() {
   user_defaults_ = platform_.openPreferencesSuite(kSuiteName);
   if (!user_defaults_) logProblem("%s Unable to initialize user defaults!", "init");
   createQueues();
+  applyStoredSettings();
   scanDescriptors(directories);
   startListener();
 }
@@ -51,6 +52,12 @@ void Spacekeep::createQueues() {
   // The label does not follow the role: whoever watches the queues knows this one as "cancel".
   collection_queue_ = SerialQueue::create("com.quorvel.spacekeep_cancel", global);
   defaults_queue_ = SerialQueue::create("com.quorvel.spacekeep_defaults", global);
+}
+
+void Spacekeep::applyStoredSettings() {
+  const auto stored = user_defaults_ ? user_defaults_->get(keys::kUserDefaults) : std::nullopt;
+  const Dictionary* state = stored ? stored->dictionary() : nullptr;
+  applySettings(state == nullptr ? Dictionary() : *state);
 }
 
 // Runs on the creating thread before any queue is in use.

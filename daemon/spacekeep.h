@@ -8,6 +8,7 @@
 // and here.
 #pragma once
 
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -16,9 +17,11 @@
 #include <set>
 #include <string>
 #include <string_view>
+#include <variant>
 #include <vector>
 
 #include "client/client_protocol.h"
+#include "client/kept_record.h"
 #include "client/purge_operations.h"
 #include "registry/service.h"
 #include "registry/service_protocol.h"
@@ -33,6 +36,12 @@ using SpacekeepListener = ipc::Listener;
 /// The most services that the registry takes by check-in: each holds a descriptor and a place in
 /// every snapshot.
 inline constexpr std::size_t kMaxRegisteredServices = 4096;
+
+/// What the daemon reads from its own state: nothing, a value, or a record.
+using StateObject = std::variant<std::monostate, Value, std::shared_ptr<SpacekeepRecentInfo>>;
+
+/// How late the daemon's own records reach the disk: many answers make one write.
+inline constexpr std::uint64_t kLateWriteDelayNs = 5'000'000'000;
 
 class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from_this<Spacekeep> {
  private:
@@ -101,10 +110,27 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   void clientItemizedPurgeableSpace(Dictionary info, DictionaryReply reply) override;
   void clientPurge(Dictionary info, DictionaryReply reply) override;
   void clientCancelPurge(Dictionary info, EmptyReply reply) override;
-  void clientSetState(ipc::OptionalValue value, std::string key, EmptyReply reply) override;
+  void clientSetState(ipc::OptionalValue value, std::string key, EmptyReply reply,
+                      StoreFailure failed) override;
   void clientGetState(std::string key, ValueReply reply) override;
 
+  // Client state. Only on defaults_queue(); each has called its reply when it returns.
+  /// On the disk before `reply`. A change that cannot be stored is taken back and told to `failed`,
+  /// in the absence of which `reply` runs all the same.
+  void _clientSetState(ipc::OptionalValue value, const std::string& key, const EmptyReply& reply,
+                       const StoreFailure& failed = nullptr);
+  /// `key` is a value of any kind; none but a string finds anything.
+  void _clientGetState(const Value& key, const ValueReply& reply);
+  /// For the daemon's own records: seen by every reader at once, on the disk within
+  /// kLateWriteDelayNs. What a crash may cost of them is asked for again.
+  void clientSetStateSync(StateObject value, const std::string& key);
+  /// A byte string is answered as the record it is the archive of. The record is the store's own:
+  /// who changes it stores it again within the same task.
+  [[nodiscard]] StateObject clientGetStateSync(const std::string& key);
+
   // Dispatch. Each blocks until the operation has ended.
+  /// The outcome of a query, none when the request was refused.
+  std::optional<Dictionary> totalAvailable(const Value& info);
   /// `callback` (may be empty) gets every outcome that the operation reports; the answer is the
   /// last of them, none when the request was refused.
   std::optional<Dictionary> purge(const Value& info, OperationCompletion callback);
@@ -121,6 +147,7 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
 
   void init();
   void createQueues();
+  void applyStoredSettings();
   void scanDescriptors(const std::vector<std::string>& directories);
   void startListener();
   [[nodiscard]] bool connectionIsEntitled(std::string_view entitlement) const;
@@ -130,6 +157,25 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   void deliverNotification(const ServiceMap& recipients, const std::string& name,
                            const ipc::OptionalValue& value) const;
   void cancelPurgeWithToken(const Value* token);
+  void answerQuery(const Value& info, std::string_view entitlement, const char* operation,
+                   DictionaryReply reply);
+
+  // Client state, on defaults_queue_.
+  [[nodiscard]] std::optional<Value> persistentState();
+  [[nodiscard]] Dictionary mutableState();
+  [[nodiscard]] std::optional<Value> answerFor(const std::string& key);
+  [[nodiscard]] std::optional<Value> valueIn(const Dictionary& state, const std::string& key) const;
+  void changeState(ipc::OptionalValue value, const std::string& key);
+  [[nodiscard]] std::optional<std::string> writeState(ipc::OptionalValue value,
+                                                      const std::string& key);
+  void actOnChange(const std::string& key, const ipc::OptionalValue& value);
+  void keepRecord(std::shared_ptr<SpacekeepRecentInfo> record, const std::string& key);
+  [[nodiscard]] StateObject recordOf(const std::string& key, Value value);
+  void archiveKeptRecord();
+  void writeSoon();
+  void writeNow();
+  /// Also on the creating thread, before any queue is in use.
+  void applySettings(const Dictionary& state);
 
   Platform& platform_;
   // In this order, so that they are released in the reverse one.
@@ -143,6 +189,9 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   std::shared_ptr<SerialQueue> daemons_queue_;
   std::string root_path_;
   std::unique_ptr<PreferencesSuite> user_defaults_;  // confined to defaults_queue_
+  KeptRecord kept_record_;                           // confined to defaults_queue_
+  bool late_write_is_due_ = false;                   // confined to defaults_queue_
+  std::atomic<bool> finish_early_ = false;           // of purges that do not say
   ServiceMap services_;                              // confined to collection_queue_
   std::optional<Array> operations_;
   std::set<std::string> daemons_;  // confined to daemons_queue_

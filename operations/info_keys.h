@@ -27,8 +27,17 @@ inline constexpr const char* kOperationCancelled = "SPACEKEEP_OPERATION_CANCELLE
 inline constexpr const char* kReportingServices = "SPACEKEEP_REPORTING_SERVICES";  ///< ID to bytes
 inline constexpr const char* kServicesInFlight = "SPACEKEEP_SERVICES_INFLIGHT";    ///< array of IDs
 
+// The answer of a query, and of a service to one.
+inline constexpr const char* kTotalAvailable = "SPACEKEEP_TOTAL_AVAILABLE";  ///< bytes
+inline constexpr const char* kOptOut = "SPACEKEEP_OPT_OUT";  ///< any value: do not ask again soon
+inline constexpr const char* kServicesToQuery = "SPACEKEEP_SERVICES_TO_QUERY";  ///< array of IDs
+inline constexpr const char* kServicesToCount = "SPACEKEEP_SERVICES_TO_COUNT";  ///< ID to bytes
+
 // Client state.
-inline constexpr const char* kCacheEnabled = "SPACEKEEP_CACHE_ENABLED";  ///< boolean
+/// The whole state in the suite; as a key of the state, all of it with the defaults.
+inline constexpr const char* kUserDefaults = "SPACEKEEP_USER_DEFAULTS";
+inline constexpr const char* kCacheEnabled = "SPACEKEEP_CACHE_ENABLED";               ///< boolean
+inline constexpr const char* kRecentServiceStats = "SPACEKEEP_RECENT_SERVICE_STATS";  ///< bytes
 
 // Service descriptors and check-in.
 inline constexpr const char* kServiceId = "SPACEKEEP_ID";

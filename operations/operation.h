@@ -11,6 +11,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <utility>
 
 #include "registry/service.h"
 #include "support/platform.h"
@@ -98,11 +99,11 @@ class SpacekeepOperation : public OperationInterface,
 /// "SPACEKEEP_URGENCY_LIMIT". 3 unless the value found is a number from 1 to 4.
 [[nodiscard]] std::int32_t urgencyLimitOf(const Dictionary& info);
 
-/// Null when the request is refused.
-template <class Operation>
+/// Null when the request is refused. `rest` goes to the operation's constructor.
+template <class Operation, class... Rest>
 [[nodiscard]] std::shared_ptr<Operation> makeOperation(Platform& platform, const Value& info,
-                                                       ServiceMap services) {
-  auto operation = std::make_shared<Operation>(platform);
+                                                       ServiceMap services, Rest... rest) {
+  auto operation = std::make_shared<Operation>(platform, std::move(rest)...);
   if (!operation->initWithInfo(info, std::move(services))) return nullptr;
   return operation;
 }

@@ -1,8 +1,13 @@
 // "SPACEKEEP_FINISH_EARLY": a purge that asks for it ends as soon as the amount is reached and no
 // service is at work for it.
+#include "operations/info_keys.h"
 #include "purge/purge_operation.h"
 
 namespace spacekeep {
+
+void SpacekeepPurgeOperation::setFinishEarlyByDefault(bool finish_early) {
+  if (!info().contains(keys::kFinishEarly)) finish_early_ = finish_early;
+}
 
 // A service whose share was 0 stands in flight without having been asked: there is no answer to
 // wait for.

@@ -44,6 +44,9 @@ class SpacekeepPurgeOperation : public SpacekeepOperation {
   void reportPercentageForAmountRequested(std::uint64_t requested_bytes, std::uint64_t purged_bytes,
                                           const std::string& identifier) const;
 
+  /// What holds when the request does not name "SPACEKEEP_FINISH_EARLY". Before the start.
+  void setFinishEarlyByDefault(bool finish_early);
+
   [[nodiscard]] bool cancel() const { return cancel_; }
   void setCancel(bool cancel) { cancel_ = cancel; }
   /// Bytes that the client asked to free.
@@ -118,7 +121,7 @@ class SpacekeepPurgeOperation : public SpacekeepOperation {
   rt::Guarded<std::shared_ptr<CountingSemaphore>> purge_semaphore_;
   /// Services that stand in flight although their share was 0 and nothing was sent to them.
   std::atomic<std::uint64_t> unasked_in_flight_ = 0;
-  bool finish_early_ = false;  // constant after construction
+  std::atomic<bool> finish_early_ = false;  // constant once the purge has started
 };
 
 }  // namespace spacekeep

@@ -5,6 +5,7 @@
 // fills it with the Linux implementations of this folder, the simulation with its world.
 #pragma once
 
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <string>
@@ -32,6 +33,9 @@ struct Platform {
   std::function<std::unique_ptr<PreferencesSuite>(const std::string& name)> openPreferencesSuite;
   /// A listener on the daemon's socket that serves `interface` once it is resumed.
   std::function<std::unique_ptr<ipc::Listener>(ipc::ServedInterface interface)> makeListener;
+  /// Runs the task on the global queue once so much time has passed; not at all when the process
+  /// ends before.
+  std::function<void(std::uint64_t delay_ns, Task task)> after;
   /// A fresh token, unique within the process. It compares by value.
   std::function<Value()> createSpacekeepToken;
 };

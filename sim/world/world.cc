@@ -57,6 +57,7 @@ Platform World::makePlatform() {
           [this](ipc::ServedInterface interface) {
             return listener_.makeListener(std::move(interface));
           },
+      .after = [this](std::uint64_t delay_ns, Task task) { after(delay_ns, std::move(task)); },
       .createSpacekeepToken =
           [this] {
             const std::scoped_lock lock(mutex_);

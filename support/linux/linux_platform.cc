@@ -81,6 +81,12 @@ Platform LinuxPlatform::makePlatform() {
           .openPreferencesSuite = [this](const std::string& name) { return openSuite(name); },
           .makeListener =
               [this](ipc::ServedInterface interface) { return makeListener(std::move(interface)); },
+          .after =
+              [this](std::uint64_t delay_ns, Task task) {
+                loop_->postAfter(delay_ns, [this, task = std::move(task)]() mutable {
+                  global_.async(std::move(task));
+                });
+              },
           .createSpacekeepToken = [] { return Value(randomToken()); }};
 }
 

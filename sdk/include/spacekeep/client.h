@@ -91,13 +91,13 @@ class Client {
   [[nodiscard]] Reply purge(const PurgeRequest& request, Deadline deadline = {});
   /// Any of the dictionary operations with a request made by hand.
   [[nodiscard]] Reply call(Operation operation, const Dictionary& info, Deadline deadline = {});
-  /// How much the services could free: `info` names "SPACEKEEP_VOLUME". Until the daemon offers
-  /// queries, kNotSupported.
+  /// How much the services could free: `info` names "SPACEKEEP_VOLUME". Both answers hold
+  /// "SPACEKEEP_TOTAL_AVAILABLE" and the amount of each service under its ID.
   [[nodiscard]] Reply purgeableSpace(const Dictionary& info, Deadline deadline = {});
   [[nodiscard]] Reply itemizedPurgeableSpace(const Dictionary& info, Deadline deadline = {});
   /// The daemon accepts and answers every cancel request; it does not stop a purge that runs.
   [[nodiscard]] Status cancel(const Value& token, Deadline deadline = {});
-  /// No value removes the key. Until the daemon offers client state, kNotSupported.
+  /// No value removes the key. When this answers without an error, the change is on the disk.
   [[nodiscard]] Status setState(const std::string& key, std::optional<Value> value,
                                 Deadline deadline = {});
   [[nodiscard]] StateReply state(const std::string& key, Deadline deadline = {});

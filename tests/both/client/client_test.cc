@@ -144,28 +144,6 @@ TEST(ClientCancelPurge, DoesNotStopTheRunningPurgeOfThatTokenAndIsAnswered) {
   });
 }
 
-TEST(ClientAdaptor, SaysOfWhatIsStillToComeThatItIsNotSupported) {
-  inEverySchedule(kSchedules, [] {
-    DaemonWorld world;
-    world.start();
-    const auto client =
-        world.world.client("client", {"PURGEABLE_ENTITLEMENT", "ITEMIZED_PURGEABLE_ENTITLEMENT"});
-    const Dictionary info{{keys::kVolume, "/"}};
-    const std::string key = "SPACEKEEP_CACHE_ENABLED";
-    const std::pair<const char*, ipc::Arguments> calls[] = {
-        {"clientPurgeableSpace", {info}},
-        {"clientItemizedPurgeableSpace", {info}},
-        {"clientSetState", {ipc::OptionalValue(Value(true)), key}},
-        {"clientGetState", {key}}};
-    for (const auto& [member, arguments] : calls) {
-      const auto call = world.world.call(client, member, arguments);
-      call->wait();
-      EXPECT_EQ(call->state(), CallState::kFailed) << member;
-      EXPECT_NE(call->error().find("not supported yet"), std::string::npos) << call->error();
-    }
-  });
-}
-
 TEST(ClientAdaptor, ServesEveryDescribedMethodInOrderAndInItsLane) {
   const ipc::ServedInterface served = makeClientAdaptor({});
   ASSERT_EQ(served.description, &spacekeepClientInterface());

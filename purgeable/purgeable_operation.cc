@@ -1,0 +1,130 @@
+#include "purgeable/purgeable_operation.h"
+
+#include <limits>
+#include <utility>
+
+#include "operations/info_keys.h"
+#include "support/logging/log.h"
+#include "support/queues/waiting.h"
+#include "support/runtime/runtime.h"
+#include "support/timebase.h"
+
+namespace spacekeep {
+namespace {
+
+constexpr std::uint64_t kFirstWaitNs = 10'000'000'000;
+constexpr double kNsPerSecond = 1'000'000'000.0;
+constexpr std::int64_t kOptOutPeriodNs = 120'000'000'000;
+
+// Tells apart the places that complain about a number.
+constexpr int kAmountCheck = 163;
+
+ServiceMap queriedServices(const ServiceMap& services) {
+  ServiceMap queried;
+  for (const auto& [service_id, service] : services) {
+    if (service->doesPurge() && !service->doNotQuery()) {
+      queried.emplace_hint(queried.end(), service_id, service);
+    }
+  }
+  return queried;
+}
+
+// Sums stay at the ends of their range instead of wrapping round.
+std::int64_t saturatingSum(std::int64_t one, std::int64_t other) {
+  using Limits = std::numeric_limits<std::int64_t>;
+  std::int64_t sum = 0;
+  if (!__builtin_add_overflow(one, other, &sum)) return sum;
+  return other < 0 ? Limits::min() : Limits::max();
+}
+
+std::int64_t totalOf(const Dictionary& amounts) {
+  std::int64_t total = 0;
+  for (const auto& [service_id, amount] : amounts) {
+    if (const auto bytes = amount.asSigned()) {
+      total = saturatingSum(total, *bytes);
+    } else {
+      logProblem("%s %d %@ num is not a number: %@", "startOperation", kAmountCheck, service_id,
+                 amount);
+    }
+  }
+  return total;
+}
+
+Value listOf(const std::set<std::string>& service_ids) {
+  return Array(service_ids.begin(), service_ids.end());
+}
+
+}  // namespace
+
+bool SpacekeepPurgeableOperation::initWithInfo(const Value& request, ServiceMap snapshot) {
+  if (!SpacekeepOperation::initWithInfo(request, std::move(snapshot))) return false;
+  setServices(queriedServices(services()));
+  return true;
+}
+
+SpacekeepPurgeableOperation::Self SpacekeepPurgeableOperation::self() {
+  return std::static_pointer_cast<SpacekeepPurgeableOperation>(shared_from_this());
+}
+
+void SpacekeepPurgeableOperation::startOperation(OperationCompletion completion) {
+  const Dictionary working_copy = info();
+  const std::uint64_t start_ticks = rt::ticks();
+  logTrace("%s ENTRY, info: %@", "startOperation", working_copy);
+  const Dictionary first_pass = cachedInfo(working_copy);
+  askServices(working_copy, *first_pass.find(keys::kServicesToQuery)->array());
+  if (!nobodyInFlight()) waitForServices();
+
+  const Dictionary second_pass = cachedInfo(working_copy);
+  logTrace("%s cachedInfo (2nd pass): %@", "startOperation", second_pass);
+  const Dictionary result = resultFrom(*second_pass.find(keys::kServicesToCount)->dictionary());
+  logTrace("%s Still in flight: %@", "startOperation", listOf(copyInFlight()));
+  logTrace("%s elapsed time: %f result: %@", "startOperation",
+           elapsedNs(start_ticks, rt::ticks()) / kNsPerSecond, result);
+  completion(result);
+}
+
+// Whoever is asked is in flight before its task starts, so nobody is missed by the wait that
+// follows.
+void SpacekeepPurgeableOperation::askServices(const Dictionary& working_copy,
+                                              const Array& service_ids) {
+  if (service_ids.empty()) return;
+  const auto request = std::make_shared<const Dictionary>(working_copy);
+  const auto group = std::make_shared<TaskGroup>();
+  for (const Value& value : service_ids) {
+    const std::string& service_id = *value.string();
+    if (optOutService(service_id, false)) continue;
+    if (!updateInFlight(service_id, true)) continue;
+    // The task holds the group: it may outlast the wait.
+    group->async(platform().global,
+                 [self = self(), group, request, service = serviceFor(service_id)] {
+                   self->queryService(service, request);
+                 });
+  }
+  static_cast<void>(group->waitForNs(kFirstWaitNs));
+}
+
+// What is no number stays in the itemized entries; only the total goes without it.
+Dictionary SpacekeepPurgeableOperation::resultFrom(const Dictionary& amounts) const {
+  Dictionary result = amounts;
+  result.set(keys::kTotalAvailable, totalOf(amounts));
+  result.set(keys::kVolume, *volume());
+  return result;
+}
+
+bool SpacekeepPurgeableOperation::optOutService(const std::string& service_id, bool add) {
+  bool opted_out = false;
+  collection_queue()->sync([&] {
+    const std::int64_t now_ns = rt::wallClockNs();
+    if (add) {
+      opt_outs_.insert_or_assign(service_id, Date{now_ns});
+      return;
+    }
+    const auto found = opt_outs_.find(service_id);
+    if (found == opt_outs_.end()) return;
+    opted_out = now_ns - found->second.unix_ns < kOptOutPeriodNs;
+    if (!opted_out) opt_outs_.erase(found);
+  });
+  return opted_out;
+}
+
+}  // namespace spacekeep

@@ -184,6 +184,8 @@ Output Sandbox::run(const std::vector<std::string>& command) const {
 Process Sandbox::startDaemon() const {
   write("/etc/spacekeep/log.plist",
         "<plist version=\"1.0\"><dict><key>LogLevel</key><integer>5</integer></dict></plist>");
+  // What an earlier daemon wrote must not speak for this one.
+  fs::remove(outside("/tmp/daemon.log"));
   Process daemon = spawn({"/programs/daemon/spacekeepd"}, "daemon.log");
   if (!waitForText("/tmp/daemon.log", "open for business")) {
     throw std::runtime_error("the daemon did not start: " + daemonLog());

@@ -16,7 +16,12 @@ void RecordingStatistics::addDistributionStat(double value, std::string_view dom
 
 void RecordingStatistics::addReportStat(std::string_view domain,
                                         std::optional<std::string_view> key, std::int64_t count) {
-  if (!key) return;
+  if (!key) {
+    const std::scoped_lock lock(mutex_);
+    foreign_domain_ = foreign_domain_ || domain != kStatisticsDomain;
+    ++reports_without_key_;
+    return;
+  }
   trace_.add(StatisticSent{StatisticSent::Kind::kReport, std::string(domain), std::string(*key), 0,
                            count});
   const std::scoped_lock lock(mutex_);
@@ -30,6 +35,11 @@ std::vector<double> RecordingStatistics::distribution(std::string_view key) cons
   const std::scoped_lock lock(mutex_);
   const auto found = distributions_.find(key);
   return found == distributions_.end() ? std::vector<double>() : found->second;
+}
+
+std::uint64_t RecordingStatistics::timesReportedWithoutKey() const {
+  const std::scoped_lock lock(mutex_);
+  return reports_without_key_;
 }
 
 std::int64_t RecordingStatistics::reported(std::string_view key) const {

@@ -30,6 +30,7 @@ class RecordingStatistics final : public Statistics {
   /// The sum of the counts, 0 when the key was never sent.
   [[nodiscard]] std::int64_t reported(std::string_view key) const;
   [[nodiscard]] std::uint64_t timesReported(std::string_view key) const;
+  [[nodiscard]] std::uint64_t timesReportedWithoutKey() const;
   /// All keys of both kinds, sorted, each once.
   [[nodiscard]] std::vector<std::string> keys() const;
   /// True when every statistic so far named the daemon's domain.
@@ -46,6 +47,7 @@ class RecordingStatistics final : public Statistics {
   // Protected by mutex_.
   std::map<std::string, std::vector<double>, std::less<>> distributions_;
   std::map<std::string, Report, std::less<>> reports_;
+  std::uint64_t reports_without_key_ = 0;
   bool foreign_domain_ = false;
 };
 

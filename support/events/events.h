@@ -52,6 +52,12 @@ class Activity {
   [[nodiscard]] virtual ActivityState state() const = 0;
 };
 
+/// Where an event of the file-system stream has its flags: a number, absent for none.
+inline constexpr const char* kEventFlagsKey = "_Flags";
+/// The flags of low space, by the names that volume queries have for them.
+inline constexpr std::uint64_t kVqLowDisk = 0x4;
+inline constexpr std::uint64_t kVqVeryLowDisk = 0x200;
+
 class EventSources {
  public:
   using ActivityHandler = std::function<void(Activity&)>;

@@ -72,7 +72,7 @@ void LowSpaceStream::send(std::uint64_t flags) {
     handling_ = true;
   }
   queue_.async([this, flags] {
-    handler_(Dictionary{{"_Flags", flags}});
+    handler_(Dictionary{{kEventFlagsKey, flags}});
     const std::scoped_lock lock(mutex_);
     handling_ = false;
     changed_.notifyAll();

@@ -24,9 +24,9 @@ std::uint64_t flagOf(SpaceLevel level) {
     case SpaceLevel::kEnough:
       return 0;
     case SpaceLevel::kLow:
-      return kLowSpaceFlag;
+      return kVqLowDisk;
     case SpaceLevel::kVeryLow:
-      return kVeryLowSpaceFlag;
+      return kVqVeryLowDisk;
   }
   return 0;
 }

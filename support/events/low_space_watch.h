@@ -10,13 +10,10 @@
 #include <utility>
 #include <vector>
 
+#include "support/events/events.h"
 #include "support/volumes/space_source.h"
 
 namespace spacekeep {
-
-/// Bits of an event's "_Flags".
-inline constexpr std::uint64_t kLowSpaceFlag = 0x4;
-inline constexpr std::uint64_t kVeryLowSpaceFlag = 0x200;
 
 struct WatchLimits {
   std::uint64_t shortest_pause_ns = 1'000'000'000;

@@ -112,7 +112,7 @@ TEST(LowSpaceWatch, ALowVolumeIsReportedAtOnceAndAgainWithGrowingPauses) {
   for (std::uint64_t second = 0; second < 15000; second += 10) {
     const WatchStep step = watch.look(volume(0, SpaceLevel::kVeryLow), second * kSecond);
     if (step.flags == 0) continue;
-    EXPECT_EQ(step.flags, kVeryLowSpaceFlag);
+    EXPECT_EQ(step.flags, kVqVeryLowDisk);
     reported_at_s.push_back(second);
   }
   EXPECT_EQ(reported_at_s,

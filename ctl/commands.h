@@ -1,29 +1,17 @@
 // Thread safety: each function is for one thread; they share nothing.
 //
-// What the tool does once its command line is understood. Results go to standard output, progress
-// and complaints to standard error.
+// What the tool does once its command line is understood. Results go to standard output, progress,
+// remarks and complaints to standard error.
 #pragma once
 
 #include <cstdint>
 #include <optional>
 #include <string>
 
+#include "ctl/complaint.h"
+#include "ctl/state_value.h"
+
 namespace spacekeep::ctl {
-
-/// How the tool ends. Scripts rely on these numbers; the man page lists them.
-enum class ExitCode : int {
-  kDone = 0,         ///< purge: the amount was reached; cancel: the daemon took the request
-  kNotReached = 1,   ///< the purge ended with less
-  kUsage = 2,        ///< the command line is wrong; nothing was asked
-  kUnreachable = 3,  ///< nobody listens at the socket
-  kRefused = 4,      ///< the daemon refused: no right, or no such volume
-  kFailed = 5,       ///< the connection or the daemon failed meanwhile
-};
-
-struct CommonOptions {
-  std::string socket_path;
-  bool json = false;
-};
 
 struct PurgeOptions {
   std::string volume;
@@ -34,7 +22,31 @@ struct PurgeOptions {
   bool wait_all = false;
 };
 
+struct QueryOptions {
+  std::string volume;
+  std::optional<int> urgency;
+  bool itemized = false;
+};
+
+struct StateOptions {
+  std::string key;
+  std::string value;
+  ValueType type = ValueType::kGuessed;
+  bool force = false;
+  bool names = false;  ///< list: only the keys
+};
+
+struct VolumesOptions {
+  bool names = false;  ///< only the mount points
+};
+
 [[nodiscard]] ExitCode runPurge(const CommonOptions& common, const PurgeOptions& options);
 [[nodiscard]] ExitCode runCancel(const CommonOptions& common, const std::string& token);
+[[nodiscard]] ExitCode runQuery(const CommonOptions& common, const QueryOptions& options);
+[[nodiscard]] ExitCode runStateGet(const CommonOptions& common, const StateOptions& options);
+[[nodiscard]] ExitCode runStateSet(const CommonOptions& common, const StateOptions& options);
+[[nodiscard]] ExitCode runStateUnset(const CommonOptions& common, const StateOptions& options);
+[[nodiscard]] ExitCode runStateList(const CommonOptions& common, const StateOptions& options);
+[[nodiscard]] ExitCode runVolumes(const CommonOptions& common, const VolumesOptions& options);
 
 }  // namespace spacekeep::ctl

@@ -1,23 +1,30 @@
 #include "ctl/progress_display.h"
 
 #include <fmt/core.h>
-#include <sys/statvfs.h>
 
 #include <utility>
 
+#include "ctl/text_layout.h"
+#include "ctl/volume_space.h"
+
 namespace spacekeep::ctl {
 
+namespace {
+
 std::optional<std::uint64_t> freeBytesOf(const std::string& path) {
-  struct statvfs numbers = {};
-  if (statvfs(path.c_str(), &numbers) != 0) return std::nullopt;
-  return std::uint64_t{numbers.f_bavail} * numbers.f_frsize;
+  const auto space = measuredSpaceOf(path);
+  return space ? std::optional(space->free_bytes) : std::nullopt;
 }
 
-ProgressDisplay::ProgressDisplay(Kind kind, PurgePlan plan, std::string volume, std::FILE* stream)
+}  // namespace
+
+ProgressDisplay::ProgressDisplay(Kind kind, PurgePlan plan, std::string volume, std::FILE* stream,
+                                 std::size_t columns)
     : kind_(kind),
       plan_(plan),
       volume_(std::move(volume)),
       stream_(stream),
+      columns_(columns),
       free_at_start_(freeBytesOf(volume_)) {}
 
 ProgressDisplay::~ProgressDisplay() {
@@ -33,7 +40,7 @@ void ProgressDisplay::show(double elapsed_seconds) {
   }
   const std::string text = progressText(plan_, elapsed_seconds, gained);
   if (kind_ == Kind::kTerminal) {
-    fmt::print(stream_, "\r\x1b[K{}", text);
+    fmt::print(stream_, "\r\x1b[K{}", shortened(text, columns_ - 1));
     std::fflush(stream_);
   } else {
     showLine(text, elapsed_seconds);

@@ -4,6 +4,7 @@
 // per urgency elsewhere.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <cstdio>
 #include <optional>
@@ -13,14 +14,13 @@
 
 namespace spacekeep::ctl {
 
-/// Bytes that an unprivileged writer can still use on the file system of `path` (statvfs(3)).
-[[nodiscard]] std::optional<std::uint64_t> freeBytesOf(const std::string& path);
-
 class ProgressDisplay {
  public:
   enum class Kind { kNone, kTerminal, kLines };
 
-  ProgressDisplay(Kind kind, PurgePlan plan, std::string volume, std::FILE* stream);
+  /// `columns`: a line on a terminal is cut to fit, since it could not renew itself otherwise.
+  ProgressDisplay(Kind kind, PurgePlan plan, std::string volume, std::FILE* stream,
+                  std::size_t columns);
   /// Takes the terminal's line away.
   ~ProgressDisplay();
   ProgressDisplay(const ProgressDisplay&) = delete;
@@ -35,6 +35,7 @@ class ProgressDisplay {
   const PurgePlan plan_;
   const std::string volume_;
   std::FILE* const stream_;
+  const std::size_t columns_;
   const std::optional<std::uint64_t> free_at_start_;
   std::optional<int> last_step_;  ///< what the last line was written for
 };

@@ -155,7 +155,7 @@ struct UsageCase {
 
 TEST_F(CommandTest, AWrongCommandLineExitsWithTwoAndSaysWhatIsWrong) {
   const UsageCase cases[] = {
-      {"", "A command is required: purge or cancel"},
+      {"", "A command is required: purge, query, state, volumes or cancel"},
       {"eat", "eat"},
       {"purge", "VOLUME"},
       {"purge /data", "AMOUNT"},
@@ -195,7 +195,7 @@ TEST_F(CommandTest, ACancelRequestIsAcceptedAndTheToolDoesNotPromiseMore) {
 TEST_F(CommandTest, HelpAndVersionExitWithZeroAndNeedNoDaemon) {
   const Finished help = ctl("--help");
   EXPECT_EQ(help.exit_code, 0);
-  EXPECT_THAT(help.out, AllOf(HasSubstr("purge"), HasSubstr("cancel"), HasSubstr("Exit status")));
+  EXPECT_THAT(help.out, AllOf(HasSubstr("purge"), HasSubstr("cancel"), HasSubstr("Exit status: 0 done")));
   const Finished purge_help = ctl("purge --help");
   EXPECT_EQ(purge_help.exit_code, 0);
   EXPECT_THAT(purge_help.out, AllOf(HasSubstr("--wait-all"), HasSubstr("1.5GiB")));

@@ -61,7 +61,7 @@ TEST(Progress, AwayFromATerminalThereIsOneLinePerUrgencyAndOneForTheRest) {
   {
     ProgressDisplay display(ProgressDisplay::Kind::kLines,
                             {.asked_bytes = 1024, .urgency_limit = 2, .timeout_seconds = {}},
-                            "/nowhere/at/all", file.get());
+                            "/nowhere/at/all", file.get(), 80);
     for (const double elapsed : {0.0, 0.2, 1.9, 2.0, 2.2, 5.0, 6.0, 7.0}) display.show(elapsed);
   }
   std::rewind(file.get());
@@ -79,7 +79,7 @@ TEST(Progress, OnATerminalTheLineRenewsItselfAndGoesAway) {
   {
     ProgressDisplay display(ProgressDisplay::Kind::kTerminal,
                             {.asked_bytes = 1024, .urgency_limit = 1, .timeout_seconds = {}},
-                            "/nowhere/at/all", file.get());
+                            "/nowhere/at/all", file.get(), 80);
     display.show(0);
     display.show(0.5);
   }
@@ -90,6 +90,22 @@ TEST(Progress, OnATerminalTheLineRenewsItselfAndGoesAway) {
             "\r\x1b[K1.0 KiB asked for, urgency 1 of 1, at most 2 s left"
             "\r\x1b[K1.0 KiB asked for, urgency 1 of 1, at most 2 s left"
             "\r\x1b[K");
+}
+
+TEST(Progress, OnANarrowTerminalTheLineIsCutSoThatItCanRenewItself) {
+  const std::unique_ptr<std::FILE, int (*)(std::FILE*)> file(std::tmpfile(), &std::fclose);
+  ASSERT_NE(file, nullptr);
+  {
+    ProgressDisplay display(ProgressDisplay::Kind::kTerminal,
+                            {.asked_bytes = 1024, .urgency_limit = 1, .timeout_seconds = {}},
+                            "/nowhere/at/all", file.get(), 40);
+    display.show(0);
+  }
+  std::rewind(file.get());
+  char text[1024] = {};
+  const auto size = std::fread(text, 1, sizeof text - 1, file.get());
+  EXPECT_EQ(std::string(text, size),
+            "\r\x1b[K1.0 KiB asked for,..., at most 2 s left\r\x1b[K");
 }
 
 }  // namespace

@@ -1,0 +1,17 @@
+// Thread safety: for one thread at a time.
+//
+// A call to the daemon during which a person sees that something goes on.
+#pragma once
+
+#include <spacekeep/client.h>
+
+#include <functional>
+
+namespace spacekeep::ctl {
+
+/// Starts a call with the handler it is given, and until the reply is there calls `show` five times
+/// a second, from this thread, with the seconds since the start.
+[[nodiscard]] sdk::Reply callShowing(const std::function<void(sdk::Client::ReplyHandler)>& start,
+                                     const std::function<void(double elapsed_seconds)>& show);
+
+}  // namespace spacekeep::ctl

@@ -63,12 +63,12 @@ std::optional<std::string> InMemoryPreferencesSuite::refresh() {
   return std::nullopt;
 }
 
-std::optional<Value> InMemoryPreferencesSuite::get(std::string_view key) {
+const Value* InMemoryPreferencesSuite::find(std::string_view key) const {
   if (const auto changed = unwritten_.find(key); changed != unwritten_.end()) {
-    return changed->second;
+    return changed->second ? &*changed->second : nullptr;
   }
   const auto found = known_.find(key);
-  return found == known_.end() ? std::nullopt : std::optional(found->second);
+  return found == known_.end() ? nullptr : &found->second;
 }
 
 void InMemoryPreferencesSuite::set(std::string_view key, std::optional<Value> value) {

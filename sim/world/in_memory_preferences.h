@@ -46,7 +46,7 @@ class InMemoryPreferencesSuite final : public PreferencesSuite {
 
   [[nodiscard]] std::optional<std::string> synchronize() override;
   [[nodiscard]] std::optional<std::string> refresh() override;
-  [[nodiscard]] std::optional<Value> get(std::string_view key) override;
+  [[nodiscard]] const Value* find(std::string_view key) const override;
   void set(std::string_view key, std::optional<Value> value) override;
   void discard(std::string_view key) override;
 

@@ -9,7 +9,7 @@
 #include <utility>
 
 #include "support/files/linux/atomic_file.h"
-#include "support/ipc/arguments.h"
+#include "support/files/linux/descriptor.h"
 
 namespace spacekeep {
 
@@ -20,21 +20,27 @@ bool ReserveFile::take() {
   const std::scoped_lock lock(mutex_);
   if (isThere()) return true;
   if (!hasRoom()) return false;
-  const int fd = ::open(path_.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
-  if (fd < 0) return false;
-  const ipc::Descriptor file(fd);
-  if (::posix_fallocate(fd, 0, static_cast<off_t>(bytes_)) == 0) return true;
+  const FileDescriptor file(
+      ::open(path_.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+  if (!file.valid()) return false;
+  if (::posix_fallocate(file.get(), 0, static_cast<off_t>(bytes_)) == 0) return true;
   ::unlink(path_.c_str());
   return false;
 }
 
+// Emptied before it is removed: what a removed file held comes back some time later on file systems
+// that do that part in the background.
 bool ReserveFile::giveBack() {
   const std::scoped_lock lock(mutex_);
-  const ipc::Descriptor directory(
-      ::open(directoryOf(path_).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  {
+    const FileDescriptor file(::open(path_.c_str(), O_WRONLY | O_CLOEXEC | O_NOFOLLOW));
+    if (file.valid() && ::ftruncate(file.get(), 0) == 0) ::fsync(file.get());
+  }
   if (::unlink(path_.c_str()) < 0) return false;
   // Some file systems give the blocks out again only after the deletion is on the disk.
-  if (directory.fd() >= 0) ::syncfs(directory.fd());
+  const FileDescriptor directory(
+      ::open(directoryOf(path_).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (directory.valid()) ::syncfs(directory.get());
   return true;
 }
 

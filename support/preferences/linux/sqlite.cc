@@ -1,5 +1,7 @@
 #include "support/preferences/linux/sqlite.h"
 
+#include <cerrno>
+
 namespace spacekeep {
 
 std::string sqliteText(sqlite3* database, int code) {
@@ -26,6 +28,15 @@ std::int64_t queryInteger(sqlite3* database, const char* sql, int& code) {
 bool meansDamage(int code) {
   const int primary = code & 0xff;
   return primary == SQLITE_CORRUPT || primary == SQLITE_NOTADB;
+}
+
+// A write without room has a code of its own; making a file or making it durable has not.
+bool meansNoRoom(sqlite3* database, int code) {
+  const int primary = code & 0xff;
+  if (primary == SQLITE_FULL) return true;
+  if (primary != SQLITE_CANTOPEN && primary != SQLITE_IOERR) return false;
+  const int system = sqlite3_system_errno(database);
+  return system == ENOSPC || system == EDQUOT;
 }
 
 }  // namespace spacekeep

@@ -36,4 +36,7 @@ using Statement = std::unique_ptr<sqlite3_stmt, FinalizeStatement>;
 /// The file's content is not what SQLite writes, as opposed to: cannot be reached just now.
 [[nodiscard]] bool meansDamage(int code);
 
+/// No block, inode or quota is left for what was to be written. To be asked right after the error.
+[[nodiscard]] bool meansNoRoom(sqlite3* database, int code);
+
 }  // namespace spacekeep

@@ -20,11 +20,12 @@ std::string listOf(const std::set<std::string>& keys) {
 }
 
 // A rollback journal that stays (no inode is needed for a commit once it is there), every commit
-// through to the disk before it returns.
+// through to the disk before it returns, and nothing left to read of what was removed.
 int configure(sqlite3* database, const SqliteSuiteOptions& options) {
   sqlite3_busy_timeout(database, options.busy_timeout_ms);
   const std::string sql =
       "PRAGMA journal_mode = PERSIST; PRAGMA synchronous = EXTRA; PRAGMA temp_store = MEMORY;"
+      "PRAGMA secure_delete = ON; PRAGMA journal_size_limit = -1;"
       "PRAGMA trusted_schema = OFF; PRAGMA max_page_count = " +
       std::to_string(options.max_pages);
   return execute(database, sql.c_str());
@@ -60,15 +61,20 @@ std::unique_ptr<SqliteSuite> SqliteSuite::open(const std::string& directory,
   if (failure.code == SQLITE_OK) {
     failure = suite->refreshLocked(suite->statements_.changeCounter());
   }
-  if (failure.code == SQLITE_OK) return suite;
+  if (failure.code == SQLITE_OK) {
+    suite->prepareFile();
+    return suite;
+  }
   logProblem("%s the suite %@ cannot be opened: %@", "openPreferencesSuite", name, failure.reason);
   return nullptr;
 }
 
-std::optional<Value> SqliteSuite::get(std::string_view key) {
-  if (const auto set = pending_.find(key); set != pending_.end()) return set->second;
+const Value* SqliteSuite::find(std::string_view key) const {
+  if (const auto set = pending_.find(key); set != pending_.end()) {
+    return set->second ? &*set->second : nullptr;
+  }
   const auto found = stored_.find(key);
-  return found == stored_.end() ? std::nullopt : std::optional(found->second);
+  return found == stored_.end() ? nullptr : &found->second;
 }
 
 void SqliteSuite::set(std::string_view key, std::optional<Value> value) {
@@ -85,13 +91,18 @@ std::optional<std::string> SqliteSuite::synchronize() {
   const BlockingRegion region;
   std::set<std::string> given_up;
   Failure failure = commitPending(given_up);
-  if ((failure.code & 0xff) == SQLITE_FULL && options_.make_room()) {
+  auto wish = SuiteHeadroom::Wish::kIfThereIsRoom;
+  if (failure.no_room && options_.make_room()) {
     given_up.clear();
     failure = commitPending(given_up);
+    // The room is there now, and others are after it.
+    wish = SuiteHeadroom::Wish::kAtAnyCost;
   }
   if (failure.code != SQLITE_OK) {
-    return path_ + " cannot be written, what was set is kept for the next try: " + failure.reason;
+    return path_ + " cannot be written, what was set is kept for the next try: " + failure.reason +
+           (failure.no_room ? "; space has to be freed on its volume" : "");
   }
+  headroom_.growIfLow(wish);
   if (given_up.empty()) return std::nullopt;
   return path_ + ": too deep or too large to be stored and given up: " + listOf(given_up);
 }
@@ -114,7 +125,24 @@ SqliteSuite::Failure SqliteSuite::refreshLocked(std::optional<std::uint32_t> cou
 }
 
 SqliteSuite::Failure SqliteSuite::failure(int code) const {
-  return code == SQLITE_OK ? Failure{} : Failure{code, sqliteText(database_.get(), code)};
+  if (code == SQLITE_OK) return {};
+  return {code, sqliteText(database_.get(), code), meansNoRoom(database_.get(), code)};
+}
+
+// While there is room: a fresh file on a full volume is made by its first commit instead, once room
+// was made.
+void SqliteSuite::prepareFile() {
+  if (!has_table_) {
+    int code = statements_.begin();
+    if (code == SQLITE_OK) code = statements_.makeTable();
+    if (code == SQLITE_OK) code = statements_.commit();
+    if (code != SQLITE_OK) return statements_.rollback();
+    has_table_ = true;
+  }
+  headroom_.look();
+  headroom_.growIfLow(SuiteHeadroom::Wish::kIfThereIsRoom);
+  // Its commits are this connection's own; that is all there is to find.
+  static_cast<void>(refreshLocked(statements_.changeCounter()));
 }
 
 SqliteSuite::Failure SqliteSuite::commitPending(std::set<std::string>& given_up) {
@@ -137,7 +165,10 @@ SqliteSuite::Failure SqliteSuite::writeAndCommit(std::set<std::string>& given_up
   const auto counter = statements_.changeCounter();
   const int pages_before = statements_.pagesWritten();
   int code = writePending(given_up);
-  if (code == SQLITE_OK) code = statements_.commit();
+  if (code == SQLITE_OK) {
+    headroom_.look();
+    code = statements_.commit();
+  }
   if (code != SQLITE_OK) return failure(code);
   has_table_ = true;
   // Not read from the file: by now it may be the next writer's. A commit that changes nothing writes
@@ -148,7 +179,6 @@ SqliteSuite::Failure SqliteSuite::writeAndCommit(std::set<std::string>& given_up
 }
 
 int SqliteSuite::writePending(std::set<std::string>& given_up) {
-  // Not when the file is opened, so that opening writes nothing.
   int code = has_table_ ? SQLITE_OK : statements_.makeTable();
   for (const auto& [key, value] : pending_) {
     if (code != SQLITE_OK) return code;

@@ -13,6 +13,7 @@
 #include <string_view>
 
 #include "support/preferences/linux/sqlite.h"
+#include "support/preferences/linux/suite_headroom.h"
 #include "support/preferences/linux/suite_statements.h"
 #include "support/preferences/preferences_suite.h"
 
@@ -44,7 +45,7 @@ class SqliteSuite : public PreferencesSuite {
   [[nodiscard]] std::optional<std::string> synchronize() override;
   /// Costs one small read while nobody else has changed the file.
   [[nodiscard]] std::optional<std::string> refresh() override;
-  [[nodiscard]] std::optional<Value> get(std::string_view key) override;
+  [[nodiscard]] const Value* find(std::string_view key) const override;
   void set(std::string_view key, std::optional<Value> value) override;
   void discard(std::string_view key) override;
 
@@ -55,14 +56,17 @@ class SqliteSuite : public PreferencesSuite {
       : database_(std::move(database)),
         path_(std::move(path)),
         options_(std::move(options)),
-        statements_(database_.get()) {}
+        statements_(database_.get()),
+        headroom_(database_.get(), path_, options_.max_pages) {}
 
   struct Failure {
     int code = SQLITE_OK;
     std::string reason;
+    bool no_room = false;
   };
 
   [[nodiscard]] Failure failure(int code) const;
+  void prepareFile();
   Failure refreshLocked(std::optional<std::uint32_t> counter);
   Failure commitPending(std::set<std::string>& given_up);
   Failure writeAndCommit(std::set<std::string>& given_up);
@@ -76,6 +80,7 @@ class SqliteSuite : public PreferencesSuite {
   const std::string path_;
   const SqliteSuiteOptions options_;
   SuiteStatements statements_;
+  SuiteHeadroom headroom_;
   std::map<std::string, Value, std::less<>> stored_;  // what is in the file
   Pending pending_;                                   // set and not yet committed
   bool has_table_ = false;                            // the file has, when stored_ was read

@@ -1,7 +1,11 @@
 #include "support/preferences/linux/suite_file.h"
 
 #include <fcntl.h>
+#include <linux/fs.h>
+#include <linux/magic.h>
+#include <sys/ioctl.h>
 #include <sys/stat.h>
+#include <sys/vfs.h>
 
 #include <cstdio>
 #include <optional>
@@ -30,6 +34,21 @@ Problem makeDirectories(const std::string& directory) {
     return directory + " cannot be made: " + errorText(errno);
   }
   return syncDirectory(above);
+}
+
+// Where a file system writes changes to new blocks first, it is asked to change what is made in this
+// directory in place: a change to the state must not need a free block. Elsewhere nothing to do, and
+// where it is refused the state works all the same, as long as there are blocks.
+void keepInPlace(const std::string& directory) {
+  const FileDescriptor opened(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  struct statfs where {};
+  if (!opened.valid() || fstatfs(opened.get(), &where) != 0 || where.f_type != BTRFS_SUPER_MAGIC) {
+    return;
+  }
+  int flags = 0;
+  if (ioctl(opened.get(), FS_IOC_GETFLAGS, &flags) != 0 || (flags & FS_NOCOW_FL) != 0) return;
+  flags |= FS_NOCOW_FL;
+  static_cast<void>(ioctl(opened.get(), FS_IOC_SETFLAGS, &flags));
 }
 
 // There afterwards, regular, with mode 0600: state may tell what a person does with the device.
@@ -149,6 +168,7 @@ std::variant<Database, SuiteFileError> openSuiteFile(const std::string& director
                                                      const std::string& name) {
   if (!isSafeSuiteName(name)) return SuiteFileError{"its name is no safe file name"};
   if (Problem problem = makeDirectories(directory)) return SuiteFileError{*problem};
+  keepInPlace(directory);
   const std::string path = directory + "/" + name + ".sqlite";
   for (int attempt = 0; attempt < 2; ++attempt) {
     if (Problem problem = lockDownFile(path)) return SuiteFileError{*problem};

@@ -142,7 +142,7 @@ TEST_F(LinuxPlatformInADirectory, KeepsStateOnAFullVolumeByGivingBackItsReserve)
     ASSERT_TRUE(fs::exists(paths_.state_directory + "/reserve"));
     fillUp(paths_.state_directory);
     ASSERT_EQ(available(paths_.state_directory), 0U);
-    suite->set("KEY", Value(std::string(50'000, 'v')));
+    suite->set("KEY", Value(std::string(500'000, 'v')));
     EXPECT_EQ(suite->synchronize(), std::nullopt);
     EXPECT_FALSE(fs::exists(paths_.state_directory + "/reserve"));
   }
@@ -150,7 +150,7 @@ TEST_F(LinuxPlatformInADirectory, KeepsStateOnAFullVolumeByGivingBackItsReserve)
     LinuxPlatform linux_platform(noMethods(), paths_);
     const auto suite = linux_platform.platform().openPreferencesSuite("com.quorvel.spacekeep");
     ASSERT_NE(suite, nullptr);
-    EXPECT_EQ(suite->get("KEY"), Value(std::string(50'000, 'v')));
+    EXPECT_EQ(suite->get("KEY"), Value(std::string(500'000, 'v')));
     EXPECT_FALSE(fs::exists(paths_.state_directory + "/reserve")) << "there is no room for it";
   }
   ASSERT_EQ(::umount2(paths_.state_directory.c_str(), MNT_DETACH), 0);

@@ -1,56 +1,71 @@
-// The floor: a peer that serves the same members as the daemon with nothing but sd-bus and one
-// event loop. Usage: bench-bare-peer SOCKET
-#include <systemd/sd-event.h>
+// The floor: a peer that answers the same members as the daemon, with the same content, with
+// nothing but sd-bus and one event loop. Usage: bench-bare-peer SOCKET [QUERY_ANSWERS]
+#include <string>
+#include <utility>
+#include <vector>
 
-#include <cerrno>
-
-#include "bench/sd_bus_handles.h"
+#include "bench/bare_server.h"
 
 namespace {
+
+constexpr const char* kStateValue = "twenty bytes of text";
+constexpr int kUsers = 5;
+
+// What a query is answered with: service IDs as bench-many-services makes them, and amounts.
+std::vector<std::pair<std::string, uint64_t>> answers;
 
 int answerEmpty(sd_bus_message* message, void*, sd_bus_error*) {
   bench::check(sd_bus_message_skip(message, "a{sv}"), "skip");
   return sd_bus_reply_method_return(message, nullptr);
 }
 
+int answerState(sd_bus_message* message, void*, sd_bus_error*) {
+  const char* key = nullptr;
+  bench::check(sd_bus_message_read(message, "s", &key), "key");
+  return sd_bus_reply_method_return(message, "av", 1, "s", kStateValue);
+}
+
+void writeAnswers(sd_bus_message* reply, const char* volume) {
+  int64_t total = 0;
+  bench::check(sd_bus_message_open_container(reply, 'a', "a{sv}"), "open");
+  bench::check(sd_bus_message_open_container(reply, 'a', "{sv}"), "open");
+  for (const auto& [id, amount] : answers) {
+    bench::check(sd_bus_message_append(reply, "{sv}", id.c_str(), "t", amount), "append");
+    total += static_cast<int64_t>(amount);
+  }
+  bench::check(sd_bus_message_append(reply, "{sv}", "SPACEKEEP_TOTAL_AVAILABLE", "x", total),
+               "append");
+  bench::check(sd_bus_message_append(reply, "{sv}", "SPACEKEEP_VOLUME", "s", volume), "append");
+  bench::check(sd_bus_message_close_container(reply), "close");
+  bench::check(sd_bus_message_close_container(reply), "close");
+}
+
+int answerQuery(sd_bus_message* message, void*, sd_bus_error*) {
+  bench::check(sd_bus_message_skip(message, "a{sv}"), "skip");
+  sd_bus_message* raw = nullptr;
+  bench::check(sd_bus_message_new_method_return(message, &raw), "new return");
+  const bench::Message reply(raw);
+  writeAnswers(raw, "/volumes/disk");
+  return sd_bus_send(nullptr, raw, nullptr);
+}
+
 const sd_bus_vtable kVtable[] = {
     SD_BUS_VTABLE_START(0),
     SD_BUS_METHOD("clientCancelPurge", "a{sv}", "", answerEmpty, SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_METHOD("clientGetState", "s", "av", answerState, SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_METHOD("clientPurgeableSpace", "a{sv}", "aa{sv}", answerQuery,
+                  SD_BUS_VTABLE_UNPRIVILEGED),
     SD_BUS_VTABLE_END,
 };
-
-int accepted(sd_event_source* source, int fd, uint32_t, void*) {
-  const int peer = accept4(fd, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
-  if (peer < 0) return 0;
-  sd_bus* bus = nullptr;
-  sd_id128_t id;
-  bench::check(sd_id128_randomize(&id), "sd_id128_randomize");
-  bench::check(sd_bus_new(&bus), "sd_bus_new");
-  bench::check(sd_bus_set_fd(bus, peer, peer), "sd_bus_set_fd");
-  bench::check(sd_bus_set_server(bus, 1, id), "sd_bus_set_server");
-  bench::check(sd_bus_start(bus), "sd_bus_start");
-  bench::check(sd_bus_add_object_vtable(bus, nullptr, "/com/quorvel/Spacekeep",
-                                        "com.quorvel.SpacekeepClientProtocol", kVtable, nullptr),
-               "vtable");
-  bench::check(sd_bus_attach_event(bus, sd_event_source_get_event(source), 0), "attach");
-  return 0;  // the bus lives as long as the program
-}
 
 }  // namespace
 
 int main(int count, char** arguments) {
-  if (count != 2) return 2;
-  const char* path = arguments[1];
-  unlink(path);
-  const int fd =
-      bench::check(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0), "socket");
-  const sockaddr_un address = bench::addressOf(path);
-  if (bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) < 0 ||
-      listen(fd, 64) < 0) {
-    bench::check(-errno, path);
+  if (count < 2) return 2;
+  const int known = count > 2 ? std::atoi(arguments[2]) : 0;
+  for (int i = 0; i < known; ++i) {
+    answers.emplace_back("user" + std::to_string(i % kUsers + 1) + "-" + std::to_string(i / kUsers),
+                         1'048'576);
   }
-  sd_event* event = nullptr;
-  bench::check(sd_event_default(&event), "sd_event_default");
-  bench::check(sd_event_add_io(event, nullptr, fd, EPOLLIN, accepted, nullptr), "sd_event_add_io");
-  return sd_event_loop(event);
+  return bench::serve(arguments[1], kVtable);
 }

@@ -1,74 +1,96 @@
-// The same small call to two peers in turn, and the ratio of what it took.
-// Usage: bench-small-call SOCKET FLOOR_SOCKET [ROUNDS]
+// The same call to two peers in turn, and the ratio of what it took.
+// Usage: bench-small-call SOCKET FLOOR_SOCKET KIND ROUNDS
+// KIND: cancel, state (a value of some 20 bytes), query (answered from memory by the daemon)
 #include <fmt/format.h>
 
-#include <algorithm>
-#include <cerrno>
-#include <ctime>
-#include <vector>
+#include <string_view>
 
-#include "bench/sd_bus_handles.h"
+#include "bench/calls.h"
 
 namespace {
 
-constexpr int kCallsPerRound = 500;
+constexpr const char* kStateKey = "SMALL_STATE_VALUE";
 
-double nowUs() {
-  timespec now = {};
-  clock_gettime(CLOCK_MONOTONIC, &now);
-  return static_cast<double>(now.tv_sec) * 1e6 + static_cast<double>(now.tv_nsec) / 1e3;
+struct Kind {
+  std::string_view name;
+  const char* figure;
+  double target;
+  int calls_per_round;
+  bench::Message (*call)(sd_bus* bus);
+};
+
+bench::Message getSmallState(sd_bus* bus) { return bench::getState(bus, kStateKey); }
+bench::Message queryFromMemory(sd_bus* bus) { return bench::query(bus); }
+
+constexpr Kind kKinds[] = {
+    {"cancel", "small_call", 1.2, 500, bench::cancelNothing},
+    {"state", "get_state", 1.3, 500, getSmallState},
+    {"query", "query_from_memory", 1.5, 10, queryFromMemory},
+};
+
+const Kind* kindNamed(std::string_view name) {
+  for (const Kind& kind : kKinds) {
+    if (kind.name == name) return &kind;
+  }
+  return nullptr;
 }
 
-void callOnce(sd_bus* bus) {
-  sd_bus_message* raw = nullptr;
-  bench::check(
-      sd_bus_message_new_method_call(bus, &raw, nullptr, "/com/quorvel/Spacekeep",
-                                     "com.quorvel.SpacekeepClientProtocol", "clientCancelPurge"),
-      "new call");
-  const bench::Message call(raw);
-  bench::check(sd_bus_message_append(raw, "a{sv}", 1, "SPACEKEEP_TOKEN", "s", "none"), "append");
-  sd_bus_message* reply = nullptr;
-  bench::check(sd_bus_call(bus, raw, 0, nullptr, &reply), "clientCancelPurge");
-  const bench::Message answer(reply);
-}
-
-void runRound(sd_bus* bus, std::vector<double>& times_us) {
-  for (int i = 0; i < kCallsPerRound; ++i) {
-    const double start = nowUs();
-    callOnce(bus);
-    times_us.push_back(nowUs() - start);
+void runRound(const Kind& kind, sd_bus* bus, std::vector<double>& times_us) {
+  for (int i = 0; i < kind.calls_per_round; ++i) {
+    const double start = bench::nowUs();
+    const bench::Message reply = kind.call(bus);
+    times_us.push_back(bench::nowUs() - start);
   }
 }
 
-double percentile(std::vector<double>& values, double share) {
-  std::sort(values.begin(), values.end());
-  return values[static_cast<std::size_t>(share * static_cast<double>(values.size() - 1))];
+// The comparison is void when the two say different things.
+void checkSameAnswer(const Kind& kind, sd_bus* peer, sd_bus* floor) {
+  if (kind.name == "state") {
+    for (sd_bus* bus : {peer, floor}) {
+      const char* text = nullptr;
+      const bench::Message reply = kind.call(bus);
+      bench::check(sd_bus_message_read(reply.get(), "av", 1, "s", &text), "value of the state");
+      if (std::string_view(text) != "twenty bytes of text") bench::check(-EBADMSG, "state value");
+    }
+  } else if (kind.name == "query") {
+    const int from_peer = bench::entriesIn(kind.call(peer).get());
+    const int from_floor = bench::entriesIn(kind.call(floor).get());
+    fmt::print("entries in the answer: daemon {}, bare {}\n", from_peer, from_floor);
+    if (from_peer != from_floor) bench::check(-EBADMSG, "answers differ");
+  }
+}
+
+void report(const Kind& kind, const std::vector<double>& peer_us,
+            const std::vector<double>& floor_us) {
+  fmt::print(
+      "{} calls each; daemon p50 {:.1f} us p99 {:.1f} us; bare sd-bus p50 {:.1f} us p99 {:.1f} "
+      "us\n",
+      peer_us.size(), bench::percentile(peer_us, 0.5), bench::percentile(peer_us, 0.99),
+      bench::percentile(floor_us, 0.5), bench::percentile(floor_us, 0.99));
+  fmt::print("figure {}_p50_ratio {:.3f} {}\n", kind.figure,
+             bench::percentile(peer_us, 0.5) / bench::percentile(floor_us, 0.5), kind.target);
+  fmt::print("figure {}_p99_ratio {:.3f} -\n", kind.figure,
+             bench::percentile(peer_us, 0.99) / bench::percentile(floor_us, 0.99));
 }
 
 }  // namespace
 
 int main(int count, char** arguments) {
-  if (count < 3) return 2;
-  const int rounds = count > 3 ? std::atoi(arguments[3]) : 40;
+  const Kind* kind = count == 5 ? kindNamed(arguments[3]) : nullptr;
+  if (kind == nullptr) return 2;
   const bench::Bus peer = bench::connectBus(arguments[1]);
   const bench::Bus floor = bench::connectBus(arguments[2]);
+  if (kind->name == "state") bench::setState(peer.get(), kStateKey, "twenty bytes of text");
   std::vector<double> peer_us;
   std::vector<double> floor_us;
-  runRound(peer.get(), peer_us);  // warm-up
-  runRound(floor.get(), floor_us);
+  runRound(*kind, peer.get(), peer_us);  // warm-up
+  runRound(*kind, floor.get(), floor_us);
   peer_us.clear();
   floor_us.clear();
-  for (int i = 0; i < rounds; ++i) {
-    runRound(peer.get(), peer_us);
-    runRound(floor.get(), floor_us);
+  for (int rounds = std::atoi(arguments[4]); rounds > 0; --rounds) {
+    runRound(*kind, peer.get(), peer_us);
+    runRound(*kind, floor.get(), floor_us);
   }
-  fmt::print(
-      "{} calls each; daemon p50 {:.1f} us p99 {:.1f} us; bare sd-bus p50 {:.1f} us p99 {:.1f} "
-      "us\n",
-      peer_us.size(), percentile(peer_us, 0.5), percentile(peer_us, 0.99),
-      percentile(floor_us, 0.5), percentile(floor_us, 0.99));
-  fmt::print("figure small_call_p50_ratio {:.3f} 1.2\n",
-             percentile(peer_us, 0.5) / percentile(floor_us, 0.5));
-  fmt::print("figure small_call_p99_ratio {:.3f} -\n",
-             percentile(peer_us, 0.99) / percentile(floor_us, 0.99));
+  checkSameAnswer(*kind, peer.get(), floor.get());
+  report(*kind, peer_us, floor_us);
 }

@@ -57,11 +57,15 @@ void LowSpaceStream::run() {
 }
 
 std::uint64_t LowSpaceStream::lookOnce() {
-  const WatchStep step = watch_.look(source_.sampleLocalVolumes(), nowNs());
+  bool is_handling = false;
   {
     const std::scoped_lock lock(mutex_);
+    is_handling = handling_;
+    if (handling_ended_) watch_.handlingEnded(nowNs());
+    handling_ended_ = false;
     ++looks_;
   }
+  const WatchStep step = watch_.look(source_.sampleLocalVolumes(), nowNs(), is_handling);
   if (step.flags != 0) send(step.flags);
   return step.pause_ns;
 }
@@ -75,6 +79,8 @@ void LowSpaceStream::send(std::uint64_t flags) {
     handler_(Dictionary{{kEventFlagsKey, flags}});
     const std::scoped_lock lock(mutex_);
     handling_ = false;
+    handling_ended_ = true;
+    look_wanted_ = true;
     changed_.notifyAll();
   });
 }
@@ -91,16 +97,11 @@ bool LowSpaceStream::pauseAfterLook(std::uint64_t looked_at_ticks, std::uint64_t
   const std::scoped_lock lock(mutex_);
   while (!stopping_) {
     const std::uint64_t until = look_wanted_ ? earliest : latest;
-    if (!handling_ && rt::ticks() >= until) {
+    if (rt::ticks() >= until) {
       look_wanted_ = false;
       return true;
     }
-    // While an event is handled only its end matters.
-    if (handling_) {
-      changed_.wait(mutex_);
-    } else {
-      changed_.waitUntil(mutex_, until);
-    }
+    changed_.waitUntil(mutex_, until);
   }
   return false;
 }

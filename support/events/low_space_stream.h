@@ -2,7 +2,8 @@
 //
 // The event stream for low space: a thread that looks at the volumes as often as LowSpaceWatch asks
 // for, and sends what it reports as events {"_Flags": flags} to a handler. One event is handled at
-// a time: while one is, a further one could only repeat what that one is about to do.
+// a time: purges run one after another anyway, so a second event could only wait inside the handler
+// instead of here. Looking goes on meanwhile, and comes first when the handling ends.
 #pragma once
 
 #include <cstdint>
@@ -54,6 +55,7 @@ class LowSpaceStream {
   bool stopping_ = false;
   bool look_wanted_ = false;
   bool handling_ = false;
+  bool handling_ended_ = false;  // the watch has not been told yet
   std::uint64_t looks_ = 0;
 
   rt::Thread thread_;  // last: it uses all of the above

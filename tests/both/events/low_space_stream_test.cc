@@ -99,6 +99,33 @@ TEST(LowSpaceStream, OneEventIsHandledAtATime) {
   });
 }
 
+TEST(LowSpaceStream, AShortageDuringTheHandlingOfAnEventIsReportedWhenItEnds) {
+  inEverySchedule(30, [] {
+    OneVolume volume;
+    volume.set(400 * kMiB, SpaceLevel::kLow);
+    ConcurrentQueue queue({});
+    CountingSemaphore handled(0);
+    std::vector<Dictionary> events;
+    std::vector<std::uint64_t> times;
+    LowSpaceStream stream(volume, queue, [&](const Dictionary& event) {
+      events.push_back(event);
+      times.push_back(rt::ticks());
+      if (events.size() == 1) {
+        volume.set(100 * kMiB, SpaceLevel::kVeryLow);
+        rt::sleepNs(90 * kSecond);
+      }
+      handled.signal();
+    });
+    for (int i = 0; i < 2; ++i) handled.wait();
+    ASSERT_GE(events.size(), 2U);
+    EXPECT_EQ(events[0], (Dictionary{{"_Flags", 0x4}}));
+    EXPECT_EQ(events[1], (Dictionary{{"_Flags", 0x200}}));
+    if (!onRealThreads()) {
+      EXPECT_LE(times[1] - times[0], 91 * kSecond);
+    }
+  });
+}
+
 TEST(LowSpaceStream, ItsEndWaitsForTheHandlerThatRuns) {
   inEverySchedule(50, [] {
     OneVolume volume;

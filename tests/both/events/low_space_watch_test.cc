@@ -21,27 +21,6 @@ std::vector<VolumeSample> volume(std::uint64_t available, SpaceLevel level = Spa
            .level = level}};
 }
 
-TEST(FastestRate, TheFastestFillingCounts) {
-  EXPECT_DOUBLE_EQ(fastestRate(10, 500, 10 * kSecond, 1, kHour), 50);
-  EXPECT_NEAR(fastestRate(1000, 500, 10 * kSecond, 1, kHour), 1000, 3);
-}
-
-TEST(FastestRate, ItFadesByHalfAndNotBelowTheSlowest) {
-  EXPECT_DOUBLE_EQ(fastestRate(1000, 0, kHour, 1, kHour), 500);
-  EXPECT_DOUBLE_EQ(fastestRate(1000, 0, 2 * kHour, 1, kHour), 250);
-  EXPECT_DOUBLE_EQ(fastestRate(1000, 0, 100 * kHour, 7, kHour), 7);
-}
-
-TEST(FastestRate, TwoLooksAtOneMomentSayNothing) {
-  EXPECT_DOUBLE_EQ(fastestRate(10, 500, 0, 1, kHour), 10);
-}
-
-TEST(TimeToUseUp, IsTheQuotientAndNeverOverflows) {
-  EXPECT_EQ(timeToUseUpNs(0, 5.0), 0U);
-  EXPECT_EQ(timeToUseUpNs(10, 5.0), 2 * kSecond);
-  EXPECT_EQ(timeToUseUpNs(UINT64_MAX, 1.0), UINT64_MAX);
-}
-
 TEST(LowSpaceWatch, WithoutVolumesItLooksRarely) {
   LowSpaceWatch watch;
   const WatchStep step = watch.look({}, 0);
@@ -49,61 +28,25 @@ TEST(LowSpaceWatch, WithoutVolumesItLooksRarely) {
   EXPECT_EQ(step.pause_ns, 4 * kHour);
 }
 
-TEST(LowSpaceWatch, HowLongItPauses) {
-  struct Case {
-    const char* what;
-    std::uint64_t available;
-    SpaceLevel level;
-    std::uint64_t pause_ns;
-  };
-  using enum SpaceLevel;
-  const Case cases[] = {
-      {"very far: hours", 500 * kGiB, kEnough, 4 * kHour},
-      {"far: what the slowest filling takes", 500 * kMiB + 8 * kMiB * 1000, kEnough,
-       1000 * kSecond},
-      {"just far: no less than a minute", 1000 * kMiB, kEnough, 62 * kSecond + kSecond / 2},
-      {"near: sooner than in a minute", 740 * kMiB, kEnough, 30 * kSecond},
-      {"at the threshold: the shortest pause", 500 * kMiB, kEnough, 1 * kSecond},
-      {"low: what is left to the very low threshold", 500 * kMiB / 3 + 80 * kMiB, kLow,
-       10 * kSecond},
-      {"very low: until the event is repeated", 0, kVeryLow, 60 * kSecond},
-  };
-  for (const Case& each : cases) {
-    LowSpaceWatch watch;
-    EXPECT_EQ(watch.look(volume(each.available, each.level), 0).pause_ns, each.pause_ns)
-        << each.what;
-  }
-}
-
 TEST(LowSpaceWatch, TheVolumeInGreatestNeedDecides) {
   LowSpaceWatch watch;
-  auto samples = volume(500 * kGiB);
-  samples.push_back(volume(740 * kMiB, SpaceLevel::kEnough, "/near")[0]);
-  EXPECT_EQ(watch.look(samples, 0).pause_ns, 30 * kSecond);
+  auto samples = volume(60 * kGiB);
+  samples.push_back(volume(890 * kMiB, SpaceLevel::kEnough, "/near")[0]);
+  EXPECT_EQ(watch.look(samples, 0).pause_ns, 8 * kSecond);
 }
 
 TEST(LowSpaceWatch, AFastFillingMakesItLookSooner) {
   LowSpaceWatch watch;
-  EXPECT_EQ(watch.look(volume(100 * kGiB + 500 * kMiB), 0).pause_ns, 12800 * kSecond);
-  // 80 GiB in 800 s: 0.1 GiB/s; the 20 GiB left above the threshold last for 200 s.
-  EXPECT_EQ(watch.look(volume(20 * kGiB + 500 * kMiB), 800 * kSecond).pause_ns, 200 * kSecond);
+  EXPECT_EQ(watch.look(volume(40 * kGiB + 250 * kMiB), 0).pause_ns, 512 * kSecond);
+  // 20 GiB in 100 s: 0.2 GiB/s; the 20 GiB that are left last for 100 s.
+  EXPECT_EQ(watch.look(volume(20 * kGiB + 250 * kMiB), 100 * kSecond).pause_ns, 100 * kSecond);
 }
 
-TEST(LowSpaceWatch, FarFromTheThresholdNoRateMakesItLookMoreOftenThanOnceAMinute) {
+TEST(LowSpaceWatch, WhatIsFilledWithinAMinuteIsNotFarHoweverMuchIsLeft) {
   LowSpaceWatch watch;
   (void)watch.look(volume(60 * kGiB), 0);
-  EXPECT_EQ(watch.look(volume(2 * kGiB), 10 * kSecond).pause_ns, 60 * kSecond);
-}
-
-TEST(LowSpaceWatch, InodesAreUsedUpToo) {
-  LowSpaceWatch watch;
-  auto samples = volume(500 * kGiB);
-  samples[0].space.inodes = 1'000'000;
-  samples[0].space.available_inodes = 250'000;  // 200,000 above the threshold at 200 a second
-  samples[0].thresholds = spaceThresholds(samples[0].space, {});
-  EXPECT_EQ(watch.look(samples, 0).pause_ns, 1000 * kSecond);
-  samples[0].space.available_inodes = 99'999;  // near
-  EXPECT_LE(watch.look(samples, kSecond).pause_ns, 60 * kSecond);
+  // 20 GiB in 20 s; the 40 GiB that are left last for 40 s.
+  EXPECT_EQ(watch.look(volume(40 * kGiB + 250 * kMiB), 20 * kSecond).pause_ns / kSecond, 40U);
 }
 
 TEST(LowSpaceWatch, ALowVolumeIsReportedAtOnceAndAgainWithGrowingPauses) {
@@ -131,11 +74,98 @@ TEST(LowSpaceWatch, WhichFlagsAnEventCarries) {
 
 TEST(LowSpaceWatch, GettingWorseIsReportedAtOnce) {
   LowSpaceWatch watch;
-  EXPECT_EQ(watch.look(volume(400 * kMiB, SpaceLevel::kLow), 0).flags, 0x4U);
-  EXPECT_EQ(watch.look(volume(300 * kMiB, SpaceLevel::kLow), 10 * kSecond).flags, 0U);
-  EXPECT_EQ(watch.look(volume(100 * kMiB, SpaceLevel::kVeryLow), 20 * kSecond).flags, 0x200U);
-  EXPECT_EQ(watch.look(volume(300 * kMiB, SpaceLevel::kLow), 30 * kSecond).flags, 0U);
-  EXPECT_EQ(watch.look(volume(100 * kMiB, SpaceLevel::kVeryLow), 40 * kSecond).flags, 0x200U);
+  EXPECT_EQ(watch.look(volume(180 * kMiB, SpaceLevel::kLow), 0).flags, 0x4U);
+  EXPECT_EQ(watch.look(volume(175 * kMiB, SpaceLevel::kLow), 10 * kSecond).flags, 0U);
+  EXPECT_EQ(watch.look(volume(160 * kMiB, SpaceLevel::kVeryLow), 20 * kSecond).flags, 0x200U);
+  EXPECT_EQ(watch.look(volume(175 * kMiB, SpaceLevel::kLow), 30 * kSecond).flags, 0U);
+  EXPECT_EQ(watch.look(volume(160 * kMiB, SpaceLevel::kVeryLow), 40 * kSecond).flags, 0x200U);
+}
+
+TEST(LowSpaceWatch, WhileAnEventIsHandledNothingIsReportedAndAfterwardsTheWorstIs) {
+  using enum SpaceLevel;
+  LowSpaceWatch watch;
+  EXPECT_EQ(watch.look(volume(400 * kMiB, kLow), 0).flags, 0x4U);
+  EXPECT_EQ(watch.look(volume(100 * kMiB, kVeryLow), kSecond, true).flags, 0U);
+  watch.handlingEnded(2 * kSecond);
+  EXPECT_EQ(watch.look(volume(100 * kMiB, kVeryLow), 2 * kSecond).flags, 0x200U);
+}
+
+TEST(LowSpaceWatch, AVolumeThatWasEnoughMeanwhileAndIsShortAgainIsNew) {
+  using enum SpaceLevel;
+  LowSpaceWatch watch;
+  EXPECT_EQ(watch.look(volume(400 * kMiB, kLow), 0).flags, 0x4U);
+  EXPECT_EQ(watch.look(volume(900 * kMiB, kEnough), kSecond, true).flags, 0U);
+  EXPECT_EQ(watch.look(volume(400 * kMiB, kLow), 2 * kSecond, true).flags, 0U);
+  watch.handlingEnded(3 * kSecond);
+  EXPECT_EQ(watch.look(volume(400 * kMiB, kLow), 3 * kSecond).flags, 0x4U);
+}
+
+TEST(LowSpaceWatch, ThePauseBetweenEventsCountsFromTheEndOfTheHandling) {
+  LowSpaceWatch watch;
+  EXPECT_NE(watch.look(volume(0, SpaceLevel::kVeryLow), 0).flags, 0U);
+  EXPECT_EQ(watch.look(volume(0, SpaceLevel::kVeryLow), 899 * kSecond, true).flags, 0U);
+  watch.handlingEnded(900 * kSecond);
+  EXPECT_EQ(watch.look(volume(0, SpaceLevel::kVeryLow), 900 * kSecond).flags, 0U);
+  EXPECT_EQ(watch.look(volume(0, SpaceLevel::kVeryLow), 959 * kSecond).flags, 0U);
+  EXPECT_NE(watch.look(volume(0, SpaceLevel::kVeryLow), 960 * kSecond).flags, 0U);
+}
+
+TEST(LowSpaceWatch, WhenAPurgeHelpedButNotEnoughTheNextEventFollowsAtOnce) {
+  LowSpaceWatch watch;
+  EXPECT_NE(watch.look(volume(10 * kMiB, SpaceLevel::kVeryLow), 0).flags, 0U);
+  EXPECT_EQ(watch.look(volume(200 * kMiB, SpaceLevel::kLow), 899 * kSecond, true).flags, 0U);
+  watch.handlingEnded(900 * kSecond);
+  EXPECT_NE(watch.look(volume(200 * kMiB, SpaceLevel::kLow), 900 * kSecond).flags, 0U);
+}
+
+TEST(LowSpaceWatch, WhatAPurgeFreedAndOthersUsedUpMeanwhileIsNotMissed) {
+  LowSpaceWatch watch;
+  EXPECT_NE(watch.look(volume(10 * kMiB, SpaceLevel::kVeryLow), 0).flags, 0U);
+  EXPECT_EQ(watch.look(volume(200 * kMiB, SpaceLevel::kLow), kSecond, true).flags, 0U);
+  EXPECT_EQ(watch.look(volume(10 * kMiB, SpaceLevel::kLow), 2 * kSecond, true).flags, 0U);
+  watch.handlingEnded(900 * kSecond);
+  EXPECT_NE(watch.look(volume(10 * kMiB, SpaceLevel::kLow), 900 * kSecond).flags, 0U);
+}
+
+TEST(LowSpaceWatch, WhileSpaceIsUsedUpFurtherTheNextEventComesSoon) {
+  LowSpaceWatch watch;
+  EXPECT_NE(watch.look(volume(400 * kMiB, SpaceLevel::kLow), 0).flags, 0U);
+  watch.handlingEnded(100 * kSecond);
+  EXPECT_EQ(watch.look(volume(400 * kMiB, SpaceLevel::kLow), 100 * kSecond).flags, 0U);
+  // Less than a sixteenth of the threshold, and then more.
+  EXPECT_EQ(watch.look(volume(370 * kMiB, SpaceLevel::kLow), 101 * kSecond).flags, 0U);
+  EXPECT_NE(watch.look(volume(360 * kMiB, SpaceLevel::kLow), 102 * kSecond).flags, 0U);
+}
+
+TEST(LowSpaceWatch, EventsThatDoNotHelpComeRarerThoughSpaceIsUsedUp) {
+  LowSpaceWatch watch;
+  std::vector<std::uint64_t> reported_at_s;
+  // A tebibyte that is short all the way down, with services that have nothing to give.
+  for (std::uint64_t second = 0; second < 4000; ++second) {
+    auto samples = volume((4000 - second) * 40 * kMiB, SpaceLevel::kLow);
+    samples[0].space.size_bytes = 1024 * kGiB;
+    const WatchStep step = watch.look(samples, second * kSecond);
+    if (step.flags == 0) continue;
+    reported_at_s.push_back(second);
+    watch.handlingEnded(second * kSecond);
+  }
+  EXPECT_EQ(reported_at_s,
+            (std::vector<std::uint64_t>{0, 1, 3, 7, 15, 31, 63, 123, 243, 483, 963, 1923, 3843}));
+}
+
+TEST(LowSpaceWatch, InodesThatAreUsedUpCountAsMuchAsBytes) {
+  LowSpaceWatch watch;
+  const auto inodes = [](std::uint64_t available) {
+    auto samples = volume(60 * kGiB, SpaceLevel::kLow);
+    samples[0].space.inodes = 1'000'000;  // low below 50,000
+    samples[0].space.available_inodes = available;
+    samples[0].thresholds = spaceThresholds(samples[0].space, {});
+    return samples;
+  };
+  EXPECT_NE(watch.look(inodes(40'000), 0).flags, 0U);
+  watch.handlingEnded(kSecond);
+  EXPECT_EQ(watch.look(inodes(38'000), 2 * kSecond).flags, 0U);
+  EXPECT_NE(watch.look(inodes(36'000), 3 * kSecond).flags, 0U);
 }
 
 TEST(LowSpaceWatch, AfterRecoveryTheNextShortageIsNew) {

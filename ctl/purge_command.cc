@@ -44,7 +44,7 @@ sdk::PurgeRequest requestOf(const PurgeOptions& options) {
 }
 
 ExitCode present(const CommonOptions& common, const PurgeReport& report) {
-  fmt::print("{}", common.json ? jsonOf(report) + "\n" : tableOf(report));
+  fmt::print("{}", common.json ? jsonOf(report) + "\n" : tableOf(report, styleOf(STDOUT_FILENO)));
   if (report.error) return ExitCode::kRefused;
   return report.reached() ? ExitCode::kDone : ExitCode::kNotReached;
 }

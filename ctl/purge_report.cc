@@ -2,13 +2,9 @@
 
 #include <fmt/format.h>
 
-#include <algorithm>
-#include <iterator>
 #include <utility>
 
 #include "ctl/json_text.h"
-#include "ctl/size_text.h"
-#include "support/values/text.h"
 
 namespace spacekeep::ctl {
 namespace {
@@ -55,56 +51,6 @@ std::vector<UrgencyReport> urgencyReports(const Dictionary& outcome) {
   return reports;
 }
 
-using Out = std::back_insert_iterator<std::string>;
-
-/// Service IDs come from other programs; on a terminal they must stay text.
-std::string harmless(const std::string& text) { return textOf(Value(text)); }
-
-std::size_t widestService(const PurgeReport& report) {
-  std::size_t widest = std::string_view("service").size();
-  for (const auto& urgency : report.urgencies) {
-    for (const auto& service : urgency.services) {
-      widest = std::max(widest, harmless(service.id).size());
-    }
-    for (const auto& id : urgency.unanswered) widest = std::max(widest, harmless(id).size());
-  }
-  return widest;
-}
-
-void addUrgency(Out out, const UrgencyReport& urgency, std::size_t width) {
-  for (const auto& service : urgency.services) {
-    fmt::format_to(out, "{:>7}  {:<{}}  {:>12}\n", urgency.urgency, harmless(service.id), width,
-                   printSize(service.reported_bytes));
-  }
-  for (const auto& id : urgency.unanswered) {
-    fmt::format_to(out, "{:>7}  {:<{}}  did not answer within {} s\n", urgency.urgency,
-                   harmless(id), width, urgency.timeout_seconds.value_or(0));
-  }
-  if (urgency.services.empty() && urgency.unanswered.empty()) {
-    fmt::format_to(out, "{:>7}  {:<{}}\n", urgency.urgency, "(nobody was asked)", width);
-  }
-}
-
-/// A service that is asked several times at one urgency is listed with its last answer only.
-std::string earlierAnswers(const PurgeReport& report) {
-  std::uint64_t listed_bytes = 0;
-  for (const auto& urgency : report.urgencies) {
-    for (const auto& service : urgency.services) listed_bytes += service.reported_bytes;
-  }
-  if (listed_bytes >= report.reported_bytes) return "";
-  return fmt::format(
-      ", {} of it in answers before the last one of a service, which is listed above",
-      printSize(report.reported_bytes - listed_bytes));
-}
-
-std::string verdict(const PurgeReport& report) {
-  if (report.error) return "not done: " + harmless(*report.error);
-  if (report.reached()) return "reached";
-  const std::string missing = printSize(report.asked_bytes - report.freed_bytes);
-  return fmt::format("not reached, {} missing{}", missing,
-                     report.cancelled ? " (the purge was cancelled)" : "");
-}
-
 Value valueOf(const UrgencyReport& urgency) {
   Array services;
   for (const auto& service : urgency.services) {
@@ -137,25 +83,6 @@ PurgeReport purgeReport(const Dictionary& outcome, std::uint64_t asked_bytes) {
   if (const auto* error = stringAt(outcome, "SPACEKEEP_ERROR")) report.error = *error;
   report.urgencies = urgencyReports(outcome);
   return report;
-}
-
-std::string tableOf(const PurgeReport& report) {
-  std::string text;
-  const Out out(text);
-  const std::size_t width = widestService(report);
-  if (!report.urgencies.empty()) {
-    fmt::format_to(out, "{:>7}  {:<{}}  {:>12}\n", "urgency", "service", width, "reported");
-    for (const auto& urgency : report.urgencies) addUrgency(out, urgency, width);
-    text += '\n';
-  }
-  fmt::format_to(out, "asked     {}\n", printSize(report.asked_bytes));
-  fmt::format_to(out, "freed     {} ({} free before, {} after)\n", printSize(report.freed_bytes),
-                 printSize(report.free_before_bytes), printSize(report.free_after_bytes));
-  fmt::format_to(out, "reported  {} by the services{}\n", printSize(report.reported_bytes),
-                 earlierAnswers(report));
-  fmt::format_to(out, "took      {:.1f} s\n", report.elapsed_seconds);
-  fmt::format_to(out, "result    {}\n", verdict(report));
-  return text;
 }
 
 std::string jsonOf(const PurgeReport& report) {

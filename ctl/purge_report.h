@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "ctl/style.h"
 #include "support/values/value.h"
 
 namespace spacekeep::ctl {
@@ -43,8 +44,8 @@ struct PurgeReport {
 /// Whatever is missing in the outcome, or of another kind than expected, reads as absent.
 [[nodiscard]] PurgeReport purgeReport(const Dictionary& outcome, std::uint64_t asked_bytes);
 
-/// A table of several lines, each ended by a line break.
-[[nodiscard]] std::string tableOf(const PurgeReport& report);
+/// A table of several lines, each ended by a line break; on a terminal fitted to its width.
+[[nodiscard]] std::string tableOf(const PurgeReport& report, const Style& style);
 
 /// One object; the man page of the tool describes its members.
 [[nodiscard]] std::string jsonOf(const PurgeReport& report);

@@ -48,12 +48,11 @@ ExitCode refusal(const CommonOptions& common, const QueryOptions& options) {
 }
 
 void present(const CommonOptions& common, const QueryOptions& options, const QueryReport& report) {
+  const Style style = styleOf(STDOUT_FILENO);
   if (common.json) {
     fmt::print("{}\n", jsonOf(report, options.itemized));
-  } else if (options.itemized) {
-    fmt::print("{}", itemizedTableOf(report, styleOf(STDOUT_FILENO)));
   } else {
-    fmt::print("{}", summaryOf(report));
+    fmt::print("{}", options.itemized ? itemizedTableOf(report, style) : summaryOf(report, style));
   }
 }
 

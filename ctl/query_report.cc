@@ -57,15 +57,31 @@ std::string servicesIn(std::size_t count) {
   return fmt::format("{} service{}", count, count == 1 ? "" : "s");
 }
 
+std::string totalLine(const QueryReport& report) {
+  std::string text = fmt::format("{} could be freed on {}", printSignedSize(report.total_bytes),
+                                 harmless(report.volume));
+  if (!report.space) return text;
+  return text + fmt::format(", {} of its {} ({} are free now)",
+                            printShare(static_cast<double>(report.total_bytes),
+                                       static_cast<double>(report.space->size_bytes)),
+                            printSize(report.space->size_bytes),
+                            printSize(report.space->free_bytes));
+}
+
 std::string originLine(const Tally& tally) {
   if (tally.from_memory + tally.asked == 0 || tally.unknown > 0) return "";
   const std::string asked = fmt::format("{} asked now", servicesIn(tally.asked));
-  if (tally.from_memory == 0) return asked + "\n";
-  const std::string remembered = fmt::format(
-      "{} from memory, at most {} old",
-      tally.asked == 0 ? servicesIn(tally.from_memory) : std::to_string(tally.from_memory),
-      printAge(tally.oldest_seconds));
-  return tally.asked == 0 ? remembered + "\n" : fmt::format("{}, {}\n", asked, remembered);
+  if (tally.from_memory == 0) return asked;
+  const std::string age = printAge(tally.oldest_seconds);
+  if (tally.asked == 0) {
+    return fmt::format("{} from memory, at most {} old", servicesIn(tally.from_memory), age);
+  }
+  return fmt::format("{}, {} from memory, at most {} old", asked, tally.from_memory, age);
+}
+
+/// Elsewhere than on a terminal a line stays one line.
+std::string fitted(const std::string& line, const Style& style) {
+  return (style.terminal ? wrapped(line, style.columns, 0) : line) + "\n";
 }
 
 Value valueOf(const ServiceSpace& service) {
@@ -98,21 +114,17 @@ QueryReport queryReport(const Dictionary& answer, const MemoryOfDaemon& memory,
   return report;
 }
 
-std::string summaryOf(const QueryReport& report) {
-  const std::string total = printSignedSize(report.total_bytes);
-  const std::string volume = harmless(report.volume);
+std::string summaryOf(const QueryReport& report, const Style& style) {
   const Tally tally = tallyOf(report);
-  std::string text = fmt::format("{} could be freed on {}", total, volume);
-  if (report.space) {
-    text += fmt::format(", {} of its {} ({} are free now)",
-                        printShare(static_cast<double>(report.total_bytes),
-                                   static_cast<double>(report.space->size_bytes)),
-                        printSize(report.space->size_bytes), printSize(report.space->free_bytes));
+  std::string text = fitted(totalLine(report), style);
+  if (const std::string origins = originLine(tally); !origins.empty()) {
+    text += fitted(origins, style);
   }
-  text += "\n" + originLine(tally);
   if (tally.without_number > 0) {
-    text += fmt::format("{} gave no number and {} not counted\n", servicesIn(tally.without_number),
-                        tally.without_number == 1 ? "is" : "are");
+    text +=
+        fitted(fmt::format("{} gave no number and {} not counted", servicesIn(tally.without_number),
+                           tally.without_number == 1 ? "is" : "are"),
+               style);
   }
   return text;
 }

@@ -42,8 +42,9 @@ struct MemoryOfDaemon {
 [[nodiscard]] QueryReport queryReport(const Dictionary& answer, const MemoryOfDaemon& memory,
                                       std::optional<MeasuredSpace> space);
 
-/// One line with the total, and one on what came from memory when that is known.
-[[nodiscard]] std::string summaryOf(const QueryReport& report);
+/// One line with the total, and one on what came from memory when that is known; on a terminal
+/// broken where its width demands it.
+[[nodiscard]] std::string summaryOf(const QueryReport& report, const Style& style);
 /// A table with a line per service; on a terminal fitted to its width.
 [[nodiscard]] std::string itemizedTableOf(const QueryReport& report, const Style& style);
 /// One object; the man page of the tool describes its members.

@@ -54,11 +54,18 @@ ExitCode sendSet(const CommonOptions& common, const StateOptions& options, const
   return ExitCode::kDone;
 }
 
-void printNames(const Dictionary& state) {
+/// For completions: the keys that mean something stand there without a daemon too, and a busy daemon
+/// does not keep the terminal waiting.
+ExitCode listNames(const CommonOptions& common) {
+  constexpr std::chrono::milliseconds kPatience{3'000};
+  auto state = wholeState(common, kPatience);
   std::set<std::string> names;
-  for (const auto& [key, value] : state) names.insert(harmless(key));
   for (const auto& known : settableKeys()) names.emplace(known.name);
+  if (state) {
+    for (const auto& [key, value] : *state) names.insert(harmless(key));
+  }
   for (const auto& name : names) fmt::print("{}\n", name);
+  return state ? ExitCode::kDone : complain(common, state.error());
 }
 
 }  // namespace
@@ -105,11 +112,10 @@ ExitCode runStateUnset(const CommonOptions& common, const StateOptions& options)
 }
 
 ExitCode runStateList(const CommonOptions& common, const StateOptions& options) {
+  if (options.names) return listNames(common);
   auto state = wholeState(common);
   if (!state) return complain(common, state.error());
-  if (options.names) {
-    printNames(*state);
-  } else if (common.json) {
+  if (common.json) {
     printJson({{"state", std::move(*state)}});
   } else {
     fmt::print("{}", stateTableOf(*state, styleOf(STDOUT_FILENO)));

@@ -57,6 +57,15 @@ std::string meaningOf(const std::string& key, const Style& style) {
   return coloured(wrapped(known->meaning, style.columns, kIndent), Colour::kFaint, style) + "\n";
 }
 
+bool anyDefault(const Dictionary& state) {
+  return std::ranges::any_of(
+      settableKeys(), [&state](const KnownKey& known) { return !state.contains(known.name); });
+}
+
+std::string defaultsNote(const Style& style) {
+  return "\n" + wrapped("In parentheses: not set, so this default holds.", style.columns, 0) + "\n";
+}
+
 }  // namespace
 
 std::string stateTableOf(const Dictionary& state, const Style& style) {
@@ -66,8 +75,7 @@ std::string stateTableOf(const Dictionary& state, const Style& style) {
   for (const auto& [key, value] : rows) {
     text += lineOf(key, value, key_width, style) + meaningOf(key, style);
   }
-  return text + "\n" +
-         wrapped("In parentheses: not set, so this default holds.", style.columns, 0) + "\n";
+  return text + (anyDefault(state) ? defaultsNote(style) : "");
 }
 
 }  // namespace spacekeep::ctl

@@ -1,58 +1,22 @@
 // The tool as a process: what it prints and how it exits.
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/wait.h>
 
-#include <cstdio>
-#include <cstdlib>
-#include <fstream>
-#include <sstream>
 #include <string>
 
-#include "tests/linux/sdk/fake_daemon.h"
+#include "tests/linux/ctl/tool_test.h"
 
 namespace spacekeep::ctl {
 namespace {
 
-using sdk::FakeDaemon;
-using sdk::SocketDirectory;
 using testing::AllOf;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
 using testing::StartsWith;
 
-struct Finished {
-  int exit_code = -1;
-  std::string out;
-  std::string err;
-};
-
-class CommandTest : public testing::Test {
+class CommandTest : public ToolTest {
  protected:
-  ~CommandTest() override { std::remove((directory_.path() + "/err").c_str()); }
-
-  /// Runs the tool with `arguments`, as a shell splits them.
-  Finished ctl(const std::string& arguments) {
-    const std::string err_file = directory_.path() + "/err";
-    const std::string command =
-        std::string(SPACEKEEP_BUILD_DIR) + "/ctl/spacekeepctl " + arguments + " 2>" + err_file;
-    Finished run;
-    std::FILE* pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr) return run;
-    char buffer[4096];
-    while (const auto size = std::fread(buffer, 1, sizeof buffer, pipe))
-      run.out.append(buffer, size);
-    const int status = pclose(pipe);
-    run.exit_code = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    std::ostringstream text;
-    text << std::ifstream(err_file).rdbuf();
-    run.err = text.str();
-    return run;
-  }
-  Finished ctlWithSocket(const std::string& arguments) {
-    return ctl("--socket " + directory_.daemonSocket() + " " + arguments);
-  }
   /// Answers purges with so many bytes freed, and keeps the request.
   void answerWith(std::uint64_t freed) {
     daemon_.on("clientPurge", [this, freed](const ipc::Arguments& in, const ipc::Responder& r) {
@@ -67,10 +31,6 @@ class CommandTest : public testing::Test {
     });
     daemon_.start();
   }
-
-  SocketDirectory directory_;
-  rt::Guarded<Dictionary> seen_;
-  FakeDaemon daemon_{directory_.daemonSocket()};
 };
 
 TEST_F(CommandTest, AReachedAmountExitsWithZeroAndPrintsTheTable) {
@@ -195,7 +155,8 @@ TEST_F(CommandTest, ACancelRequestIsAcceptedAndTheToolDoesNotPromiseMore) {
 TEST_F(CommandTest, HelpAndVersionExitWithZeroAndNeedNoDaemon) {
   const Finished help = ctl("--help");
   EXPECT_EQ(help.exit_code, 0);
-  EXPECT_THAT(help.out, AllOf(HasSubstr("purge"), HasSubstr("cancel"), HasSubstr("Exit status: 0 done")));
+  EXPECT_THAT(help.out,
+              AllOf(HasSubstr("purge"), HasSubstr("cancel"), HasSubstr("Exit status: 0 done")));
   const Finished purge_help = ctl("purge --help");
   EXPECT_EQ(purge_help.exit_code, 0);
   EXPECT_THAT(purge_help.out, AllOf(HasSubstr("--wait-all"), HasSubstr("1.5GiB")));

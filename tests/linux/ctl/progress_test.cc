@@ -104,8 +104,7 @@ TEST(Progress, OnANarrowTerminalTheLineIsCutSoThatItCanRenewItself) {
   std::rewind(file.get());
   char text[1024] = {};
   const auto size = std::fread(text, 1, sizeof text - 1, file.get());
-  EXPECT_EQ(std::string(text, size),
-            "\r\x1b[K1.0 KiB asked for,..., at most 2 s left\r\x1b[K");
+  EXPECT_EQ(std::string(text, size), "\r\x1b[K1.0 KiB asked for,..., at most 2 s left\r\x1b[K");
 }
 
 }  // namespace

@@ -49,7 +49,7 @@ TEST(PurgeReport, TellsWhatEachServiceReportedAndWhoDidNotAnswer) {
 }
 
 TEST(PurgeReport, TheTableShowsEveryUrgencyAndTheSums) {
-  EXPECT_EQ(tableOf(purgeReport(outcomeWithASilentService(), 50 * kMiB)),
+  EXPECT_EQ(tableOf(purgeReport(outcomeWithASilentService(), 50 * kMiB), {}),
             "urgency  service      reported\n"
             "      1  photos       25.0 MiB\n"
             "      1  silent   did not answer within 2 s\n"
@@ -69,10 +69,30 @@ TEST(PurgeReport, SaysWhatWasReportedBeforeTheLastAnswersThatTheTableLists) {
       {"SPACEKEEP_AMOUNT_REPORTED", 8 * kMiB},
       {"SPACEKEEP_URGENCY_1_OPERATION_INFO",
        Dictionary{{"SPACEKEEP_REPORTING_SERVICES", Dictionary{{"one", 5 * kMiB}}}}}};
-  EXPECT_NE(tableOf(purgeReport(outcome, 8 * kMiB))
+  EXPECT_NE(tableOf(purgeReport(outcome, 8 * kMiB), {})
                 .find("reported  8.0 MiB by the services, 3.0 MiB of it "
                       "in answers before the last one"),
             std::string::npos);
+}
+
+TEST(PurgeReport, OnATerminalTooNarrowForItIdsLoseTheirMiddleAndLinesBreakBetweenWords) {
+  const Dictionary outcome{
+      {"SPACEKEEP_AMOUNT", 8 * kMiB},
+      {"SPACEKEEP_AMOUNT_REPORTED", 8 * kMiB},
+      {"SPACEKEEP_URGENCY_1_OPERATION_INFO",
+       Dictionary{{"SPACEKEEP_REPORTING_SERVICES", Dictionary{{"com.example.photos", 8 * kMiB}}},
+                  {"SPACEKEEP_SERVICES_INFLIGHT", Array{"com.example.downloads"}}}}};
+  EXPECT_EQ(tableOf(purgeReport(outcome, 8 * kMiB), {.columns = 40, .terminal = true}),
+            "urgency  service                reported\n"
+            "      1  com.exa....photos       8.0 MiB\n"
+            "      1  com.exa...wnloads  no answer\n"
+            "\n"
+            "asked     8.0 MiB\n"
+            "freed     8.0 MiB (0 B free before, 0 B\n"
+            "          after)\n"
+            "reported  8.0 MiB by the services\n"
+            "took      0.0 s\n"
+            "result    reached\n");
 }
 
 TEST(PurgeReport, TheJsonHoldsTheSameInBytes) {
@@ -97,7 +117,7 @@ TEST(PurgeReport, AnUrgencyInWhichNobodyWasAskedSaysSo) {
                            {"SPACEKEEP_URGENCY_3_OPERATION_INFO",
                             Dictionary{{"SPACEKEEP_SERVICES_INFLIGHT", Array{}},
                                        {"SPACEKEEP_URGENCY_3_TIMEOUT_SECONDS", 6}}}};
-  EXPECT_EQ(tableOf(purgeReport(outcome, 1024)),
+  EXPECT_EQ(tableOf(purgeReport(outcome, 1024), {}),
             "urgency  service      reported\n"
             "      3  (nobody was asked)\n"
             "\n"
@@ -112,7 +132,7 @@ TEST(PurgeReport, AnErrorIsNeverASuccessEvenWhenNothingWasAskedFor) {
   const Dictionary outcome{{"SPACEKEEP_ERROR", "Parameter error, no Amount key in info dict"}};
   const PurgeReport report = purgeReport(outcome, 0);
   EXPECT_FALSE(report.reached());
-  EXPECT_NE(tableOf(report).find("not done: Parameter error, no Amount key in info dict"),
+  EXPECT_NE(tableOf(report, {}).find("not done: Parameter error, no Amount key in info dict"),
             std::string::npos);
   EXPECT_NE(jsonOf(report).find(R"("error":"Parameter error)"), std::string::npos);
 }
@@ -136,7 +156,7 @@ TEST(PurgeReport, WhatIsOfAnotherKindThanExpectedReadsAsAbsent) {
 
 TEST(PurgeReport, ACancelledPurgeSaysSo) {
   const Dictionary outcome{{"SPACEKEEP_AMOUNT", 0}, {"SPACEKEEP_OPERATION_CANCELLED", true}};
-  EXPECT_NE(tableOf(purgeReport(outcome, 1024))
+  EXPECT_NE(tableOf(purgeReport(outcome, 1024), {})
                 .find("not reached, 1.0 KiB missing (the purge was cancelled)"),
             std::string::npos);
 }
@@ -145,7 +165,7 @@ TEST(PurgeReport, AServiceIdWithControlCharactersCannotWriteToTheTerminal) {
   const Dictionary outcome{
       {"SPACEKEEP_URGENCY_1_OPERATION_INFO",
        Dictionary{{"SPACEKEEP_REPORTING_SERVICES", Dictionary{{"evil\x1b[2J\n", 1}}}}}};
-  const std::string table = tableOf(purgeReport(outcome, 1));
+  const std::string table = tableOf(purgeReport(outcome, 1), {});
   EXPECT_EQ(table.find('\x1b'), std::string::npos);
   EXPECT_NE(table.find("evil"), std::string::npos);
 }

@@ -1,0 +1,83 @@
+# Completion of spacekeepctl for bash. Needs nothing but bash itself.
+
+# The lines on standard input that begin with $1, quoted for the command line.
+_spacekeepctl_matches() {
+  local line typed=${1//\\/}
+  COMPREPLY=()
+  while IFS= read -r line; do
+    [[ $line == "$typed"* ]] && COMPREPLY+=("$(printf '%q' "$line")")
+  done
+}
+
+# The options of the command in $1; those of the tool itself may stand anywhere.
+_spacekeepctl_options() {
+  case $1 in
+    purge) printf '%s\n' --urgency --timeout --token --wait-all ;;
+    query) printf '%s\n' --itemized --urgency ;;
+    'state set') printf '%s\n' --type --force ;;
+    'state list' | volumes) printf '%s\n' --names ;;
+    '') printf '%s\n' --version ;;
+  esac
+  printf '%s\n' --json --socket --help
+}
+
+# Values of the option in $1, answers whether it takes one.
+_spacekeepctl_option_value() {
+  case $1 in
+    --urgency) _spacekeepctl_matches "$2" <<<$'1\n2\n3\n4' ;;
+    --type) _spacekeepctl_matches "$2" <<<$'string\nnumber\nbool\nsize\njson' ;;
+    --socket)
+      compopt -o filenames 2>/dev/null
+      mapfile -t COMPREPLY < <(compgen -f -- "$2")
+      ;;
+    --timeout | --token) COMPREPLY=() ;;
+    *) return 1 ;;
+  esac
+}
+
+_spacekeepctl_state_value() {
+  case $1 in
+    SPACEKEEP_CACHE_ENABLED | SPACEKEEP_FINISH_EARLY) printf '%s\n' true false ;;
+  esac
+}
+
+_spacekeepctl() {
+  local tool=$1 current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]} i
+  local -a words=() socket=()
+  COMPREPLY=()
+  # bash splits --option=value into three words.
+  [[ $current == = ]] && current=''
+  [[ $previous == = ]] && previous=${COMP_WORDS[COMP_CWORD - 2]}
+  _spacekeepctl_option_value "$previous" "$current" && return
+  for ((i = 1; i < COMP_CWORD; i++)); do
+    case ${COMP_WORDS[i]} in
+      --socket | --urgency | --timeout | --token | --type)
+        local option=${COMP_WORDS[i]}
+        [[ ${COMP_WORDS[i + 1]} == = ]] && ((i++))
+        ((i++))
+        [[ $option == --socket ]] && socket=(--socket "${COMP_WORDS[i]}")
+        ;;
+      -*) ;;
+      *) words+=("${COMP_WORDS[i]}") ;;
+    esac
+  done
+  local command=${words[0]}
+  [[ $command == state && ${#words[@]} -gt 1 ]] && command="state ${words[1]}"
+  if [[ $current == -* ]]; then
+    _spacekeepctl_matches "$current" < <(_spacekeepctl_options "$command")
+    return
+  fi
+  case "${#words[@]} $command" in
+    '0 ') _spacekeepctl_matches "$current" <<<$'purge\nquery\nstate\nvolumes\ncancel' ;;
+    '1 purge' | '1 query')
+      _spacekeepctl_matches "$current" < <("$tool" "${socket[@]}" volumes --names 2>/dev/null)
+      ;;
+    '1 state') _spacekeepctl_matches "$current" <<<$'get\nset\nunset\nlist' ;;
+    '2 state get' | '2 state set' | '2 state unset')
+      _spacekeepctl_matches "$current" < <("$tool" "${socket[@]}" state list --names 2>/dev/null)
+      ;;
+    '3 state set') _spacekeepctl_matches "$current" < <(_spacekeepctl_state_value "${words[2]}") ;;
+  esac
+}
+
+complete -F _spacekeepctl spacekeepctl

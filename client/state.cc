@@ -25,15 +25,21 @@ void Spacekeep::_clientSetState(ipc::OptionalValue value, const std::string& key
 // shall find later what was said not to be stored.
 std::optional<std::string> Spacekeep::writeState(ipc::OptionalValue value, const std::string& key) {
   if (!user_defaults_) return "there is no preferences suite";
-  const std::optional<Value> before = persistentState();
+  static_cast<void>(persistentState());
+  std::optional<Value> before = user_defaults_->get(keys::kUserDefaults);
+  KeptRecord replaced;
+  if (key == kept_record_.key) replaced = std::exchange(kept_record_, {});
   changeState(std::move(value), key);
   std::optional<std::string> why = user_defaults_->synchronize();
-  if (why) user_defaults_->set(keys::kUserDefaults, before);
+  if (!why) return std::nullopt;
+  user_defaults_->set(keys::kUserDefaults, std::move(before));
+  if (replaced.record) kept_record_ = std::move(replaced);
   return why;
 }
 
 void Spacekeep::changeState(ipc::OptionalValue value, const std::string& key) {
   if (key == kept_record_.key) kept_record_ = {};
+  if (!user_defaults_) return;
   Dictionary state = mutableState();
   if (value) {
     state.set(key, std::move(*value));
@@ -57,8 +63,8 @@ void Spacekeep::_clientGetState(const Value& key, const ValueReply& reply) {
 
 std::optional<Value> Spacekeep::answerFor(const std::string& key) {
   if (key == kept_record_.key || key == keys::kUserDefaults) archiveKeptRecord();
-  const std::optional<Value> stored = persistentState();
-  if (!stored) {
+  const Value* stored = persistentState();
+  if (stored == nullptr) {
     const Value* value = default_values_.find(key);
     return value == nullptr ? std::nullopt : std::optional(*value);
   }
@@ -83,18 +89,18 @@ std::optional<Value> Spacekeep::valueIn(const Dictionary& state, const std::stri
 }
 
 // What is on the disk, with what was set since and is still to be written.
-std::optional<Value> Spacekeep::persistentState() {
-  if (!user_defaults_) return std::nullopt;
+const Value* Spacekeep::persistentState() {
+  if (!user_defaults_) return nullptr;
   if (const auto problem = user_defaults_->refresh()) {
     logProblem("%s %@", "persistentState", *problem);
   }
-  return user_defaults_->get(keys::kUserDefaults);
+  return user_defaults_->find(keys::kUserDefaults);
 }
 
 // A state that is no dictionary is replaced by one with the first change.
 Dictionary Spacekeep::mutableState() {
-  const std::optional<Value> stored = persistentState();
-  const Dictionary* state = stored ? stored->dictionary() : nullptr;
+  const Value* stored = persistentState();
+  const Dictionary* state = stored == nullptr ? nullptr : stored->dictionary();
   return state == nullptr ? Dictionary() : *state;
 }
 

@@ -161,7 +161,8 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
                    DictionaryReply reply);
 
   // Client state, on defaults_queue_.
-  [[nodiscard]] std::optional<Value> persistentState();
+  /// Null when there is none. Good until the suite is touched again.
+  [[nodiscard]] const Value* persistentState();
   [[nodiscard]] Dictionary mutableState();
   [[nodiscard]] std::optional<Value> answerFor(const std::string& key);
   [[nodiscard]] std::optional<Value> valueIn(const Dictionary& state, const std::string& key) const;

@@ -2,6 +2,7 @@
 #include <memory>
 #include <variant>
 
+#include "services/cachedir/index/cache_index.h"
 #include "services/cachedir/program/modes.h"
 #include "services/cachedir/program/stop_signals.h"
 #include "support/logging/log.h"
@@ -21,7 +22,11 @@ int main(int argc, char** argv) {
     std::fprintf(stderr, "%s\n", error->text.c_str());
     return static_cast<int>(ExitCode::kBadRules);
   }
-  const auto cleaner = std::make_shared<CacheCleaner>(std::move(std::get<Rules>(rules)));
+  const bool serves = options.mode == Mode::kCheckIn || options.mode == Mode::kServeSocket;
+  CacheCleaner::Surroundings surroundings;
+  if (serves) surroundings.index = std::make_shared<CacheIndex>();  // a single look needs none
+  const auto cleaner = std::make_shared<CacheCleaner>(
+      std::move(std::get<Rules>(rules)), CacheCleaner::Bounds{}, std::move(surroundings));
   switch (options.mode) {
     case Mode::kOnce:
     case Mode::kDryRun:

@@ -5,10 +5,13 @@
 
 #include "services/cachedir/engine/ages.h"
 #include "services/cachedir/engine/elapsed.h"
+#include "services/cachedir/engine/estimator.h"
 #include "services/cachedir/engine/link_groups.h"
 #include "services/cachedir/engine/remover.h"
 #include "services/cachedir/engine/space_return.h"
 #include "services/cachedir/engine/tree_walk.h"
+#include "services/cachedir/index/cache_index.h"
+#include "services/cachedir/index/indexed_files.h"
 #include "support/runtime/guarded.h"
 
 namespace spacekeep::cachedir {
@@ -28,6 +31,7 @@ class CacheCleaner::Run {
         taken_(taken),
         cancel_(cancel),
         bounds_(cleaner.bounds_),
+        surroundings_(cleaner.surroundings_),
         open_files_(cleaner.open_files_),
         opened_(openRoots(cleaner.rules_, request.volume)) {}
 
@@ -40,6 +44,7 @@ class CacheCleaner::Run {
 
  private:
   void work();
+  void passes(FileSource& source, Remover& remover);
   bool pass(FileSource& source, Remover& remover, bool first);
   bool collect(FileSource& source, OldestFiles& oldest, bool first);
   void removeOldest(Remover& remover, const std::vector<Candidate>& candidates);
@@ -52,6 +57,7 @@ class CacheCleaner::Run {
   const TakenVisitor& taken_;
   const CancelToken& cancel_;
   const Bounds bounds_;
+  const Surroundings& surroundings_;
   OpenFiles& open_files_;
   const OpenedRoots opened_;
   std::vector<std::int64_t> latest_ns_;           // by root: used later than this stays
@@ -61,7 +67,7 @@ class CacheCleaner::Run {
 };
 
 void CacheCleaner::Run::work() {
-  const std::int64_t now_ns = rt::wallClockNs();
+  const std::int64_t now_ns = surroundings_.wall_clock_ns();
   for (const Root& root : opened_.roots) {
     latest_ns_.push_back(request_.periodic
                              ? latestForPeriodic(*root.rule, now_ns)
@@ -74,11 +80,21 @@ void CacheCleaner::Run::work() {
     }
     return;
   }
-  TreeWalk walk(opened_.roots);
   Remover remover(opened_.roots, open_files_, {request_.dry_run, request_.periodic});
-  for (bool first = true; pass(walk, remover, first); first = false) {
+  if (surroundings_.index) {
+    IndexedFiles files(*surroundings_.index, opened_.roots);
+    passes(files, remover);
+    for (std::string& each : files.takeProblems()) result_.problems.push_back(std::move(each));
+  } else {
+    TreeWalk walk(opened_.roots);
+    passes(walk, remover);
   }
   for (auto& [file_system, space] : returns_) space.wait(cancel_);
+}
+
+void CacheCleaner::Run::passes(FileSource& source, Remover& remover) {
+  for (bool first = true; pass(source, remover, first); first = false) {
+  }
 }
 
 /// Whether another pass could find more.
@@ -178,33 +194,32 @@ FreeResult CacheCleaner::free(const FreeRequest& request, const TakenVisitor& ta
 Estimate CacheCleaner::estimate(const std::optional<std::string>& volume,
                                 const CancelToken& cancel) const {
   const OpenedRoots opened = openRoots(rules_, volume);
-  Estimate sum;
-  sum.problems = opened.problems;
   OpenFiles open_files;
+  Estimator estimator(opened.roots, open_files, surroundings_.wall_clock_ns());
   if (opened.roots.empty() || !open_files.scan(opened.roots, cancel)) {
-    sum.cancelled = cancel.cancelled();
-    return sum;
+    estimator.sum.cancelled = cancel.cancelled();
+  } else {
+    estimator.count(surroundings_.index.get(), cancel);
   }
-  const std::int64_t now_ns = rt::wallClockNs();
-  const auto count = [&](const Inode& inode, std::size_t root, std::uint64_t bytes, int mildest) {
-    if (mildest > kUrgencies || open_files.holds(inode, opened.roots[root].file_system)) return;
-    for (auto i = static_cast<std::size_t>(mildest - 1); i < kUrgencies; ++i) {
-      sum.bytes[i] += bytes;
-      ++sum.files[i];
-    }
-  };
-  LinkGroups groups;
-  Tally left;
-  const auto visit = [&](const FoundFile& found) {
-    const std::size_t root = found.folder->root;
-    const int mildest = mildestUrgency(*opened.roots[root].rule, found.used_ns, now_ns);
-    if (found.bytes == 0) return;
-    if (found.links == 1) return count(found.inode, root, found.bytes, mildest);
-    const auto whole = groups.offer(found, mildest);
-    if (whole) count(whole->turn.inode, root, whole->bytes, whole->level);
-  };
-  sum.cancelled = !TreeWalk(opened.roots).forEachFile(visit, cancel, left);
-  return sum;
+  std::vector<std::string>& problems = estimator.sum.problems;
+  problems.insert(problems.begin(), opened.problems.begin(), opened.problems.end());
+  return std::move(estimator.sum);
+}
+
+std::vector<std::string> CacheCleaner::verifyIndex(const std::optional<std::string>& volume,
+                                                   std::uint64_t limit_ns,
+                                                   const CancelToken& cancel) {
+  if (!surroundings_.index) return {};
+  const OpenedRoots opened = openRoots(rules_, volume);
+  const auto use = surroundings_.index->acquire(limit_ns);
+  if (!use) return {};
+  CacheIndex::Verified verified = (*use)->verify(opened.roots, limit_ns, cancel);
+  if (verified.differences > 0) {
+    verified.problems.push_back("the index was wrong about " +
+                                std::to_string(verified.differences) +
+                                " names of which no event had told; it is right now");
+  }
+  return std::move(verified.problems);
 }
 
 }  // namespace spacekeep::cachedir

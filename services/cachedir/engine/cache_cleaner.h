@@ -8,11 +8,13 @@
 #include <atomic>
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 #include <vector>
 
 #include "services/cachedir/engine/candidates.h"
+#include "services/cachedir/engine/estimate.h"
 #include "services/cachedir/engine/file_source.h"
 #include "services/cachedir/engine/open_files.h"
 #include "services/cachedir/engine/roots.h"
@@ -21,6 +23,8 @@
 #include "support/runtime/runtime.h"
 
 namespace spacekeep::cachedir {
+
+class CacheIndex;
 
 struct FreeRequest {
   std::uint64_t amount = 0;  // bytes; 0 frees nothing
@@ -50,14 +54,6 @@ struct FreeResult {
   std::vector<std::string> problems;  // in words
 };
 
-struct Estimate {
-  /// What urgency 1 to 4 could free; each holds what the milder ones hold.
-  std::array<std::uint64_t, kUrgencies> bytes{};
-  std::array<std::uint64_t, kUrgencies> files{};
-  bool cancelled = false;
-  std::vector<std::string> problems;
-};
-
 class CacheCleaner {
  public:
   struct Bounds {
@@ -65,13 +61,26 @@ class CacheCleaner {
     std::size_t max_text_bytes = 16 * 1024 * 1024;
   };
 
+  struct Surroundings {
+    /// Kept from request to request; null: each request walks.
+    std::shared_ptr<CacheIndex> index = {};
+    std::function<std::int64_t()> wall_clock_ns = rt::wallClockNs;
+  };
+
   explicit CacheCleaner(Rules rules) : CacheCleaner(std::move(rules), Bounds{}) {}
-  CacheCleaner(Rules rules, Bounds bounds) : rules_(std::move(rules)), bounds_(bounds) {}
+  CacheCleaner(Rules rules, Bounds bounds)
+      : CacheCleaner(std::move(rules), bounds, Surroundings{}) {}
+  CacheCleaner(Rules rules, Bounds bounds, Surroundings surroundings)
+      : rules_(std::move(rules)), bounds_(bounds), surroundings_(std::move(surroundings)) {}
 
   [[nodiscard]] FreeResult free(const FreeRequest& request, const TakenVisitor& taken = {});
   /// Without the checks that need a file to be opened, so it may promise a little too much.
   [[nodiscard]] Estimate estimate(const std::optional<std::string>& volume,
                                   const CancelToken& cancel = {}) const;
+  /// Compares the index on that volume with the directories, for about `limit_ns`, and mends it.
+  /// Answers what a person should know, in words.
+  std::vector<std::string> verifyIndex(const std::optional<std::string>& volume,
+                                       std::uint64_t limit_ns, const CancelToken& cancel = {});
   /// Ends every request to free that is running or waiting now; each answers with what it has done
   /// so far.
   void cancel();
@@ -85,6 +94,7 @@ class CacheCleaner {
 
   const Rules rules_;
   const Bounds bounds_;
+  const Surroundings surroundings_;
   std::atomic<std::uint64_t> cancels_{0};
 
   rt::Mutex mutex_;

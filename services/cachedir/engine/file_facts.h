@@ -34,6 +34,14 @@ struct Folder {
   return folder.empty() ? std::string(name) : folder + "/" + std::string(name);
 }
 
+/// What there is to know of a regular file, whatever it is called.
+struct FileState {
+  std::uint64_t inode = 0;
+  std::int64_t used_ns = 0;  // wall clock, the later of access and modification
+  std::uint64_t bytes = 0;   // allocated
+  std::uint64_t links = 1;   // hard links the file has anywhere
+};
+
 /// A regular file as a walk found it. `name` is good during the visit only.
 struct FoundFile {
   const std::shared_ptr<const Folder>& folder;

@@ -1,8 +1,8 @@
 // Thread safety: as the implementation says.
 //
-// Where the engine learns of files. Today a walk of the directories answers; an index that is kept
-// between requests can take its place without a change to what chooses, checks and deletes, because
-// every fact is read again from the file itself before anything is deleted.
+// Where the engine learns of files. A walk of the directories answers, or an index that is kept
+// between requests. What chooses, checks and deletes need not know which, because every fact is
+// read again from the file itself before anything is deleted.
 #pragma once
 
 #include <functional>

@@ -137,6 +137,15 @@ std::uint64_t OpenFiles::ageNs() const {
   return good_ ? elapsedNs(scanned_ticks_) : std::numeric_limits<std::uint64_t>::max();
 }
 
+std::set<std::uint64_t> OpenFiles::heldOn(const Root& root) const {
+  std::set<std::uint64_t> numbers;
+  for (const std::uint64_t device : {root.inode.device, root.file_system}) {
+    const auto same = std::ranges::equal_range(held_, device, {}, &Inode::device);
+    for (const Inode& inode : same) numbers.insert(inode.number);
+  }
+  return numbers;
+}
+
 bool OpenFiles::holds(const Inode& inode, std::uint64_t file_system) const {
   return std::ranges::binary_search(held_, inode) ||
          std::ranges::binary_search(held_, Inode{file_system, inode.number});

@@ -6,6 +6,7 @@
 #pragma once
 
 #include <cstdint>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -31,6 +32,8 @@ class OpenFiles {
   [[nodiscard]] std::uint64_t ageNs() const;
   /// Whether somebody held `inode` (of the file system `file_system`) at the scan.
   [[nodiscard]] bool holds(const Inode& inode, std::uint64_t file_system) const;
+  /// The inode numbers on the file system of `root` that somebody held at the scan.
+  [[nodiscard]] std::set<std::uint64_t> heldOn(const Root& root) const;
   /// Processes whose descriptors could not be read.
   [[nodiscard]] std::uint64_t hiddenProcesses() const { return hidden_; }
 

@@ -3,9 +3,8 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <sys/sysmacros.h>
 
-#include <cstring>
+#include <cerrno>
 
 #include "services/cachedir/engine/beneath.h"
 
@@ -15,14 +14,6 @@ namespace {
 struct DirectoryCloser {
   void operator()(DIR* directory) const { ::closedir(directory); }
 };
-
-std::int64_t nsOfStatx(const statx_timestamp& time) {
-  return time.tv_sec * kNsPerSecond + static_cast<std::int64_t>(time.tv_nsec);
-}
-
-bool isDotName(const char* name) {
-  return name[0] == '.' && (name[1] == '\0' || (name[1] == '.' && name[2] == '\0'));
-}
 
 }  // namespace
 
@@ -83,7 +74,7 @@ void TreeWalk::descend(std::vector<Level>& levels, const char* name, Tally& tall
   const Root& root = roots_[above.folder->root];
   std::string path = joined(above.folder->path, name);
   if (isKept(*root.rule, path)) return;
-  if (levels.size() > kMaxDepth || path.size() + NAME_MAX > kMaxPathBytes) {
+  if (isTooDeep(path)) {
     tally.add(Left::kTooDeep);
     return;
   }
@@ -104,21 +95,15 @@ void TreeWalk::meet(const Level& level, const char* name,
                     const std::function<void(const FoundFile&)>& visit, Tally& tally) {
   const Root& root = roots_[level.folder->root];
   if (!root.rule->keep.empty() && isKept(*root.rule, joined(level.folder->path, name))) return;
-  struct statx facts {};
-  if (::statx(level.fd(), name, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT,
-              STATX_BASIC_STATS | STATX_MNT_ID, &facts) != 0) {
-    if (errno != ENOENT) tally.add(Left::kFailed);
-    return;
-  }
-  if (!S_ISREG(facts.stx_mode) || facts.stx_mnt_id != root.mount_id) return;
-  const std::int64_t accessed = nsOfStatx(facts.stx_atime);
-  const std::int64_t modified = nsOfStatx(facts.stx_mtime);
+  const Entry entry = entryAt(level.fd(), name, root);
+  if (entry.kind == Entry::Kind::kFailed) tally.add(Left::kFailed);
+  if (entry.kind != Entry::Kind::kFile) return;
   visit(FoundFile{.folder = level.folder,
                   .name = name,
-                  .inode = {makedev(facts.stx_dev_major, facts.stx_dev_minor), facts.stx_ino},
-                  .used_ns = accessed > modified ? accessed : modified,
-                  .bytes = facts.stx_blocks * 512,
-                  .links = facts.stx_nlink});
+                  .inode = {entry.device, entry.state.inode},
+                  .used_ns = entry.state.used_ns,
+                  .bytes = entry.state.bytes,
+                  .links = entry.state.links});
 }
 
 }  // namespace spacekeep::cachedir

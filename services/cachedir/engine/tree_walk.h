@@ -8,15 +8,11 @@
 #include <string>
 #include <vector>
 
+#include "services/cachedir/engine/entry.h"
 #include "services/cachedir/engine/file_source.h"
 #include "services/cachedir/engine/roots.h"
 
 namespace spacekeep::cachedir {
-
-/// Directories below a root; each costs a descriptor while the walk is inside.
-inline constexpr std::size_t kMaxDepth = 100;
-/// Longest path below a root, in bytes, that openat2(2) takes in one step.
-inline constexpr std::size_t kMaxPathBytes = 4000;
 
 class TreeWalk final : public FileSource {
  public:
@@ -25,11 +21,12 @@ class TreeWalk final : public FileSource {
 
   bool forEachFile(const std::function<void(const FoundFile&)>& visit, const CancelToken& cancel,
                    Tally& tally) override;
+  /// The same for the files of one root, by its index.
+  bool walkRoot(std::size_t index, const std::function<void(const FoundFile&)>& visit,
+                const CancelToken& cancel, Tally& tally);
 
  private:
   struct Level;
-  bool walkRoot(std::size_t index, const std::function<void(const FoundFile&)>& visit,
-                const CancelToken& cancel, Tally& tally);
   void enter(std::vector<Level>& levels, UniqueFd fd, Folder folder, Tally& tally);
   void descend(std::vector<Level>& levels, const char* name, Tally& tally);
   void meet(const Level& level, const char* name,

@@ -5,6 +5,9 @@
 namespace spacekeep::cachedir {
 namespace {
 
+// The daemon waits 15 seconds for the daily upkeep of all services together.
+constexpr std::uint64_t kVerifyNs = 4'000'000'000;
+
 void logProblems(const char* operation, const std::vector<std::string>& problems) {
   for (const std::string& problem : problems) logProblem("%s %s", operation, problem);
 }
@@ -29,7 +32,14 @@ sdk::Answer CacheService::purge(const sdk::Job& job) {
 sdk::Answer CacheService::periodic(const sdk::Job& job) {
   FreeRequest request;
   request.periodic = true;
-  return free("servicePeriodic", job, request);
+  sdk::Answer answer = free("servicePeriodic", job, request);
+  if (job.volume.empty()) return answer;
+  const auto cancellation = job.cancellation;
+  logProblems("servicePeriodic",
+              cleaner_->verifyIndex(job.volume, kVerifyNs, CancelToken([cancellation] {
+                                      return cancellation.cancelled();
+                                    })));
+  return answer;
 }
 
 sdk::Answer CacheService::free(const char* operation, const sdk::Job& job, FreeRequest request) {

@@ -1,5 +1,7 @@
 // Fills a directory with equal files that nobody has used for a long time.
-// Usage: bench-make-files DIRECTORY COUNT BYTES
+// Usage: bench-make-files DIRECTORY COUNT BYTES [reserve]
+//
+// With "reserve" the blocks are only reserved for the files, which takes as much space and no time.
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
@@ -16,12 +18,16 @@ namespace {
 constexpr int kFilesPerDirectory = 500;
 constexpr time_t kDayS = 86'400;
 
-bool writeFile(int directory, const std::string& name, const std::vector<char>& content,
-               int number) {
+bool fillFile(int fd, const std::vector<char>& content, bool reserve) {
+  if (reserve) return posix_fallocate(fd, 0, static_cast<off_t>(content.size())) == 0;
+  return write(fd, content.data(), content.size()) == static_cast<ssize_t>(content.size());
+}
+
+bool writeFile(int directory, const std::string& name, const std::vector<char>& content, int number,
+               bool reserve) {
   const int fd = openat(directory, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0644);
   if (fd < 0) return false;
-  const bool written =
-      write(fd, content.data(), content.size()) == static_cast<ssize_t>(content.size());
+  const bool written = fillFile(fd, content, reserve);
   const time_t when = time(nullptr) - 60 * kDayS + number;
   const timespec times[2] = {{when, 0}, {when, 0}};
   futimens(fd, times);
@@ -32,7 +38,8 @@ bool writeFile(int directory, const std::string& name, const std::vector<char>& 
 }  // namespace
 
 int main(int count, char** arguments) {
-  if (count != 4) return 2;
+  if (count < 4) return 2;
+  const bool reserve = count > 4;
   const std::string root = arguments[1];
   const int files = std::atoi(arguments[2]);
   const std::vector<char> content(static_cast<std::size_t>(std::atoi(arguments[3])), 'x');
@@ -44,7 +51,7 @@ int main(int count, char** arguments) {
       if (directory >= 0) close(directory);
       directory = open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     }
-    if (!writeFile(directory, fmt::format("{:06}", i), content, i)) {
+    if (!writeFile(directory, fmt::format("{:06}", i), content, i, reserve)) {
       fmt::print(stderr, "cannot write file {}\n", i);
       return 1;
     }

@@ -7,6 +7,7 @@ _spacekeepctl_matches() {
   while IFS= read -r line; do
     [[ $line == "$typed"* ]] && COMPREPLY+=("$(printf '%q' "$line")")
   done
+  return 0
 }
 
 # The options of the command in $1; those of the tool itself may stand anywhere.

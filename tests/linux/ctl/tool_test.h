@@ -21,6 +21,12 @@ struct Finished {
   std::string err;
 };
 
+inline std::string contentOf(const std::string& path) {
+  std::ostringstream text;
+  text << std::ifstream(path).rdbuf();
+  return text.str();
+}
+
 /// A shell's command line. COLUMNS and NO_COLOR of whoever runs the tests are taken away.
 inline Finished runShell(const std::string& command_line, const std::string& err_file) {
   const std::string command =
@@ -32,9 +38,7 @@ inline Finished runShell(const std::string& command_line, const std::string& err
   while (const auto size = std::fread(buffer, 1, sizeof buffer, pipe)) run.out.append(buffer, size);
   const int status = pclose(pipe);
   run.exit_code = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-  std::ostringstream text;
-  text << std::ifstream(err_file).rdbuf();
-  run.err = text.str();
+  run.err = contentOf(err_file);
   return run;
 }
 
@@ -42,7 +46,10 @@ inline std::string toolPath() { return std::string(SPACEKEEP_BUILD_DIR) + "/ctl/
 
 class ToolTest : public testing::Test {
  protected:
-  ~ToolTest() override { std::remove(errFile().c_str()); }
+  ~ToolTest() override {
+    std::remove(errFile().c_str());
+    std::remove(terminalFile().c_str());
+  }
 
   /// Runs the tool with `arguments`, as a shell splits them; single quotes must not be in there.
   Finished ctl(const std::string& arguments) {
@@ -56,10 +63,13 @@ class ToolTest : public testing::Test {
   Finished ctlOnTerminal(int columns, const std::string& arguments) {
     const std::string inner = "stty cols " + std::to_string(columns) + "; " + toolPath() +
                               " --socket " + directory_.daemonSocket() + " " + arguments;
-    return runShell(
-        "LANG=C.UTF-8 LC_ALL= TERM=xterm script -qec \"" + inner + "\" /dev/null </dev/null",
-        errFile());
+    return runShell("LANG=C.UTF-8 LC_ALL= TERM=xterm script -fqec \"" + inner + "\" " +
+                        terminalFile() + " </dev/null",
+                    errFile());
   }
+  /// What stood on the terminal so far.
+  [[nodiscard]] std::string onTerminalSoFar() const { return contentOf(terminalFile()); }
+  [[nodiscard]] std::string terminalFile() const { return directory_.path() + "/terminal"; }
   [[nodiscard]] std::string errFile() const { return directory_.path() + "/err"; }
 
   sdk::SocketDirectory directory_;

@@ -74,15 +74,16 @@ class FullVolume {
   }
   [[nodiscard]] bool hasReserve() const { return fs::exists(volume() + "/state/reserve"); }
 
-  /// Takes what there is: first the blocks, to the last one, then the inodes.
+  /// Takes what there is: first the inodes, while the directory can still grow, then the blocks, to
+  /// the last one.
   void fillUp() {
+    // There has to be one to put the blocks in.
+    makeFile(volume() + "/ballast");
+    while (inodes_run_out_ && makeFile(volume() + "/ballast" + std::to_string(++ballast_))) {
+    }
     for (int pass = 0; pass < 3; ++pass) {
       for (const std::size_t piece : {1024U * 1024U, 65536U, 4096U, 512U}) append(piece);
       sync();  // what was promised and not yet placed
-    }
-    while (FileDescriptor(::open(nextBallast().c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600))
-               .valid()) {
-      if (ballast_ > 20'000) break;  // inodes without end
     }
     EXPECT_FALSE(canTakeABlock());
     struct statvfs status {};
@@ -100,7 +101,9 @@ class FullVolume {
   static void shell(const std::string& command) {
     if (std::system(command.c_str()) != 0) throw std::runtime_error("failed: " + command);
   }
-  std::string nextBallast() { return volume() + "/ballast" + std::to_string(++ballast_); }
+  static bool makeFile(const std::string& path) {
+    return FileDescriptor(::open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600)).valid();
+  }
   void append(std::size_t piece) {
     const FileDescriptor file(
         ::open((volume() + "/ballast").c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600));

@@ -20,12 +20,12 @@ constexpr int kReadEntryLine = 622;
 void Spacekeep::clientSetStateSync(StateObject value, const std::string& key) {
   defaults_queue_->assertCurrent("clientSetStateSync");
   if (auto* record = std::get_if<std::shared_ptr<SpacekeepRecentInfo>>(&value)) {
-    kept_record_ = {.key = key, .record = std::move(*record)};
-  } else if (user_defaults_) {
+    keepRecord(std::move(*record), key);
+  } else {
     auto* plain = std::get_if<Value>(&value);
     const ipc::OptionalValue stored = plain == nullptr ? std::nullopt : std::optional(*plain);
     changeState(stored, key);
-    actOnChange(key, stored);
+    if (user_defaults_) actOnChange(key, stored);
   }
   writeSoon();
 }
@@ -56,10 +56,15 @@ StateObject Spacekeep::recordOf(const std::string& key, Value value) {
                "clientGetStateSync", key);
     return {};
   }
-  kept_record_ = {.key = key,
-                  .record = std::make_shared<SpacekeepRecentInfo>(std::move(*record)),
-                  .archive = *archive};
+  keepRecord(std::make_shared<SpacekeepRecentInfo>(std::move(*record)), key);
+  kept_record_.archive = *archive;
   return kept_record_.record;
+}
+
+// One record is kept. Another key's gives way to it and goes on as bytes.
+void Spacekeep::keepRecord(std::shared_ptr<SpacekeepRecentInfo> record, const std::string& key) {
+  if (key != kept_record_.key) archiveKeptRecord();
+  kept_record_ = {.key = key, .record = std::move(record)};
 }
 
 // Somebody wants the bytes. They are not written out by that.

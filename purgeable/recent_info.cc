@@ -9,8 +9,10 @@ constexpr double kNsPerSecond = 1'000'000'000.0;
 
 // A date of the future was written by a clock that has been set back since: its age is unknown.
 bool isFresh(const Date& date, const Date& now, double age_limit_seconds) {
-  const double age_seconds = static_cast<double>(now.unix_ns - date.unix_ns) / kNsPerSecond;
-  return age_seconds >= 0 && age_seconds <= age_limit_seconds;
+  std::int64_t age_ns = 0;
+  // Clients can put any date there; one that is centuries away has no age in 64 bits.
+  if (__builtin_sub_overflow(now.unix_ns, date.unix_ns, &age_ns)) return false;
+  return age_ns >= 0 && static_cast<double>(age_ns) / kNsPerSecond <= age_limit_seconds;
 }
 
 bool isNear(std::uint64_t one, std::uint64_t other, std::uint64_t threshold) {

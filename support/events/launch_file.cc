@@ -16,6 +16,7 @@ constexpr std::string_view kMainsPowerWait = "MAINS_POWER_WAIT_SECONDS";
 constexpr std::string_view kRunWall = "RUN_WALL_NANOSECONDS";
 constexpr std::string_view kRunBoot = "RUN_BOOT_NANOSECONDS";
 constexpr std::string_view kRunBootId = "RUN_BOOT_ID";
+constexpr std::string_view kRunElapsed = "RUN_ELAPSED_NANOSECONDS";
 
 using Problem = std::optional<LaunchFileError>;
 
@@ -71,7 +72,8 @@ std::variant<DailySchedule, LaunchFileError> scheduleFromDocument(const Value& d
 Value documentFromRunRecord(const RunRecord& record) {
   return Dictionary{{std::string(kRunWall), record.wall_ns},
                     {std::string(kRunBoot), record.boot_ns},
-                    {std::string(kRunBootId), record.boot_id}};
+                    {std::string(kRunBootId), record.boot_id},
+                    {std::string(kRunElapsed), record.elapsed_ns}};
 }
 
 std::optional<RunRecord> runRecordFromDocument(const Value& document) {
@@ -80,8 +82,12 @@ std::optional<RunRecord> runRecordFromDocument(const Value& document) {
   const Value* wall = dictionary->find(kRunWall);
   const auto boot = unsignedAt(*dictionary, kRunBoot);
   const std::string* boot_id = stringAt(*dictionary, kRunBootId);
-  if (wall == nullptr || !wall->asSigned() || !boot || boot_id == nullptr) return std::nullopt;
-  return RunRecord{.wall_ns = *wall->asSigned(), .boot_ns = *boot, .boot_id = *boot_id};
+  const auto elapsed = unsignedAt(*dictionary, kRunElapsed);
+  if (wall == nullptr || !wall->asSigned() || !boot || boot_id == nullptr || !elapsed) {
+    return std::nullopt;
+  }
+  return RunRecord{
+      .wall_ns = *wall->asSigned(), .boot_ns = *boot, .boot_id = *boot_id, .elapsed_ns = *elapsed};
 }
 
 }  // namespace spacekeep

@@ -9,6 +9,7 @@
 #include <array>
 #include <cerrno>
 #include <ctime>
+#include <limits>
 #include <mutex>
 #include <utility>
 
@@ -20,6 +21,13 @@ constexpr std::uint64_t kNsPerSecond = 1'000'000'000;
 int openedOrPanic(int fd) {
   if (fd < 0) rt::panic("no descriptors left for the event loop");
   return fd;
+}
+
+/// Never fires, but is cancelled when the clock is set.
+void armForClockChange(int fd) {
+  itimerspec far_away{};
+  far_away.it_value.tv_sec = std::numeric_limits<time_t>::max();
+  ::timerfd_settime(fd, TFD_TIMER_ABSTIME | TFD_TIMER_CANCEL_ON_SET, &far_away, nullptr);
 }
 
 }  // namespace
@@ -153,6 +161,23 @@ void BootTimer::setFor(std::uint64_t boot_ns) {
 void BootTimer::cancel() {
   const itimerspec never{};
   ::timerfd_settime(fd_, TFD_TIMER_ABSTIME, &never, nullptr);
+}
+
+WallClockWatch::WallClockWatch(EventLoop& loop, EventLoop::Callback set)
+    : loop_(loop),
+      fd_(openedOrPanic(::timerfd_create(CLOCK_REALTIME, TFD_CLOEXEC | TFD_NONBLOCK))) {
+  armForClockChange(fd_);
+  loop_.watch(fd_, EPOLLIN, [fd = fd_, set = std::move(set)] {
+    std::uint64_t expirations = 0;
+    const bool was_set = ::read(fd, &expirations, sizeof(expirations)) < 0 && errno == ECANCELED;
+    armForClockChange(fd);
+    if (was_set) set();
+  });
+}
+
+WallClockWatch::~WallClockWatch() {
+  loop_.unwatch(fd_);
+  ::close(fd_);
 }
 
 std::uint64_t bootClockNs() {

@@ -77,6 +77,20 @@ class BootTimer {
   const int fd_;
 };
 
+/// Tells when somebody sets the wall clock (timerfd_create(2), TFD_TIMER_CANCEL_ON_SET); the end of
+/// a suspend may count as that. Lives on the loop's thread.
+class WallClockWatch {
+ public:
+  WallClockWatch(EventLoop& loop, EventLoop::Callback set);
+  ~WallClockWatch();
+  WallClockWatch(const WallClockWatch&) = delete;
+  WallClockWatch& operator=(const WallClockWatch&) = delete;
+
+ private:
+  EventLoop& loop_;
+  const int fd_;
+};
+
 /// Nanoseconds since the machine started, suspend included (CLOCK_BOOTTIME).
 [[nodiscard]] std::uint64_t bootClockNs();
 

@@ -12,7 +12,7 @@
 #include <utility>
 
 #include "support/events/linux/event_files.h"
-#include "support/events/linux/power_supply.h"
+#include "support/events/linux/linux_activity_host.h"
 #include "support/events/linux/system_bus.h"
 #include "support/logging/log.h"
 
@@ -68,16 +68,14 @@ LinuxEventSources::~LinuxEventSources() {
 void LinuxEventSources::registerActivity(const std::string& name, ActivityHandler handler) {
   const auto schedule = loadSchedule(options_.launch_directories, name);
   if (!schedule) return;
-  auto directory = options_.power_supply_directory;
-  DailyActivity::Options activity_options{
-      .name = name,
-      .schedule = *schedule,
-      .record_path = options_.state_directory + "/" + name + ".run",
-      .onMainsPower = [directory] { return onMainsPower(directory); },
-      .readClocks = &readSystemClocks};
+  auto host = std::make_shared<LinuxActivityHost>(
+      loop_,
+      LinuxActivityHost::Options{.record_path = options_.state_directory + "/" + name + ".run",
+                                 .power_supply_directory = options_.power_supply_directory});
   const std::scoped_lock lock(mutex_);
-  activities_.push_back(std::make_shared<DailyActivity>(loop_, global_, std::move(handler),
-                                                        std::move(activity_options)));
+  activities_.push_back(
+      std::make_shared<DailyActivity>(std::move(host), global_, std::move(handler),
+                                      DailyActivity::Options{.name = name, .schedule = *schedule}));
   activities_.back()->start();
 }
 

@@ -9,8 +9,8 @@
 #include <string>
 #include <vector>
 
+#include "support/events/daily_activity.h"
 #include "support/events/events.h"
-#include "support/events/linux/daily_activity.h"
 #include "support/events/linux/event_loop.h"
 #include "support/events/linux/linux_keep_alive.h"
 #include "support/events/low_space_stream.h"

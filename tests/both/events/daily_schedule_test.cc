@@ -20,94 +20,104 @@ Clocks at(std::uint64_t boot_ns, std::int64_t wall_ns = kWallNow) {
   return {.wall_ns = wall_ns, .boot_ns = boot_ns, .boot_id = "now"};
 }
 
+/// The record of a run, as it stands after that time.
+RunRecord ranAgo(std::uint64_t elapsed_ns, const Clocks& now) {
+  return {.wall_ns = now.wall_ns,
+          .boot_ns = now.boot_ns,
+          .boot_id = now.boot_id,
+          .elapsed_ns = elapsed_ns};
+}
+
+struct ElapsedCase {
+  const char* what;
+  RunRecord record;
+  Clocks now;
+  std::uint64_t elapsed_ns;
+};
+
+TEST(RunRecord, HowMuchTimeHasPassed) {
+  const auto kept = [](std::string boot_id) {
+    return RunRecord{.wall_ns = kWallNow,
+                     .boot_ns = 5 * kHour,
+                     .boot_id = std::move(boot_id),
+                     .elapsed_ns = 2 * kHour};
+  };
+  const std::vector<ElapsedCase> cases = {
+      {"in one boot the boot clock counts", kept("now"), at(6 * kHour), 3 * kHour},
+      {"whatever the wall clock says", kept("now"), at(6 * kHour, wall(std::int64_t{40 * kDay})),
+       3 * kHour},
+      {"or said", kept("now"), at(6 * kHour, 0), 3 * kHour},
+      {"a boot clock that stands earlier adds nothing", kept("now"), at(kHour), 2 * kHour},
+      {"across boots the wall clock counts", kept("before"),
+       at(kMinute, wall(std::int64_t{30 * kHour})), 32 * kHour},
+      {"at least the time since the start", kept("before"), at(20 * kHour, wall(1)), 22 * kHour},
+      {"and that alone when the clock was set back", kept("before"), at(20 * kHour, 0), 22 * kHour},
+      {"nothing runs over",
+       {.wall_ns = INT64_MIN, .boot_ns = 0, .boot_id = "before", .elapsed_ns = UINT64_MAX},
+       at(UINT64_MAX, INT64_MAX),
+       UINT64_MAX / 8},
+  };
+  for (const ElapsedCase& each : cases) {
+    EXPECT_EQ(elapsedSince(each.record, each.now), each.elapsed_ns) << each.what;
+  }
+}
+
+TEST(RunRecord, KeptAnewItTellsTheSameByTheClocksOfNow) {
+  const RunRecord kept = recordAsOf(
+      {.wall_ns = kWallNow, .boot_ns = 5 * kHour, .boot_id = "before", .elapsed_ns = 2 * kHour},
+      at(kMinute, wall(std::int64_t{kHour})));
+  EXPECT_EQ(kept, (RunRecord{.wall_ns = wall(std::int64_t{kHour}),
+                             .boot_ns = kMinute,
+                             .boot_id = "now",
+                             .elapsed_ns = 3 * kHour}));
+}
+
+TEST(RunRecord, ItIsKeptAnewOftenAtFirstAndAFewTimesADayLater) {
+  EXPECT_EQ(nextKeepingBootNs(0), 10 * kMinute);
+  EXPECT_EQ(nextKeepingBootNs(10 * kMinute), 20 * kMinute);
+  EXPECT_EQ(nextKeepingBootNs(kHour), 2 * kHour);
+  EXPECT_EQ(nextKeepingBootNs(30 * kHour), 36 * kHour);
+}
+
 struct DueCase {
   const char* what;
-  DailyPlan plan;
-  Clocks now;
-  std::uint64_t due_boot_ns;
+  std::uint64_t elapsed_ns;  // when the plan was made, an hour after the start of the machine
+  std::uint64_t delay_ns;
+  std::uint64_t due_after_ns;  // from then
 };
 
 TEST(DailySchedule, WhenARunIsDue) {
-  const auto ran_this_boot = [](std::uint64_t boot_ns) {
-    return RunRecord{.wall_ns = 0, .boot_ns = boot_ns, .boot_id = "now"};
-  };
-  const auto ran_before_boot = [](std::int64_t wall_ns) {
-    return RunRecord{.wall_ns = wall_ns, .boot_ns = 5 * kDay, .boot_id = "before"};
-  };
-  const std::vector<DueCase> cases = {
-      {"never ran: after the random delay from the start",
-       {.last = {}, .since_boot_ns = kMinute, .delay_ns = 7 * kMinute},
-       at(kMinute),
-       8 * kMinute},
-      {"a day after the last run",
-       {.last = ran_this_boot(kHour), .since_boot_ns = 2 * kHour, .delay_ns = 0},
-       at(3 * kHour),
-       kHour + kDay},
-      {"a day and the random delay after the last run",
-       {.last = ran_this_boot(kHour), .since_boot_ns = 2 * kHour, .delay_ns = kMinute},
-       at(3 * kHour),
-       kHour + kDay + kMinute},
-      {"the wall clock of this boot may jump forward",
-       {.last = ran_this_boot(kHour), .since_boot_ns = 2 * kHour, .delay_ns = 0},
-       at(3 * kHour, wall(100 * std::int64_t{kDay})),
-       kHour + kDay},
-      {"or back",
-       {.last = ran_this_boot(kHour), .since_boot_ns = 2 * kHour, .delay_ns = 0},
-       at(3 * kHour, 0),
-       kHour + kDay},
-      {"missed while the daemon was down: made up for after the random delay",
-       {.last = ran_this_boot(kHour), .since_boot_ns = 9 * kDay, .delay_ns = kMinute},
-       at(9 * kDay),
-       9 * kDay + kMinute},
-      {"six hours before the restart of the machine",
-       {.last = ran_before_boot(wall(-std::int64_t{6 * kHour})),
-        .since_boot_ns = kMinute,
-        .delay_ns = 0},
-       at(kMinute),
-       kMinute + 18 * kHour},
-      {"missed while the machine was off",
-       {.last = ran_before_boot(wall(-std::int64_t{30 * kDay})),
-        .since_boot_ns = kMinute,
-        .delay_ns = 3 * kMinute},
-       at(kMinute),
-       4 * kMinute},
-      {"the wall clock stands before the last run: counts as missed",
-       {.last = ran_before_boot(wall(1)), .since_boot_ns = kMinute, .delay_ns = 3 * kMinute},
-       at(kMinute),
-       4 * kMinute},
-      {"a machine that has been up for longer than the wall clock says",
-       {.last = ran_before_boot(wall(-std::int64_t{kHour})),
-        .since_boot_ns = 2 * kHour,
-        .delay_ns = 0},
-       at(20 * kHour),
-       kDay},
-      {"the boot clock stands before the last run",
-       {.last = ran_this_boot(kDay), .since_boot_ns = kHour, .delay_ns = 0},
-       at(kHour),
-       kHour},
+  const DueCase cases[] = {
+      {"a day after the last run", 2 * kHour, 0, 22 * kHour},
+      {"a day and the random delay", 2 * kHour, kMinute, 22 * kHour + kMinute},
+      {"at once", kDay, 0, 0},
+      {"missed: made up for after the random delay", 9 * kDay, 3 * kMinute, 3 * kMinute},
+      {"but within ten minutes", 9 * kDay, 33 * kMinute, 3 * kMinute},
+      {"a start shortly before it is due", kDay + 30 * kMinute, 32 * kMinute, 2 * kMinute},
   };
   for (const DueCase& each : cases) {
-    EXPECT_EQ(dueBootNs(daily(), each.plan, each.now), each.due_boot_ns) << each.what;
+    const DailyPlan plan{.record = ranAgo(each.elapsed_ns, at(kHour)),
+                         .since_boot_ns = kHour,
+                         .delay_ns = each.delay_ns};
+    // It stays the same while time passes, whatever becomes of the wall clock.
+    for (const std::uint64_t passed : {0 * kHour, kMinute, 20 * kHour, 3 * kDay}) {
+      EXPECT_EQ(dueBootNs(daily(), plan, at(kHour + passed, wall(-std::int64_t{kDay}))),
+                kHour + each.due_after_ns)
+          << each.what;
+    }
   }
 }
 
-TEST(DailySchedule, TheDueTimeStaysTheSameWhileTimePasses) {
-  const DailyPlan plan{
-      .last =
-          RunRecord{.wall_ns = wall(-std::int64_t{6 * kHour}), .boot_ns = 0, .boot_id = "before"},
-      .since_boot_ns = kMinute,
-      .delay_ns = 20 * kMinute};
-  const std::uint64_t due = dueBootNs(daily(), plan, at(kMinute));
-  for (std::uint64_t passed : {kHour, 17 * kHour, 18 * kHour, 18 * kHour + 10 * kMinute, kDay}) {
-    EXPECT_EQ(
-        dueBootNs(daily(), plan, at(kMinute + passed, wall(static_cast<std::int64_t>(passed)))),
-        due)
-        << passed;
-  }
+TEST(DailySchedule, WhatNeverRanCountsAsMissed) {
+  const DailyPlan plan{.record = recordOfNoRun(daily(), at(kMinute)),
+                       .since_boot_ns = kMinute,
+                       .delay_ns = 7 * kMinute};
+  EXPECT_EQ(dueBootNs(daily(), plan, at(kMinute)), 8 * kMinute);
 }
 
 TEST(DailySchedule, ItWaitsAndThenRuns) {
-  const DailyPlan plan{.last = {}, .since_boot_ns = kMinute, .delay_ns = kMinute};
+  const DailyPlan plan{
+      .record = ranAgo(kDay, at(kMinute)), .since_boot_ns = kMinute, .delay_ns = kMinute};
   const DailyDecision early = decideDaily(daily(), plan, at(2 * kMinute - 1), true);
   EXPECT_EQ(early.step, DailyStep::kWait);
   EXPECT_EQ(early.wake_boot_ns, 2 * kMinute);
@@ -115,37 +125,29 @@ TEST(DailySchedule, ItWaitsAndThenRuns) {
 }
 
 TEST(DailySchedule, APunctualRunCountsFromWhenItWasToBeWithoutItsDelay) {
-  const DailyPlan plan{.last = RunRecord{.wall_ns = 0, .boot_ns = 0, .boot_id = "now"},
-                       .since_boot_ns = kMinute,
-                       .delay_ns = 30 * kMinute};
+  const DailyPlan plan{
+      .record = ranAgo(0, at(0)), .since_boot_ns = kMinute, .delay_ns = 30 * kMinute};
   const DailyDecision decision =
       decideDaily(daily(), plan, at(kDay + 30 * kMinute + kSecond), true);
   ASSERT_EQ(decision.step, DailyStep::kRun);
-  EXPECT_EQ(decision.record.boot_ns, kDay);
-  EXPECT_EQ(decision.record.wall_ns, wall(-std::int64_t{30 * kMinute + kSecond}));
-  EXPECT_EQ(decision.record.boot_id, "now");
+  EXPECT_EQ(decision.record, ranAgo(30 * kMinute + kSecond, at(kDay + 30 * kMinute + kSecond)));
 }
 
 TEST(DailySchedule, ALateRunCountsFromWhenItWas) {
-  const DailyPlan plan{.last = RunRecord{.wall_ns = 0, .boot_ns = 0, .boot_id = "now"},
-                       .since_boot_ns = kMinute,
-                       .delay_ns = 0};
+  const DailyPlan plan{.record = ranAgo(0, at(0)), .since_boot_ns = kMinute, .delay_ns = 0};
   const DailyDecision decision = decideDaily(daily(), plan, at(kDay + 5 * kHour), true);
   ASSERT_EQ(decision.step, DailyStep::kRun);
-  EXPECT_EQ(decision.record.boot_ns, kDay + 5 * kHour);
-  EXPECT_EQ(decision.record.wall_ns, kWallNow);
+  EXPECT_EQ(decision.record, ranAgo(0, at(kDay + 5 * kHour)));
 }
 
 TEST(DailySchedule, ManyMissedRunsAreMadeUpForByOne) {
-  DailyPlan plan{.last = RunRecord{.wall_ns = 0, .boot_ns = 0, .boot_id = "now"},
-                 .since_boot_ns = 10 * kDay,
-                 .delay_ns = 0};
-  const DailyDecision first = decideDaily(daily(), plan, at(10 * kDay), true);
+  DailyPlan plan{.record = ranAgo(10 * kDay, at(kHour)), .since_boot_ns = kHour, .delay_ns = 0};
+  const DailyDecision first = decideDaily(daily(), plan, at(kHour), true);
   ASSERT_EQ(first.step, DailyStep::kRun);
-  plan = {.last = first.record, .since_boot_ns = 10 * kDay + kMinute, .delay_ns = 0};
-  const DailyDecision second = decideDaily(daily(), plan, at(10 * kDay + kMinute), true);
+  plan = {.record = first.record, .since_boot_ns = kHour + kMinute, .delay_ns = 0};
+  const DailyDecision second = decideDaily(daily(), plan, at(kHour + kMinute), true);
   EXPECT_EQ(second.step, DailyStep::kWait);
-  EXPECT_EQ(second.wake_boot_ns, 11 * kDay);
+  EXPECT_EQ(second.wake_boot_ns, kHour + kDay);
 }
 
 struct PowerCase {
@@ -158,18 +160,17 @@ struct PowerCase {
 };
 
 TEST(DailySchedule, HowItWaitsForMainsPower) {
+  constexpr std::uint64_t kWait = kDay - 10 * kMinute;
   const PowerCase cases[] = {
       {"not wanted", false, false, 0, DailyStep::kRun, 0},
       {"wanted and there", true, true, 0, DailyStep::kRun, 0},
       {"wanted and missing", true, false, 0, DailyStep::kWaitForPower, 10 * kMinute},
-      {"looks no later than the end of the wait", true, false, kDay - kMinute,
+      {"looks no later than the end of the wait", true, false, kWait - kMinute,
        DailyStep::kWaitForPower, kMinute},
-      {"a further day has passed", true, false, kDay, DailyStep::kRun, 0},
+      {"the wait is over", true, false, kWait, DailyStep::kRun, 0},
       {"comes back meanwhile", true, true, 5 * kHour, DailyStep::kRun, 0},
   };
-  const DailyPlan plan{.last = RunRecord{.wall_ns = 0, .boot_ns = 0, .boot_id = "now"},
-                       .since_boot_ns = 0,
-                       .delay_ns = 0};
+  const DailyPlan plan{.record = ranAgo(0, at(0)), .since_boot_ns = 0, .delay_ns = 0};
   for (const PowerCase& each : cases) {
     DailySchedule schedule = daily();
     schedule.wants_mains_power = each.wants_mains;
@@ -182,19 +183,14 @@ TEST(DailySchedule, HowItWaitsForMainsPower) {
   }
 }
 
-TEST(DailySchedule, AWallClockThatIsSetWildlyInOneBootRunsOnceADay) {
-  DailyPlan plan{.last = RunRecord{.wall_ns = kWallNow, .boot_ns = 0, .boot_id = "now"},
-                 .since_boot_ns = 0,
-                 .delay_ns = 0};
-  int runs = 0;
-  for (std::uint64_t hour = 1; hour <= 24 * 10; ++hour) {
-    const std::int64_t wall_ns = hour % 3 == 0 ? 0 : hour % 3 == 1 ? kWallNow : INT64_MAX / 2;
-    const DailyDecision decision = decideDaily(daily(), plan, at(hour * kHour, wall_ns), true);
-    if (decision.step != DailyStep::kRun) continue;
-    ++runs;
-    plan.last = decision.record;
-  }
-  EXPECT_EQ(runs, 10);
+TEST(DailySchedule, ARestartDoesNotMakeItWaitForMainsPowerAllOverAgain) {
+  DailySchedule schedule = daily();
+  schedule.wants_mains_power = true;
+  schedule.mains_power_wait_seconds = 86400;
+  const DailyPlan plan{
+      .record = ranAgo(47 * kHour, at(kHour)), .since_boot_ns = kHour, .delay_ns = 5 * kMinute};
+  const DailyDecision decision = decideDaily(schedule, plan, at(kHour + 55 * kMinute), false);
+  EXPECT_EQ(decision.step, DailyStep::kRun);
 }
 
 }  // namespace

@@ -1,10 +1,11 @@
-#include "support/events/linux/daily_activity.h"
+#include "support/events/daily_activity.h"
 
 #include <gtest/gtest.h>
 
 #include <mutex>
 
 #include "support/events/linux/event_files.h"
+#include "support/events/linux/linux_activity_host.h"
 #include "support/events/linux/power_supply.h"
 #include "support/queues/waiting.h"
 #include "tests/helpers/log_capture.h"
@@ -22,7 +23,10 @@ class DailyActivityAtWork : public ::testing::Test {
  protected:
   std::shared_ptr<DailyActivity> start(DailySchedule schedule) {
     auto activity = std::make_shared<DailyActivity>(
-        loop_, global_,
+        std::make_shared<LinuxActivityHost>(
+            loop_, LinuxActivityHost::Options{.record_path = record_path_,
+                                              .power_supply_directory = "/nowhere"}),
+        global_,
         [this](Activity& called) {
           {
             const std::scoped_lock lock(mutex_);
@@ -30,11 +34,7 @@ class DailyActivityAtWork : public ::testing::Test {
           }
           called_.signal();
         },
-        DailyActivity::Options{.name = "daily",
-                               .schedule = schedule,
-                               .record_path = record_path_,
-                               .onMainsPower = [] { return true; },
-                               .readClocks = &readSystemClocks});
+        DailyActivity::Options{.name = "daily", .schedule = schedule});
     activity->start();
     return activity;
   }

@@ -2,9 +2,11 @@
 
 #include <gtest/gtest.h>
 #include <sys/epoll.h>
+#include <sys/timex.h>
 #include <unistd.h>
 
 #include <array>
+#include <ctime>
 #include <optional>
 
 #include "support/queues/waiting.h"
@@ -103,6 +105,36 @@ TEST(BootTimer, FiresOnceAtItsTimeAndNotWhenCancelled) {
   fired.wait();
   loop.stop();
   EXPECT_FALSE(cancelled_fired);
+}
+
+/// By a billionth of a second, which nobody else notices.
+bool moveWallClock(long ns) {
+  timex change{};
+  change.modes = ADJ_SETOFFSET | ADJ_NANO;
+  change.time.tv_sec = ns < 0 ? -1 : 0;
+  change.time.tv_usec = ns < 0 ? 1'000'000'000 + ns : ns;
+  return ::clock_adjtime(CLOCK_REALTIME, &change) >= 0;
+}
+
+TEST(WallClockWatch, TellsEachTimeThatTheClockIsSet) {
+  EventLoop loop;
+  CountingSemaphore watched(0);
+  CountingSemaphore set(0);
+  std::optional<WallClockWatch> watch;
+  loop.post([&] {
+    watch.emplace(loop, [&] { set.signal(); });
+    watched.signal();
+  });
+  watched.wait();
+  for (const long ns : {1L, -1L}) {
+    if (!moveWallClock(ns)) {
+      loop.stop();
+      GTEST_SKIP() << "may not set the clock here";
+    }
+    set.wait();
+  }
+  EXPECT_EQ(set.waitForNs(50 * kMs), WaitResult::kTimedOut);
+  loop.stop();
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
 #include "support/services/call_service.h"
 
+#include <algorithm>
 #include <mutex>
 #include <utility>
 
@@ -95,13 +96,21 @@ std::shared_ptr<ipc::Connection> ServiceCaller::reach(const ServiceReference& se
 
 std::shared_ptr<SerialQueue> ServiceCaller::orderOf(const std::string& service_id) {
   const std::scoped_lock lock(mutex_);
-  std::erase_if(orders_, [](const auto& entry) { return entry.second.expired(); });
+  forgetUnusedOrders();
   if (const auto found = orders_.find(service_id); found != orders_.end()) {
     if (auto order = found->second.lock()) return order;
   }
   auto order = SerialQueue::create("services." + service_id, global_);
   orders_[service_id] = order;
   return order;
+}
+
+/// Looks at all of them only when there are twice as many as were left the last time, so that a
+/// call does not cost more the more services there are.
+void ServiceCaller::forgetUnusedOrders() {
+  if (orders_.size() < forget_at_) return;
+  std::erase_if(orders_, [](const auto& entry) { return entry.second.expired(); });
+  forget_at_ = std::max(kFewOrders, 2 * orders_.size());
 }
 
 }  // namespace spacekeep

@@ -3,6 +3,7 @@
 // The act of calling a registered service.
 #pragma once
 
+#include <cstddef>
 #include <functional>
 #include <map>
 #include <memory>
@@ -52,6 +53,9 @@ class ServiceCaller {
              FailureHandler failure, Invoked invoked);
   [[nodiscard]] std::shared_ptr<ipc::Connection> reach(const ServiceReference& service) const;
   [[nodiscard]] std::shared_ptr<SerialQueue> orderOf(const std::string& service_id);
+  void forgetUnusedOrders();
+
+  static constexpr std::size_t kFewOrders = 64;
 
   ConcurrentQueue& global_;
   ipc::Connector& connector_;
@@ -60,6 +64,7 @@ class ServiceCaller {
   /// Protected by mutex_. One for each service that is being called; a queue lives while it has
   /// tasks.
   std::map<std::string, std::weak_ptr<SerialQueue>> orders_;
+  std::size_t forget_at_ = kFewOrders;  // protected by mutex_
 };
 
 }  // namespace spacekeep

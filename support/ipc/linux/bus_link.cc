@@ -65,8 +65,10 @@ void BusLink::start(int fd, uid_t peer_uid) {
   if (!authentication_->begin()) end(LinkEnd::kPeerLeft, "the peer has left");
 }
 
+// Once it is open, each arrival is told once and read to its end: of a thousand sockets that wait for
+// their turn, none is looked at again while the others are served.
 bool BusLink::watch() {
-  events_ = EPOLLIN;
+  events_ = bus_ == nullptr ? EPOLLIN : EPOLLIN | EPOLLRDHUP | EPOLLET;
   return sd_event_add_io(loop_.event(), &io_, fd_, events_, &BusLink::onIo, this) >= 0;
 }
 
@@ -81,9 +83,10 @@ int BusLink::onIo(sd_event_source*, int, std::uint32_t events, void* self) {
     link->authenticate();
     return 0;
   }
+  if ((events & (EPOLLHUP | EPOLLRDHUP)) != 0) link->peer_hung_up_ = true;
   link->process();
   // What was left of a header does not get longer once the peer is gone.
-  if (!link->ended_ && (link->events_ & EPOLLET) != 0 && (events & (EPOLLHUP | EPOLLRDHUP)) != 0) {
+  if (!link->ended_ && link->header_is_incomplete_ && link->peer_hung_up_) {
     link->end(LinkEnd::kPeerLeft, "the peer has left");
   }
   return 0;
@@ -129,9 +132,8 @@ int BusLink::onMessage(sd_bus_message* message, void* self, sd_bus_error*) {
 
 void BusLink::process() {
   processing_ = true;
-  for (int i = 0; i < kMessagesPerTurn && !ended_; ++i) {
-    if (!processOnce()) break;
-  }
+  int turns = 0;
+  while (turns < kMessagesPerTurn && !ended_ && processOnce()) ++turns;
   processing_ = false;
   if (ended_) {
     release();
@@ -139,6 +141,8 @@ void BusLink::process() {
   }
   forgetWritten();
   updateEvents();
+  // What is left gets a turn of its own: watching again tells at once what is there.
+  if (turns == kMessagesPerTurn) sd_event_source_set_io_events(io_, events_);
 }
 
 /// Lets sd-bus read at most one message, and only one whose size is known to be within the limit.
@@ -177,8 +181,8 @@ bool BusLink::processOnce() {
   }
   if (ended_ || progress <= 0) return false;
   // When this message was all there was, the next one wakes the loop by itself, and looking for it
-  // now would be a system call for nothing.
-  return !size_is_known || available != message_size_ || !queued_sizes_.empty();
+  // now would be a system call for nothing. The end of the stream was told already.
+  return !size_is_known || available != message_size_ || !queued_sizes_.empty() || peer_hung_up_;
 }
 
 BusLink::Ahead BusLink::lookAhead() {
@@ -189,9 +193,9 @@ BusLink::Ahead BusLink::lookAhead() {
     return Ahead::kRefused;
   }
   if (seen < 0) return Ahead::kNothing;
-  const bool complete = static_cast<std::size_t>(seen) == header.size();
-  waitForMore(!complete);
-  if (!complete) return Ahead::kIncomplete;
+  // A header of which a part has arrived is left in the socket.
+  header_is_incomplete_ = static_cast<std::size_t>(seen) < header.size();
+  if (header_is_incomplete_) return Ahead::kIncomplete;
   return judgeHeader(header.data()) ? Ahead::kMessage : Ahead::kRefused;
 }
 
@@ -218,16 +222,6 @@ bool BusLink::judgeHeader(const unsigned char* header) {
 bool BusLink::messageWasDropped(std::size_t available) {
   message_read_ += available;
   return message_read_ >= message_size_;
-}
-
-/// A header of which a part has arrived is left in the socket. The socket then stays readable, so
-/// it is watched for the next arrival instead.
-void BusLink::waitForMore(bool until_something_arrives) {
-  const bool waiting = (events_ & EPOLLET) != 0;
-  if (waiting == until_something_arrives) return;
-  events_ = (events_ & EPOLLOUT) | EPOLLIN;
-  if (until_something_arrives) events_ |= EPOLLET | EPOLLRDHUP;
-  sd_event_source_set_io_events(io_, events_);
 }
 
 void BusLink::updateEvents() {

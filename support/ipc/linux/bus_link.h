@@ -79,7 +79,6 @@ class BusLink {
   Ahead lookAhead();
   bool judgeHeader(const unsigned char* header);
   bool messageWasDropped(std::size_t available);
-  void waitForMore(bool until_something_arrives);
   void updateEvents();
   void forgetWritten();
   void end(LinkEnd how, const std::string& why);
@@ -98,6 +97,8 @@ class BusLink {
   std::uint32_t events_ = 0;
   bool processing_ = false;
   bool ended_ = false;
+  bool peer_hung_up_ = false;
+  bool header_is_incomplete_ = false;
   bool in_message_ = false;       // its header was judged, it has not arrived as a whole
   std::size_t message_size_ = 0;  // of that message
   std::size_t message_read_ = 0;  // of it, what sd-bus has read at least

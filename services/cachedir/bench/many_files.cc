@@ -7,13 +7,18 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
+#include <fstream>
 #include <limits>
+#include <memory>
 #include <string>
 
 #include "services/cachedir/engine/cache_cleaner.h"
 #include "services/cachedir/engine/elapsed.h"
+#include "services/cachedir/index/cache_index.h"
 
 namespace spacekeep::cachedir {
 namespace {
@@ -49,6 +54,111 @@ void report(const char* what, std::uint64_t begin_ticks, std::uint64_t files) {
               static_cast<unsigned long long>(files), static_cast<double>(used.ru_maxrss) / 1024.0);
 }
 
+/// Bytes of memory that belong to this process alone.
+double ownMib() {
+  std::ifstream facts("/proc/self/statm");
+  double size = 0, resident = 0, shared = 0;
+  facts >> size >> resident >> shared;
+  return (resident - shared) * static_cast<double>(::sysconf(_SC_PAGESIZE)) / (1024.0 * 1024.0);
+}
+
+CacheCleaner::Surroundings with(const std::shared_ptr<CacheIndex>& index) {
+  CacheCleaner::Surroundings surroundings;
+  surroundings.index = index;
+  return surroundings;
+}
+
+/// Makes files, 2000 a second, on a thread of its own, until it is told to end.
+class Writer {
+ public:
+  explicit Writer(std::string root) : root_(std::move(root)) {
+    thread_ = rt::Thread("writer", [this] { write(); });
+  }
+  ~Writer() {
+    ending_ = true;
+    thread_.join();
+  }
+  Writer(const Writer&) = delete;
+  Writer& operator=(const Writer&) = delete;
+
+ private:
+  void write() {
+    const std::uint64_t begin = rt::ticks();
+    for (std::uint64_t i = 0; !ending_; ++i) {
+      // The newest of the last ten thousand; older ones are written again.
+      makeFile(root_ + "/written/w" + std::to_string(i % 10000), rt::wallClockNs() / kNsPerSecond);
+      const std::uint64_t due_ns = i * 500'000;
+      const std::uint64_t spent_ns = elapsedNs(begin);
+      if (spent_ns + kNsPerMs < due_ns) rt::sleepNs(due_ns - spent_ns);
+    }
+  }
+
+  const std::string root_;
+  std::atomic<bool> ending_{false};
+  rt::Thread thread_;
+};
+
+/// Seconds of processor time of the thread of that name.
+double cpuOf(const std::string& name) {
+  for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+    std::string comm;
+    std::getline(std::ifstream(task.path() / "comm") >> std::ws, comm);
+    if (comm != name) continue;
+    std::uint64_t run_ns = 0;
+    std::ifstream(task.path() / "schedstat") >> run_ns;
+    return static_cast<double>(run_ns) / 1e9;
+  }
+  return 0;
+}
+
+void measureWriter(const std::string& root, const std::shared_ptr<CacheIndex>& index,
+                   CacheCleaner& cleaner) {
+  constexpr std::uint64_t kSeconds = 10;
+  ::mkdir((root + "/written").c_str(), 0755);
+  static_cast<void>(cleaner.estimate({}));  // a directory is followed from the first look at it
+  const double cpu_before = cpuOf("cachedir-events");
+  const std::uint64_t wakes_before = index->inbox().wakeUps();
+  {
+    const Writer writer(root);
+    rt::sleepNs(kSeconds * kNsPerSecond);
+    const double cpu = cpuOf("cachedir-events") - cpu_before;
+    std::printf("2000 files/s written: %.2f %% of a processor, %.1f wake-ups/s, losses %llu\n",
+                cpu * 100 / kSeconds,
+                static_cast<double>(index->inbox().wakeUps() - wakes_before) / kSeconds,
+                static_cast<unsigned long long>(index->history().losses));
+    const std::uint64_t begin = rt::ticks();
+    report("asked while it is written", begin, cleaner.estimate({}).files[3]);
+  }
+  const std::uint64_t wakes_idle = index->inbox().wakeUps();
+  rt::sleepNs(3 * kNsPerSecond);
+  std::printf("wake-ups in 3 s of rest: %llu\n",
+              static_cast<unsigned long long>(index->inbox().wakeUps() - wakes_idle));
+}
+
+void measureIndex(const Rules& rules, std::uint64_t files) {
+  const auto index = std::make_shared<CacheIndex>();
+  CacheCleaner cleaner(rules, {}, with(index));
+  const double before_mib = ownMib();
+  std::uint64_t begin = rt::ticks();
+  report("indexed: first estimate", begin, cleaner.estimate({}).files[3]);
+  std::printf("%.1f bytes of memory per file (%.1f MiB)\n",
+              (ownMib() - before_mib) * 1024 * 1024 / static_cast<double>(files),
+              ownMib() - before_mib);
+  for (int i = 0; i < 3; ++i) {
+    begin = rt::ticks();
+    report("indexed: estimate", begin, cleaner.estimate({}).files[3]);
+  }
+  begin = rt::ticks();
+  report("indexed: 1 % freed", begin,
+         cleaner.free({.amount = files / 100 * kFileBytes, .urgency = 1}).files);
+  begin = rt::ticks();
+  report("indexed: estimate after it", begin, cleaner.estimate({}).files[3]);
+  begin = rt::ticks();
+  static_cast<void>(cleaner.verifyIndex({}, 60 * kNsPerSecond));
+  report("indexed: compared with a walk", begin, files);
+  measureWriter(rules.directories[0].path, index, cleaner);
+}
+
 int measure(const std::string& root, std::uint64_t files) {
   Rules rules;
   rules.directories.push_back(DirectoryRule{.path = root});
@@ -59,6 +169,7 @@ int measure(const std::string& root, std::uint64_t files) {
   begin = rt::ticks();
   report("1 % freed", begin,
          cleaner.free({.amount = files / 100 * kFileBytes, .urgency = 1}).files);
+  measureIndex(rules, files);
   begin = rt::ticks();
   const auto all = std::numeric_limits<std::uint64_t>::max();
   report("all the rest, as a dry run", begin,

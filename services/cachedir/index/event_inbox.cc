@@ -38,10 +38,14 @@ EventInbox::~EventInbox() {
   {
     const std::scoped_lock lock(mutex_);
     ending_ = true;
-    const std::uint64_t one = 1;
-    static_cast<void>(!::write(poke_.get(), &one, sizeof one));
+    poke();
   }
   if (thread_.joinable()) thread_.join();
+}
+
+void EventInbox::poke() {
+  const std::uint64_t one = 1;
+  static_cast<void>(!::write(poke_.get(), &one, sizeof one));
 }
 
 void EventInbox::startThread() {
@@ -71,8 +75,11 @@ void EventInbox::listen() {
 
 EventInbox::Added EventInbox::add(int fd, const WatchOwner& owner, std::uint64_t settle_ns) {
   const std::scoped_lock lock(mutex_);
-  if (!events_) events_.reset(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
-  if (!events_) return {errno == EMFILE ? Outcome::kNoRoom : Outcome::kFailed, -1, {}};
+  if (!events_) {
+    events_.reset(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
+    if (!events_) return {Outcome::kNoRoom, -1, {}};
+    poke();  // the thread may sleep on an earlier one
+  }
   startThread();
   const std::string path = "/proc/self/fd/" + std::to_string(fd);
   if (watched_.size() >= bounds_.max_watches) return {Outcome::kNoRoom, -1, {}};
@@ -164,8 +171,7 @@ void EventInbox::loseEverything() {
   active_.clear();
   names_ = 0;
   events_.reset();
-  const std::uint64_t one = 1;
-  static_cast<void>(!::write(poke_.get(), &one, sizeof one));
+  poke();
 }
 
 Changed EventInbox::takeOf(Watched& watched) {

@@ -96,6 +96,7 @@ class EventInbox {
   };
 
   void listen();
+  void poke();
   void startThread();
   void readAll();
   void hear(const inotify_event& event, std::string_view name, std::uint64_t now_ticks);

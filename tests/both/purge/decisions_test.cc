@@ -53,6 +53,10 @@ TEST(PurgeBucket, IsTheTenthOfTheRequestThatWasReached) {
 
 TEST(PurgeBucket, AlmostEverythingIsCutOffNotCarriedUp) { EXPECT_EQ(percentBucket(1000, 999), 90); }
 
+TEST(PurgeBucket, MoreThanWasAskedForIsABucketAboveAHundred) {
+  EXPECT_EQ(percentBucket(1000, 1500), 150);
+}
+
 TEST(PurgeBucket, InSinglePrecisionTheLastOfAHundredMillionBytesIsNotSeen) {
   EXPECT_EQ(percentBucket(100'000'000, 99'999'999), 100);
 }

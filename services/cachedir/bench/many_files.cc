@@ -184,6 +184,7 @@ int measure(const std::string& root, std::uint64_t files) {
 
 int main(int argc, char** argv) {
   using namespace spacekeep::cachedir;
+  std::setvbuf(stdout, nullptr, _IOLBF, 0);
   if (argc < 2) {
     std::fprintf(stderr, "usage: %s DIRECTORY [FILES]\n", argv[0]);
     return 2;

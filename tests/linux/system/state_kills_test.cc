@@ -1,0 +1,148 @@
+// The daemon is killed at any moment, a thousand times if asked to: what it has answered is there.
+//
+// SPACEKEEP_STATE_KILLS=1000 makes the run longer than the few kills of every day.
+#include <gtest/gtest.h>
+#include <spacekeep/client.h>
+
+#include <algorithm>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <random>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "support/runtime/runtime.h"
+#include "tests/linux/system/sandbox.h"
+#include "tests/linux/system/state_client.h"
+
+namespace spacekeep::system_test {
+namespace {
+
+constexpr int kEverydayKills = 25;
+constexpr std::uint64_t kSlowestRestartMs = 5000;
+constexpr std::uint64_t kMs = 1'000'000;
+
+int killsAskedFor() {
+  const char* asked = std::getenv("SPACEKEEP_STATE_KILLS");
+  return asked == nullptr ? kEverydayKills : std::max(1, std::atoi(asked));
+}
+
+/// One client with a key of its own, whose value it counts up, one call at a time.
+class Writer {
+ public:
+  explicit Writer(int number) : key_("KEY" + std::to_string(number)), number_(number) {}
+
+  /// Writes until the daemon is gone.
+  void writeUntilTheEnd(const std::string& socket) {
+    auto client = sdk::Client::connect({.socket_path = socket, .on_disconnect = {}});
+    if (!client) return;
+    while (true) {
+      ++sent_;
+      if (!client->setState(key_, value(sent_)).ok()) return;
+      answered_ = sent_;
+      ++answers_;
+    }
+  }
+  /// What is stored now: the last answered value or the one that was under way.
+  void check(sdk::Client& client) {
+    const sdk::StateReply reply = client.state(key_);
+    ASSERT_FALSE(reply.error) << reply.error->text;
+    for (std::uint64_t possible = answered_; possible <= sent_; ++possible) {
+      if (possible == 0 ? !reply.value : reply.value == value(possible)) {
+        answered_ = sent_ = possible;
+        return;
+      }
+    }
+    ++lost_;
+    ADD_FAILURE() << key_ << ": answered " << answered_ << ", sent " << sent_
+                  << ", and the daemon holds neither";
+  }
+  [[nodiscard]] std::uint64_t answers() const { return answers_; }
+  [[nodiscard]] std::uint64_t lost() const { return lost_; }
+
+ private:
+  // Of changing size, up to some pages: commits of every shape.
+  [[nodiscard]] Value value(std::uint64_t count) const {
+    const std::size_t size = (count * 977) % (number_ == 0 ? 20'000 : 500);
+    return Dictionary{{"COUNT", count}, {"TEXT", std::string(size, 'x')}};
+  }
+
+  const std::string key_;
+  const int number_;
+  std::uint64_t sent_ = 0;
+  std::uint64_t answered_ = 0;
+  std::uint64_t answers_ = 0;
+  std::uint64_t lost_ = 0;
+};
+
+class StateKills : public testing::Test {
+ protected:
+  void SetUp() override {
+    sandbox_.addVolume("disk", "ext4", 64);
+    sandbox_.start();
+    std::filesystem::create_directory(sandbox_.volume("disk") + "/state");
+    std::filesystem::create_directory_symlink("/volumes/disk/state",
+                                              sandbox_.outside("/var/lib/spacekeep"));
+    for (int i = 0; i < 4; ++i) writers_.emplace_back(i);
+  }
+
+  /// The time from the start to the first answer.
+  std::uint64_t startAndCheckMs() {
+    const std::uint64_t start_ms = monotonicMs();
+    daemon_ = sandbox_.spawn({"/programs/daemon/spacekeepd"}, "daemon.log");
+    const auto client = connectToStarting(sandbox_);
+    const std::uint64_t took_ms = monotonicMs() - start_ms;
+    if (client == nullptr) {
+      ADD_FAILURE() << "no answer after a start: " << sandbox_.daemonLog();
+      return took_ms;
+    }
+    for (Writer& writer : writers_) writer.check(*client);
+    return took_ms;
+  }
+  void writeAndKillAfter(std::uint64_t delay_ns) {
+    std::vector<std::thread> threads;
+    threads.reserve(writers_.size());
+    for (Writer& writer : writers_) {
+      threads.emplace_back([this, &writer] { writer.writeUntilTheEnd(sandbox_.socketPath()); });
+    }
+    rt::sleepNs(delay_ns);
+    daemon_.signal(SIGKILL);
+    daemon_.wait();
+    for (std::thread& thread : threads) thread.join();
+  }
+
+  Sandbox sandbox_;
+  Process daemon_;
+  std::vector<Writer> writers_;
+};
+
+TEST_F(StateKills, LoseNothingThatWasAnsweredAndNeverKeepTheDaemonFromStarting) {
+  const int kills = killsAskedFor();
+  std::mt19937 random(20'240'229);
+  std::uint64_t slowest_ms = startAndCheckMs();
+  for (int kill = 0; kill < kills && !HasFailure(); ++kill) {
+    writeAndKillAfter(random() % (60 * kMs));
+    slowest_ms = std::max(slowest_ms, startAndCheckMs());
+    const std::string log = sandbox_.daemonLog();
+    EXPECT_EQ(log.find("set aside"), std::string::npos) << log;
+    EXPECT_EQ(log.find("cannot be opened"), std::string::npos) << log;
+  }
+  std::uint64_t answers = 0;
+  std::uint64_t lost = 0;
+  for (const Writer& writer : writers_) {
+    answers += writer.answers();
+    lost += writer.lost();
+  }
+  EXPECT_EQ(lost, 0U);
+  EXPECT_GT(answers, static_cast<std::uint64_t>(kills));
+  EXPECT_LT(slowest_ms, kSlowestRestartMs);
+  std::printf("%d kills, %llu answered writes, %llu lost, slowest restart %llu ms\n", kills,
+              static_cast<unsigned long long>(answers), static_cast<unsigned long long>(lost),
+              static_cast<unsigned long long>(slowest_ms));
+}
+
+}  // namespace
+}  // namespace spacekeep::system_test

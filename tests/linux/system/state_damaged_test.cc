@@ -61,13 +61,15 @@ TEST_F(StateInTheWay, ThatIsDamagedIsSetAsideByteForByteAndSaidClearly) {
 }
 
 TEST_F(StateInTheWay, ThatIsTheDatabaseOfAnotherProgramIsSetAsideByteForByte) {
-  fs::create_directories(sandbox_.outside("/var/lib/spacekeep"));
+  const test::TemporaryDirectory elsewhere;
   sqlite3* database = nullptr;
-  ASSERT_EQ(sqlite3_open(sandbox_.outside(kFile).c_str(), &database), SQLITE_OK);
+  ASSERT_EQ(sqlite3_open((elsewhere / "theirs").c_str(), &database), SQLITE_OK);
   ASSERT_EQ(sqlite3_exec(database, "CREATE TABLE theirs (a)", nullptr, nullptr, nullptr),
             SQLITE_OK);
   ASSERT_EQ(sqlite3_close(database), SQLITE_OK);
-  const std::string theirs = test::contentOf(sandbox_.outside(kFile));
+  const std::string theirs = test::contentOf(elsewhere / "theirs");
+  ASSERT_GT(theirs.size(), 4096U);
+  sandbox_.write(kFile, theirs);
   expectItStartsAndWorks();
   EXPECT_EQ(contentsSetAside(), std::vector<std::string>{theirs});
   EXPECT_NE(sandbox_.daemonLog().find("it is the database of another program"), std::string::npos);

@@ -30,7 +30,7 @@ void appendUtf8(std::string& out, std::uint32_t point) {
   }
 }
 
-/// Recursive descent. Every function answers none (or false) once error_ is set.
+/// Recursive descent, as deep as kMaxValueDepth. What answers none or false has said why.
 class Parser {
  public:
   explicit Parser(std::string_view text) : text_(text) {}
@@ -47,6 +47,10 @@ class Parser {
   std::nullopt_t fail(std::string_view what) {
     if (error_.empty()) error_ = fmt::format("{} (byte {})", what, at_);
     return std::nullopt;
+  }
+  bool refuse(std::string_view what) {
+    fail(what);
+    return false;
   }
   void skipSpace() {
     while (at_ < text_.size() && kSpace.find(text_[at_]) != std::string_view::npos) ++at_;
@@ -115,10 +119,10 @@ class Parser {
 
   bool readMember(Dictionary& dictionary, int depth) {
     skipSpace();
-    if (peek() != '"') return fail("a name in double quotes is missing"), false;
+    if (peek() != '"') return refuse("a name in double quotes is missing");
     const auto name = readString();
     if (!name) return false;
-    if (!takeAfterSpace(':')) return fail("\":\" is missing"), false;
+    if (!takeAfterSpace(':')) return refuse("\":\" is missing");
     auto value = readValue(depth + 1);
     if (!value) return false;
     dictionary.set(*name, std::move(*value));
@@ -137,10 +141,10 @@ class Parser {
 
   bool readCharacter(std::string& out) {
     if (static_cast<unsigned char>(peek()) < 0x20) {
-      return fail("a control character must be escaped"), false;
+      return refuse("a control character must be escaped");
     }
     const std::size_t length = utf8SequenceLength(text_.substr(at_));
-    if (length == 0) return fail("this is no UTF-8"), false;
+    if (length == 0) return refuse("this is no UTF-8");
     out += text_.substr(at_, length);
     at_ += length;
     return true;
@@ -151,7 +155,7 @@ class Parser {
     constexpr std::string_view kMeanings = "\"\\/\b\f\n\r\t";
     if (take('u')) return readCodePoint(out);
     const std::size_t index = at_ < text_.size() ? kEscapes.find(peek()) : std::string_view::npos;
-    if (index == std::string_view::npos) return fail("this escape is not known"), false;
+    if (index == std::string_view::npos) return refuse("this escape is not known");
     out += kMeanings[index];
     ++at_;
     return true;
@@ -162,13 +166,13 @@ class Parser {
     auto point = readHex();
     if (point && *point >= 0xD800 && *point < 0xDC00) {
       const auto low = takeWord("\\u") ? readHex() : std::nullopt;
-      if (!low || *low < 0xDC00 || *low > 0xDFFF) return fail("half a character"), false;
+      if (!low || *low < 0xDC00 || *low > 0xDFFF) return refuse("half a character");
       point = 0x10000 + ((*point - 0xD800) << 10) + (*low - 0xDC00);
     } else if (point && *point >= 0xDC00 && *point <= 0xDFFF) {
-      return fail("half a character"), false;
+      return refuse("half a character");
     }
-    if (!point) return fail("\\u needs four hexadecimal digits"), false;
-    if (*point == 0) return fail("a string cannot hold a zero character"), false;
+    if (!point) return refuse("\\u needs four hexadecimal digits");
+    if (*point == 0) return refuse("a string cannot hold a zero character");
     appendUtf8(out, *point);
     return true;
   }

@@ -65,7 +65,9 @@ ExitCode listNames(const CommonOptions& common) {
     for (const auto& [key, value] : *state) names.insert(harmless(key));
   }
   for (const auto& name : names) fmt::print("{}\n", name);
-  return state ? ExitCode::kDone : complain(common, state.error());
+  if (state) return ExitCode::kDone;
+  remark(state.error().text);  // also with --json: the output is names
+  return exitCodeOf(state.error().kind);
 }
 
 }  // namespace

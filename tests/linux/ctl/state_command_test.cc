@@ -181,6 +181,7 @@ TEST_F(StateCommand, NamesAreForCompletionsAndNeedNoDaemon) {
   const Finished alone = ctlWithSocket("state list --names");
   EXPECT_EQ(alone.exit_code, 3);
   EXPECT_EQ(alone.out, known);
+  EXPECT_EQ(ctlWithSocket("state list --names --json").out, known);
   seen_.set(Dictionary{{"mine", "x"}});
   serveState();
   const Finished run = ctlWithSocket("state list --names");

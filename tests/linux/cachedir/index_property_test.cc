@@ -172,13 +172,13 @@ TEST_P(IndexProperty, AfterAnyChangesTheIndexAnswersWhatAWalkAnswers) {
   Changes changes(cache, volume / "outside", GetParam().seed, [&] { world.known(); });
   std::mt19937 batches(GetParam().seed);
   // On a file system that settles late, each answer looks at all that changed in a minute.
-  for (int batch = 0; batch < 250 && !HasFailure(); ++batch) {
-    const auto size = 1 + batches() % 20;
+  for (int batch = 0; batch < 200 && !HasFailure(); ++batch) {
+    const auto size = 1 + batches() % 40;
     for (std::size_t i = 0; i < size; ++i) changes.one();
     if (std::string(GetParam().kind) != "tmpfs") volume.settle();
     world.known();
   }
-  EXPECT_GT(changes.done(), 700U) << "most calls failed: this tested little";
+  EXPECT_GT(changes.done(), 1000U) << "most calls failed: this tested little";
   EXPECT_EQ(world.index().history().losses, 0U);
 }
 

@@ -69,7 +69,7 @@ void setState(sd_bus* bus, const std::string& text) {
   const bench::Message call(raw);
   bench::check(sd_bus_message_append(raw, "avs", 1, "s", text.c_str(), "BENCH"), "append");
   sd_bus_message* reply = nullptr;
-  sd_bus_error error = SD_BUS_ERROR_NULL;
+  sd_bus_error error = {};
   const int result = sd_bus_call(bus, raw, 0, &error, &reply);
   if (result < 0) fmt::print(stderr, "{}\n", error.message == nullptr ? "" : error.message);
   bench::check(result, "clientSetState");

@@ -24,11 +24,12 @@ struct WatchLimits {
   std::uint64_t last_repeat_ns = 3'600'000'000'000;
   /// The same where space still comes and goes.
   std::uint64_t first_hasty_repeat_ns = 1'000'000'000;
-  /// What a quiet device can be filled with out of the blue. On a small volume it is less: nobody
-  /// can be in time for one whose whole threshold is used up within less than this time.
-  double burst_bytes_per_second = 80.0 * 1024 * 1024;
+  /// What a quiet volume can be filled with out of the blue: writers of 80 MiB/s that were held up
+  /// for a moment catch up at twice that. On a small volume it is less: nobody can be in time for
+  /// one whose whole threshold is used up within less than this time.
+  double burst_bytes_per_second = 160.0 * 1024 * 1024;
   double burst_inodes_per_second = 20'000;
-  std::uint64_t threshold_lasts_ns = 1'250'000'000;
+  std::uint64_t threshold_lasts_ns = 625'000'000;
   /// After this time without a faster filling the fastest one seen counts half.
   std::uint64_t rate_half_life_ns = 600'000'000'000;
   /// While an event is handled no further one can be sent, so a low volume is looked at this often

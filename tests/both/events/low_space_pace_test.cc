@@ -45,9 +45,9 @@ TEST(TimeToUseUp, IsTheQuotientAndNeverOverflows) {
 }
 
 TEST(LowSpacePace, ABurstIsWhatADeviceCanDoAndLessOnASmallVolume) {
-  EXPECT_DOUBLE_EQ(bytes(64 * kGiB, 0).burst_per_second, 80.0 * kMiB);
-  EXPECT_DOUBLE_EQ(bytes(2 * kGiB, 0).burst_per_second, 80.0 * kMiB);
-  EXPECT_DOUBLE_EQ(bytes(200 * kMiB, 0).burst_per_second, 8.0 * kMiB);
+  EXPECT_DOUBLE_EQ(bytes(64 * kGiB, 0).burst_per_second, 160.0 * kMiB);
+  EXPECT_DOUBLE_EQ(bytes(2 * kGiB, 0).burst_per_second, 160.0 * kMiB);
+  EXPECT_DOUBLE_EQ(bytes(200 * kMiB, 0).burst_per_second, 16.0 * kMiB);
 }
 
 struct PauseCase {
@@ -59,12 +59,12 @@ struct PauseCase {
 
 TEST(LowSpacePace, HowLongAQuietVolumeIsLeftAlone) {
   const PauseCase cases[] = {
-      {"very far: hours", 4096 * kGiB, 2048 * kGiB, 4 * kHour},
+      {"very far: hours", 4096 * kGiB, 3000 * kGiB, 4 * kHour},
       {"far: the burst down to half of the threshold", 64 * kGiB, 20 * kGiB + 250 * kMiB,
-       256 * kSecond},
-      {"just far", 64 * kGiB, 4800 * kMiB + 250 * kMiB, 60 * kSecond},
-      {"no more far", 64 * kGiB, 2250 * kMiB, 25 * kSecond},
-      {"at the threshold", 64 * kGiB, 500 * kMiB, 3125 * kMs},
+       128 * kSecond},
+      {"just far", 64 * kGiB, 9600 * kMiB + 250 * kMiB, 60 * kSecond},
+      {"no more far", 64 * kGiB, 2250 * kMiB, 12'500 * kMs},
+      {"at the threshold", 64 * kGiB, 500 * kMiB, 1'562'500'000},
       {"a small volume that is half empty is far", 2 * kGiB, kGiB, 60 * kSecond},
       {"a smaller one too", 64 * kMiB, 32 * kMiB, 60 * kSecond},
       {"below its threshold, though it was not reported yet", 2000 * kMiB, 40 * kMiB, 250 * kMs},
@@ -75,12 +75,12 @@ TEST(LowSpacePace, HowLongAQuietVolumeIsLeftAlone) {
   }
 }
 
-// 2 GiB, low below 102.4 MiB, which 80 MiB/s use up in 1.28 s.
+// 2 GiB, low below 102.4 MiB, which 160 MiB/s use up in 0.64 s.
 TEST(LowSpacePace, ABurstOutOfTheBlueIsSeenWithHalfOfTheThresholdLeft) {
   constexpr std::uint64_t kLow = 2 * kGiB / 20;
   for (std::uint64_t available = kLow; available < kGiB; available += kMiB) {
     const double pause_seconds = static_cast<double>(pauseOf(bytes(2 * kGiB, available))) / 1e9;
-    const double left = static_cast<double>(available) - pause_seconds * 80.0 * kMiB;
+    const double left = static_cast<double>(available) - pause_seconds * 160.0 * kMiB;
     EXPECT_GE(left, kLow / 2 - 1.0) << available;
   }
 }
@@ -94,10 +94,10 @@ TEST(LowSpacePace, AFasterFillingThatWasSeenIsReckonedWith) {
 TEST(LowSpacePace, AReportedVolumeThatIsQuietIsLeftAloneForLonger) {
   const SpaceMeasure low = bytes(2 * kGiB, 60 * kMiB);
   const VolumeCare reported{.is_reported = true};
-  EXPECT_EQ(pauseOf(low, reported, 0, 0), 375 * kMs);
+  EXPECT_EQ(pauseOf(low, reported, 0, 0), 250 * kMs);
   EXPECT_EQ(pauseOf(low, reported, 0, 40 * kSecond), 10 * kSecond);
   EXPECT_EQ(pauseOf(low, reported, 0, kHour), 60 * kSecond);
-  EXPECT_EQ(pauseOf(low, {}, 0, kHour), 375 * kMs) << "nobody has been told yet";
+  EXPECT_EQ(pauseOf(low, {}, 0, kHour), 250 * kMs) << "nobody has been told yet";
   // Short only by the hysteresis: a purge has helped, so the next one may too.
   EXPECT_LT(pauseOf(bytes(2 * kGiB, 110 * kMiB), reported, 0, kHour), kSecond);
 }

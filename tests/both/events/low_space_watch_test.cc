@@ -32,12 +32,12 @@ TEST(LowSpaceWatch, TheVolumeInGreatestNeedDecides) {
   LowSpaceWatch watch;
   auto samples = volume(60 * kGiB);
   samples.push_back(volume(890 * kMiB, SpaceLevel::kEnough, "/near")[0]);
-  EXPECT_EQ(watch.look(samples, 0).pause_ns, 8 * kSecond);
+  EXPECT_EQ(watch.look(samples, 0).pause_ns, 4 * kSecond);
 }
 
 TEST(LowSpaceWatch, AFastFillingMakesItLookSooner) {
   LowSpaceWatch watch;
-  EXPECT_EQ(watch.look(volume(40 * kGiB + 250 * kMiB), 0).pause_ns, 512 * kSecond);
+  EXPECT_EQ(watch.look(volume(40 * kGiB + 250 * kMiB), 0).pause_ns, 256 * kSecond);
   // 20 GiB in 100 s: 0.2 GiB/s; the 20 GiB that are left last for 100 s.
   EXPECT_EQ(watch.look(volume(20 * kGiB + 250 * kMiB), 100 * kSecond).pause_ns, 100 * kSecond);
 }

@@ -105,17 +105,19 @@ std::uint64_t leftAtFirstEvent(std::uint64_t size, std::uint64_t available,
 
 TEST(LowSpaceFilling, ABurstOnTwoGibibytesIsReportedWithHalfOfTheThresholdLeft) {
   constexpr std::uint64_t kLow = 2 * kGiB / 20;
-  for (const std::uint64_t available : {110 * kMiB, 150 * kMiB, 300 * kMiB, 1000 * kMiB}) {
-    inEverySchedule(100, [&] {
-      EXPECT_GE(leftAtFirstEvent(2 * kGiB, available, 80 * kMiB), kLow / 2 - kMiB) << available;
-    });
+  for (const std::uint64_t rate : {10 * kMiB, 80 * kMiB, 160 * kMiB}) {
+    for (const std::uint64_t available : {110 * kMiB, 150 * kMiB, 300 * kMiB, 1000 * kMiB}) {
+      inEverySchedule(100, [&] {
+        EXPECT_GE(leftAtFirstEvent(2 * kGiB, available, rate), kLow / 2 - kMiB) << available;
+      });
+    }
   }
 }
 
 TEST(LowSpaceFilling, ABurstOnALargeVolumeIsToo) {
   for (const std::uint64_t available : {501 * kMiB, 3 * kGiB, 20 * kGiB, 60 * kGiB}) {
     inEverySchedule(100, [&] {
-      EXPECT_GE(leftAtFirstEvent(64 * kGiB, available, 80 * kMiB), 249 * kMiB) << available;
+      EXPECT_GE(leftAtFirstEvent(64 * kGiB, available, 160 * kMiB), 249 * kMiB) << available;
     });
   }
 }

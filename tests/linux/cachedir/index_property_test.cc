@@ -172,7 +172,10 @@ TEST_P(IndexProperty, AfterAnyChangesTheIndexAnswersWhatAWalkAnswers) {
   Changes changes(cache, volume / "outside", GetParam().seed, [&] { world.known(); });
   std::mt19937 batches(GetParam().seed);
   // On a file system that settles late, each answer looks at all that changed in a minute.
-  for (int batch = 0; batch < 200 && !HasFailure(); ++batch) {
+  const auto enough = [&changes](int batch) {
+    return batch >= 1000 || (batch >= 200 && changes.done() > 1000);
+  };
+  for (int batch = 0; !enough(batch) && !HasFailure(); ++batch) {
     const auto size = 1 + batches() % 40;
     for (std::size_t i = 0; i < size; ++i) changes.one();
     if (std::string(GetParam().kind) != "tmpfs") volume.settle();

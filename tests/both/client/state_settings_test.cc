@@ -169,6 +169,16 @@ TEST(LowSpaceState, ABadValueInTheStoredStateIsAProblemAtStartAndTheOthersHold) 
   });
 }
 
+TEST(LowSpaceState, ABadValueIsNotComplainedOfAgainWhenOtherKeysAreSet) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    EXPECT_TRUE(world.set(kBytes, Value("lots")));
+    EXPECT_TRUE(world.set("key", Value(1)));
+    EXPECT_EQ(world.problems().size(), 1U);
+  });
+}
+
 TEST(LowSpaceState, AStoredStateThatIsNoDictionaryLeavesTheDefaults) {
   inEverySchedule(kSchedules, [] {
     StateWorld world;

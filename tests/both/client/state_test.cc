@@ -228,6 +228,19 @@ TEST(ClientState, ManyClientsSettingAtOnceLoseNothing) {
   });
 }
 
+TEST(ClientState, WhatStandsOnTheDiskIsReadAgainForEveryGetAndSet) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    EXPECT_TRUE(world.set("key", Value(1)));
+    world.putOnDisk(Dictionary{{"key", 2}});
+    EXPECT_EQ(world.get("key"), Value(2));
+    world.putOnDisk(Dictionary{{"key", 3}});
+    EXPECT_TRUE(world.set("other", Value(1)));
+    EXPECT_EQ(world.stateOnDisk(), Value(Dictionary{{"key", 3}, {"other", 1}}));
+  });
+}
+
 TEST(ClientState, IsThereAfterARestart) {
   inEverySchedule(kSchedules, [] {
     sim::InMemoryDisk::Contents kept;

@@ -38,6 +38,18 @@ TEST(LateWrite, AThousandAnswersMakeOneWriteFiveSecondsAfterTheFirst) {
   });
 }
 
+TEST(LateWrite, ASteadyStreamOfAnswersIsWrittenOnceInFiveSeconds) {
+  inEverySchedule(10, [] {
+    StateWorld world;
+    world.start();
+    for (int i = 0; i < 210; ++i) {
+      world.setSync(shared(recordOf("/", "cache", i)), keys::kRecentServiceStats);
+      rt::sleepNs(kSecond / 10);
+    }
+    EXPECT_EQ(world.world.disk().writes(), 4U);
+  });
+}
+
 TEST(LateWrite, EachFurtherRoundHasItsOwnFiveSeconds) {
   inEverySchedule(kSchedules, [] {
     StateWorld world;

@@ -110,6 +110,33 @@ TEST(LowDisk, WhichEventIsCountedByWhichFlags) {
   }
 }
 
+TEST(LowDisk, AnEventWithBothBitsIsCountedAsLowOnly) {
+  inEverySchedule(kSchedules, [] {
+    LowDiskWorld world({"/data"});
+    world.endPurgesEarly();
+    world.daemon->handleVFSStreamEvent({{"_Flags", 0x204U}});
+    EXPECT_EQ(world.world.statistics().timesReported("SK_LOWDISK_EVENT"), 1U);
+    EXPECT_EQ(world.world.statistics().timesReported("SK_VERYLOWDISK_EVENT"), 0U);
+    EXPECT_EQ(world.problems(), std::vector<std::string>{"handleVFSStreamEvent caught VQ_LOWDISK"});
+  });
+}
+
+TEST(LowDisk, AnEventWithNeitherBitStillPurgesEachLowVolumeAndIsReportedWithoutAName) {
+  inEverySchedule(kSchedules, [] {
+    LowDiskWorld world({"/data", "/"});
+    world.endPurgesEarly();
+    world.daemon->handleVFSStreamEvent({{"_Flags", 0U}});
+    const auto requests = world.requests();
+    ASSERT_EQ(requests.size(), 2U);
+    expectLowDiskRequest(requests[0], "/data");
+    expectLowDiskRequest(requests[1], "/");
+    EXPECT_EQ(world.world.statistics().timesReportedWithoutKey(), 1U);
+    EXPECT_EQ(world.world.statistics().timesReported("SK_LOWDISK_EVENT"), 0U);
+    EXPECT_EQ(world.world.statistics().timesReported("SK_VERYLOWDISK_EVENT"), 0U);
+    EXPECT_TRUE(world.problems().empty());
+  });
+}
+
 TEST(LowDisk, WhileNoVolumeIsLowThereIsNoPurgeAndNoStatisticWhateverTheFlags) {
   for (const std::uint64_t flags : {0x4U, 0x200U, 0x204U, 0U}) {
     inEverySchedule(kSchedules, [&] {

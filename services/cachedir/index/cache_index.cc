@@ -2,10 +2,10 @@
 
 #include <algorithm>
 #include <limits>
-#include <mutex>
 
 #include "services/cachedir/engine/elapsed.h"
 #include "services/cachedir/index/file_systems.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::cachedir {
 namespace {

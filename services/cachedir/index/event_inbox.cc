@@ -9,10 +9,10 @@
 #include <cerrno>
 #include <cstring>
 #include <iterator>
-#include <mutex>
 #include <utility>
 
 #include "services/cachedir/engine/elapsed.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::cachedir {
 namespace {

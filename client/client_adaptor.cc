@@ -21,7 +21,9 @@ constexpr std::size_t kCancelLaneWidth = 16;
 
 SpacekeepClientProtocol::DictionaryReply takingDictionary(Responder responder) {
   return [responder = std::move(responder)](ipc::OptionalDictionary result) {
-    responder.reply({std::move(result)});
+    Arguments answer;  // a list in braces would copy what may be thousands of entries
+    answer.emplace_back(std::move(result));
+    responder.reply(std::move(answer));
   };
 }
 

@@ -47,10 +47,10 @@ std::optional<Dictionary> Spacekeep::totalAvailable(const Value& info) {
   waiting->group.enter();
   purgeable_queue_->async([self = shared_from_this(), waiting, info] {
     const auto operation = makeOperation<SpacekeepPurgeableOperation>(self->platform_, info,
-                                                                      *self->copyServices(), self);
+                                                                      self->copyServices(), self);
     if (operation) {
       operation->startOperation(
-          [waiting](const Dictionary& outcome) { waiting->outcome = outcome; });
+          [waiting](Dictionary outcome) { waiting->outcome = std::move(outcome); });
     }
     waiting->group.leave();
   });
@@ -65,7 +65,7 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
   };
   const auto waiting = std::make_shared<Waiting>();
   const Value* asked_token = info.dictionary() ? info.dictionary()->find(keys::kToken) : nullptr;
-  const auto operation = makeOperation<SpacekeepPurgeOperation>(platform_, info, *copyServices());
+  const auto operation = makeOperation<SpacekeepPurgeOperation>(platform_, info, copyServices());
   if (operation) operation->setFinishEarlyByDefault(finish_early_);
   const Value token = asked_token ? *asked_token : platform_.createSpacekeepToken();
 
@@ -107,8 +107,7 @@ std::uint64_t Spacekeep::requestsInFlight(const Array& collection) const {
 
 // On the calling thread: the daily pass visits one volume after the other.
 void Spacekeep::performPeriodicsWithInfo(const Value& info) {
-  const auto operation =
-      makeOperation<SpacekeepPeriodicOperation>(platform_, info, *copyServices());
+  const auto operation = makeOperation<SpacekeepPeriodicOperation>(platform_, info, copyServices());
   if (!operation) return;
   operation->startOperation([](const Dictionary& outcome) {
     logTrace("%s result: %@", "performPeriodicsWithInfo", outcome);

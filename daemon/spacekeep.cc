@@ -109,6 +109,7 @@ const ServiceMap& Spacekeep::services() const {
 void Spacekeep::setServices(ServiceMap services) {
   collection_queue_->assertCurrent("setServices");
   services_ = std::move(services);
+  snapshot_ = nullptr;
 }
 
 const std::set<std::string>& Spacekeep::daemons() const {

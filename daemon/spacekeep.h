@@ -194,6 +194,8 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   bool late_write_is_due_ = false;                   // confined to defaults_queue_
   std::atomic<bool> finish_early_ = false;           // of purges that do not say
   ServiceMap services_;                              // confined to collection_queue_
+  // Of services_ as it is, null after a change. Confined to collection_queue_.
+  mutable std::shared_ptr<const ServiceMap> snapshot_;
   std::optional<Array> operations_;
   std::set<std::string> daemons_;  // confined to daemons_queue_
   Dictionary default_values_;

@@ -26,7 +26,7 @@ std::int32_t urgencyLimitOf(const Dictionary& info) {
   return static_cast<std::int32_t>(*level);
 }
 
-bool SpacekeepOperation::initWithInfo(const Value& info, ServiceMap services) {
+bool SpacekeepOperation::initWithInfo(const Value& info, ServiceSnapshot services) {
   const Dictionary* request = info.dictionary();
   if (request == nullptr) {
     logProblem("%s info is not a dictionary!", "initWithInfo");
@@ -98,8 +98,8 @@ const std::set<std::string>& SpacekeepOperation::inFlight() const {
 }
 
 std::shared_ptr<SKService> SpacekeepOperation::serviceFor(const std::string& service_id) const {
-  const auto found = services_.find(service_id);
-  return found == services_.end() ? nullptr : found->second;
+  const auto found = services().find(service_id);
+  return found == services().end() ? nullptr : found->second;
 }
 
 void SpacekeepOperation::cancelOperation() {

@@ -20,8 +20,23 @@
 
 namespace spacekeep {
 
-/// Receives an outcome. May be called more than once, on any thread.
-using OperationCompletion = std::function<void(const Dictionary&)>;
+/// Receives an outcome, to keep. May be called more than once, on any thread.
+using OperationCompletion = std::function<void(Dictionary)>;
+
+/// A snapshot of the registry. Operations share it, since it may hold thousands of services.
+class ServiceSnapshot {
+ public:
+  ServiceSnapshot() : ServiceSnapshot(ServiceMap()) {}
+  ServiceSnapshot(ServiceMap services)  // NOLINT: a map is a snapshot of its own
+      : services_(std::make_shared<const ServiceMap>(std::move(services))) {}
+  ServiceSnapshot(std::shared_ptr<const ServiceMap> services)  // NOLINT: the same, not null
+      : services_(std::move(services)) {}
+
+  [[nodiscard]] const ServiceMap& operator*() const { return *services_; }
+
+ private:
+  std::shared_ptr<const ServiceMap> services_;
+};
 
 /// What the daemon starts and cancels operations through.
 class OperationInterface {
@@ -41,7 +56,7 @@ class SpacekeepOperation : public OperationInterface,
   explicit SpacekeepOperation(Platform& platform) : platform_(platform) {}
 
   /// False when the request is refused; result() then holds only "SPACEKEEP_ERROR".
-  [[nodiscard]] virtual bool initWithInfo(const Value& info, ServiceMap services);
+  [[nodiscard]] virtual bool initWithInfo(const Value& info, ServiceSnapshot services);
 
   /// Answers whether the set was changed. Not from a task on collection_queue().
   bool updateInFlight(const std::string& service_id, bool add);
@@ -56,7 +71,7 @@ class SpacekeepOperation : public OperationInterface,
   void cancelOperation() override;
 
   [[nodiscard]] const Dictionary& info() const { return info_; }
-  [[nodiscard]] const ServiceMap& services() const { return services_; }
+  [[nodiscard]] const ServiceMap& services() const { return *services_; }
   [[nodiscard]] const Dictionary& result() const { return result_; }
   /// "SPACEKEEP_VOLUME" as it came, before it was checked.
   [[nodiscard]] const std::optional<Value>& volume() const { return volume_; }
@@ -69,7 +84,7 @@ class SpacekeepOperation : public OperationInterface,
 
  protected:
   // Before the operation is started.
-  void setServices(ServiceMap services) { services_ = std::move(services); }
+  void setServices(ServiceSnapshot services) { services_ = std::move(services); }
   void setUrgencyLimit(std::int32_t urgency_limit) { urgency_limit_ = urgency_limit; }
 
   /// Null when the snapshot does not hold the ID.
@@ -85,7 +100,7 @@ class SpacekeepOperation : public OperationInterface,
   Platform& platform_;
   // Constant after construction.
   Dictionary info_;
-  ServiceMap services_;
+  ServiceSnapshot services_;
   Dictionary result_;
   std::optional<Value> volume_;
   std::int32_t urgency_limit_ = 0;
@@ -102,7 +117,7 @@ class SpacekeepOperation : public OperationInterface,
 /// Null when the request is refused. `rest` goes to the operation's constructor.
 template <class Operation, class... Rest>
 [[nodiscard]] std::shared_ptr<Operation> makeOperation(Platform& platform, const Value& info,
-                                                       ServiceMap services, Rest... rest) {
+                                                       ServiceSnapshot services, Rest... rest) {
   auto operation = std::make_shared<Operation>(platform, std::move(rest)...);
   if (!operation->initWithInfo(info, std::move(services))) return nullptr;
   return operation;

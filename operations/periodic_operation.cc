@@ -27,7 +27,7 @@ ServiceMap selected(const ServiceMap& services) {
 
 }  // namespace
 
-bool SpacekeepPeriodicOperation::initWithInfo(const Value& request, ServiceMap snapshot) {
+bool SpacekeepPeriodicOperation::initWithInfo(const Value& request, ServiceSnapshot snapshot) {
   if (!SpacekeepOperation::initWithInfo(request, std::move(snapshot))) return false;
   setServices(selected(services()));
   return true;

@@ -19,7 +19,7 @@ class SpacekeepPeriodicOperation : public SpacekeepOperation {
  public:
   using SpacekeepOperation::SpacekeepOperation;
 
-  [[nodiscard]] bool initWithInfo(const Value& info, ServiceMap services) override;
+  [[nodiscard]] bool initWithInfo(const Value& info, ServiceSnapshot services) override;
 
   /// Runs the pass on the calling thread, for 15 seconds at most. `completion` gets
   /// {"SPACEKEEP_AMOUNT": bytes} once, before this returns.

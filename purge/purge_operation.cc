@@ -26,7 +26,7 @@ ServiceMap purgingServices(const ServiceMap& services) {
 
 }  // namespace
 
-bool SpacekeepPurgeOperation::initWithInfo(const Value& request, ServiceMap snapshot) {
+bool SpacekeepPurgeOperation::initWithInfo(const Value& request, ServiceSnapshot snapshot) {
   if (!SpacekeepOperation::initWithInfo(request, std::move(snapshot))) return false;
   setServices(purgingServices(services()));
   setPurge_amount_needed(unsignedAt(info(), keys::kAmount).value_or(0));

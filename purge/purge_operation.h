@@ -25,7 +25,7 @@ class SpacekeepPurgeOperation : public SpacekeepOperation {
  public:
   using SpacekeepOperation::SpacekeepOperation;
 
-  [[nodiscard]] bool initWithInfo(const Value& info, ServiceMap services) override;
+  [[nodiscard]] bool initWithInfo(const Value& info, ServiceSnapshot services) override;
 
   /// Runs the whole purge on the calling thread. `completion` (which may be empty) gets the answer
   /// of each service as it comes and, last before this returns, the outcome.

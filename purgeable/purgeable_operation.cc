@@ -1,5 +1,6 @@
 #include "purgeable/purgeable_operation.h"
 
+#include <algorithm>
 #include <limits>
 #include <utility>
 
@@ -19,12 +20,12 @@ constexpr std::int64_t kOptOutPeriodNs = 120'000'000'000;
 // Tells apart the places that complain about a number.
 constexpr int kAmountCheck = 163;
 
-ServiceMap queriedServices(const ServiceMap& services) {
+bool isQueried(const SKService& service) { return service.doesPurge() && !service.doNotQuery(); }
+
+ServiceSnapshot queriedServices(const ServiceSnapshot& snapshot) {
   ServiceMap queried;
-  for (const auto& [service_id, service] : services) {
-    if (service->doesPurge() && !service->doNotQuery()) {
-      queried.emplace_hint(queried.end(), service_id, service);
-    }
+  for (const auto& [service_id, service] : *snapshot) {
+    if (isQueried(*service)) queried.emplace_hint(queried.end(), service_id, service);
   }
   return queried;
 }
@@ -56,10 +57,11 @@ Value listOf(const std::set<std::string>& service_ids) {
 
 }  // namespace
 
-bool SpacekeepPurgeableOperation::initWithInfo(const Value& request, ServiceMap snapshot) {
-  if (!SpacekeepOperation::initWithInfo(request, std::move(snapshot))) return false;
-  setServices(queriedServices(services()));
-  return true;
+bool SpacekeepPurgeableOperation::initWithInfo(const Value& request, ServiceSnapshot snapshot) {
+  const bool all_queried =
+      std::ranges::all_of(*snapshot, [](const auto& entry) { return isQueried(*entry.second); });
+  if (!all_queried) snapshot = queriedServices(snapshot);
+  return SpacekeepOperation::initWithInfo(request, std::move(snapshot));
 }
 
 SpacekeepPurgeableOperation::Self SpacekeepPurgeableOperation::self() {
@@ -70,17 +72,21 @@ void SpacekeepPurgeableOperation::startOperation(OperationCompletion completion)
   const Dictionary working_copy = info();
   const std::uint64_t start_ticks = rt::ticks();
   logTrace("%s ENTRY, info: %@", "startOperation", working_copy);
-  const Dictionary first_pass = cachedInfo(working_copy);
-  askServices(working_copy, *first_pass.find(keys::kServicesToQuery)->array());
+  askServices(working_copy, recentAnswers(working_copy, Wanted::kToQueryAsWell).to_query);
   if (!nobodyInFlight()) waitForServices();
 
-  const Dictionary second_pass = cachedInfo(working_copy);
-  logTrace("%s cachedInfo (2nd pass): %@", "startOperation", second_pass);
-  const Dictionary result = resultFrom(*second_pass.find(keys::kServicesToCount)->dictionary());
-  logTrace("%s Still in flight: %@", "startOperation", listOf(copyInFlight()));
+  // Whom to ask is only for the log from here on.
+  const bool traces = shouldLogTrace(getLogHandle());
+  const Recent second_pass =
+      recentAnswers(working_copy, traces ? Wanted::kToQueryAsWell : Wanted::kToCount);
+  if (traces) logTrace("%s cachedInfo (2nd pass): %@", "startOperation", infoOf(second_pass));
+  Dictionary result = resultFrom(*second_pass.to_count);
+  if (shouldLogTrace(getLogHandle())) {
+    logTrace("%s Still in flight: %@", "startOperation", listOf(copyInFlight()));
+  }
   logTrace("%s elapsed time: %f result: %@", "startOperation",
            elapsedNs(start_ticks, rt::ticks()) / kNsPerSecond, result);
-  completion(result);
+  completion(std::move(result));
 }
 
 // Whoever is asked is in flight before its task starts, so nobody is missed by the wait that

@@ -9,6 +9,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <string>
@@ -26,7 +27,7 @@ class SpacekeepPurgeableOperation : public SpacekeepOperation {
   SpacekeepPurgeableOperation(Platform& platform, std::shared_ptr<Spacekeep> daemon)
       : SpacekeepOperation(platform), daemon_(std::move(daemon)) {}
 
-  [[nodiscard]] bool initWithInfo(const Value& info, ServiceMap services) override;
+  [[nodiscard]] bool initWithInfo(const Value& info, ServiceSnapshot services) override;
 
   /// Runs the whole query on the calling thread. `completion` gets the result once, before this
   /// returns.
@@ -52,7 +53,16 @@ class SpacekeepPurgeableOperation : public SpacekeepOperation {
 
   [[nodiscard]] Self self();
 
+  /// What the memory holds, shared with it: there may be thousands of services.
+  struct Recent {
+    std::shared_ptr<const Dictionary> to_count;  ///< not null
+    Array to_query;
+  };
+  enum class Wanted { kToCount, kToQueryAsWell };
+  [[nodiscard]] static Dictionary infoOf(Recent recent);
+
   // The course of one query.
+  [[nodiscard]] Recent recentAnswers(const Dictionary& info, Wanted wanted);
   void askServices(const Dictionary& working_copy, const Array& service_ids);
   [[nodiscard]] Dictionary resultFrom(const Dictionary& amounts) const;
 
@@ -69,11 +79,13 @@ class SpacekeepPurgeableOperation : public SpacekeepOperation {
   [[nodiscard]] bool nobodyInFlight() const;
 
   // The memory, on the daemon's defaults_queue.
-  [[nodiscard]] Dictionary readStatistics(const Dictionary& info);
+  [[nodiscard]] Recent readStatistics(const Dictionary& info, Wanted wanted);
   void writeStatistics(const std::string& service_id, const Dictionary& info);
   [[nodiscard]] Record storedRecord() const;
   void storeValidated(std::int32_t code, const Record& record);
-  [[nodiscard]] std::int32_t validate(SpacekeepRecentInfo& record) const;
+  using Freespace = std::function<std::uint64_t(const std::string& volume)>;
+  [[nodiscard]] static std::int32_t validate(SpacekeepRecentInfo& record, Freespace freespace);
+  [[nodiscard]] std::uint64_t freespaceOf(const std::string& volume) const;
   [[nodiscard]] Array servicesNotIn(const Dictionary& known) const;
 
   const std::shared_ptr<Spacekeep> daemon_;

@@ -1,5 +1,6 @@
 #include "purgeable/recent_info.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace spacekeep {
@@ -29,8 +30,17 @@ const SpacekeepRecentVolumeInfo* SpacekeepRecentInfo::volume(const std::string& 
 void SpacekeepRecentInfo::update(const std::string& volume, const std::string& service_id,
                                  SpacekeepRecentServiceInfo answer, std::uint64_t freespace_bytes) {
   SpacekeepRecentVolumeInfo& entry = volumes_[volume];
+  Derived& derived = derived_[volume];
+  const Date date = answer.timestamp;
+  if (entry.services.empty()) {
+    derived.span = {.oldest = date, .youngest = date};
+  } else if (derived.span) {
+    if (date.unix_ns < derived.span->oldest.unix_ns) derived.span->oldest = date;
+    if (date.unix_ns > derived.span->youngest.unix_ns) derived.span->youngest = date;
+  }
+  derived.amounts = nullptr;
   entry.freespace = freespace_bytes;
-  entry.timestamp = answer.timestamp;
+  entry.timestamp = date;
   entry.volumeName = volume;
   entry.services.insert_or_assign(service_id, std::move(answer));
 }
@@ -43,14 +53,55 @@ std::int32_t SpacekeepRecentInfo::validate(double age_limit_seconds, std::uint64
            !isNear(volume.freespace, context.freespace(entry.first), threshold_bytes);
   });
   for (auto& [path, volume] : volumes_) {
-    removed += std::erase_if(volume.services, [&](const auto& entry) {
-      return !isFresh(entry.second.timestamp, context.now, age_limit_seconds);
-    });
+    if (holdsOnlyFresh(path, context.now, age_limit_seconds)) continue;
+    removed += removeOldAnswers(path, volume, context.now, age_limit_seconds);
   }
   removed +=
       std::erase_if(volumes_, [](const auto& entry) { return entry.second.services.empty(); });
+  std::erase_if(derived_, [this](const auto& entry) { return !volumes_.contains(entry.first); });
   if (volumes_.empty()) return kInvalid;
   return removed > 0 ? kChanged : kUsable;
+}
+
+// So that an answer does not cost more the more services have answered before.
+bool SpacekeepRecentInfo::holdsOnlyFresh(const std::string& volume, const Date& now,
+                                         double age_limit_seconds) const {
+  const auto found = derived_.find(volume);
+  if (found == derived_.end() || !found->second.span) return false;
+  return isFresh(found->second.span->oldest, now, age_limit_seconds) &&
+         isFresh(found->second.span->youngest, now, age_limit_seconds);
+}
+
+std::size_t SpacekeepRecentInfo::removeOldAnswers(const std::string& path,
+                                                  SpacekeepRecentVolumeInfo& volume,
+                                                  const Date& now, double age_limit_seconds) {
+  const std::size_t removed = std::erase_if(volume.services, [&](const auto& entry) {
+    return !isFresh(entry.second.timestamp, now, age_limit_seconds);
+  });
+  Derived& derived = derived_[path];
+  if (removed > 0) derived.amounts = nullptr;
+  derived.span.reset();
+  for (const auto& [service_id, service] : volume.services) {
+    const Date date = service.timestamp;
+    if (!derived.span) derived.span = {.oldest = date, .youngest = date};
+    derived.span->oldest.unix_ns = std::min(derived.span->oldest.unix_ns, date.unix_ns);
+    derived.span->youngest.unix_ns = std::max(derived.span->youngest.unix_ns, date.unix_ns);
+  }
+  return removed;
+}
+
+std::shared_ptr<const Dictionary> SpacekeepRecentInfo::amounts(const std::string& volume) {
+  const auto found = volumes_.find(volume);
+  if (found == volumes_.end()) return nullptr;
+  std::shared_ptr<const Dictionary>& amounts = derived_[volume].amounts;
+  if (!amounts) {
+    Dictionary said;
+    for (const auto& [service_id, service] : found->second.services) {
+      said.set(service_id, service.amount);
+    }
+    amounts = std::make_shared<const Dictionary>(std::move(said));
+  }
+  return amounts;
 }
 
 Date recentDate(std::int64_t unix_ns) { return {unix_ns - unix_ns % 1000}; }

@@ -8,6 +8,8 @@
 #include <cstdint>
 #include <functional>
 #include <map>
+#include <memory>
+#include <optional>
 #include <string>
 
 #include "support/values/value.h"
@@ -49,7 +51,10 @@ class SpacekeepRecentInfo {
   explicit SpacekeepRecentInfo(Volumes volumes) : volumes_(std::move(volumes)) {}
 
   [[nodiscard]] const Volumes& volumes() const { return volumes_; }
-  void setVolumes(Volumes volumes) { volumes_ = std::move(volumes); }
+  void setVolumes(Volumes volumes) {
+    volumes_ = std::move(volumes);
+    derived_.clear();
+  }
   /// Null when nothing is known of that volume.
   [[nodiscard]] const SpacekeepRecentVolumeInfo* volume(const std::string& path) const;
 
@@ -63,10 +68,31 @@ class SpacekeepRecentInfo {
   std::int32_t validate(double age_limit_seconds, std::uint64_t threshold_bytes,
                         const RecentInfoContext& context);
 
-  bool operator==(const SpacekeepRecentInfo&) const = default;
+  /// What each service of the volume said, by service ID; null when nothing is known of it. Shared
+  /// and made anew only after a change, since queries ask for it again and again.
+  [[nodiscard]] std::shared_ptr<const Dictionary> amounts(const std::string& volume);
+
+  bool operator==(const SpacekeepRecentInfo& other) const { return volumes_ == other.volumes_; }
 
  private:
+  /// What follows from the entry of a volume.
+  struct Derived {
+    /// No answer is older or younger than these; none when they are not known.
+    struct Span {
+      Date oldest;
+      Date youngest;
+    };
+    std::optional<Span> span;
+    std::shared_ptr<const Dictionary> amounts;
+  };
+
+  [[nodiscard]] bool holdsOnlyFresh(const std::string& volume, const Date& now,
+                                    double age_limit_seconds) const;
+  std::size_t removeOldAnswers(const std::string& path, SpacekeepRecentVolumeInfo& volume,
+                               const Date& now, double age_limit_seconds);
+
   Volumes volumes_;
+  std::map<std::string, Derived> derived_;  // by volume path
 };
 
 /// The wall clock in whole microseconds, which is what an archive keeps of a date.

@@ -16,26 +16,35 @@ constexpr double kAgeLimitSeconds = 120.0;
 constexpr std::uint64_t kFreespaceThresholdBytes = 5'242'880;
 constexpr std::int32_t kNotValidated = 1;
 
-Dictionary amountsOf(const SpacekeepRecentVolumeInfo& volume) {
-  Dictionary amounts;
-  for (const auto& [service_id, service] : volume.services) {
-    amounts.set(service_id, service.amount);
-  }
-  return amounts;
+std::shared_ptr<const Dictionary> nothing() {
+  static const auto empty = std::make_shared<const Dictionary>();
+  return empty;
 }
 
 // Only made when it is logged: it spells out the whole record.
 Value textForm(const std::shared_ptr<SpacekeepRecentInfo>& record) {
   Dictionary volumes;
-  for (const auto& [path, volume] : record->volumes()) volumes.set(path, amountsOf(volume));
+  for (const auto& [path, volume] : record->volumes()) volumes.set(path, *record->amounts(path));
   return volumes;
 }
 
 }  // namespace
 
 Dictionary SpacekeepPurgeableOperation::cachedInfo(const Dictionary& request) {
+  return infoOf(recentAnswers(request, Wanted::kToQueryAsWell));
+}
+
+SpacekeepPurgeableOperation::Recent SpacekeepPurgeableOperation::recentAnswers(
+    const Dictionary& request, Wanted wanted) {
+  Recent recent;
+  daemon_->defaults_queue()->sync([&] { recent = readStatistics(request, wanted); });
+  return recent;
+}
+
+Dictionary SpacekeepPurgeableOperation::infoOf(Recent recent) {
   Dictionary answer;
-  daemon_->defaults_queue()->sync([&] { answer = readStatistics(request); });
+  answer.set(keys::kServicesToCount, *recent.to_count);
+  answer.set(keys::kServicesToQuery, std::move(recent.to_query));
   return answer;
 }
 
@@ -48,26 +57,27 @@ void SpacekeepPurgeableOperation::updateServiceStats(const std::string& service_
 
 // What the volume's entry knows is counted whatever the validation says, and also for services that
 // are not asked in this query.
-Dictionary SpacekeepPurgeableOperation::readStatistics(const Dictionary& request) {
+SpacekeepPurgeableOperation::Recent SpacekeepPurgeableOperation::readStatistics(
+    const Dictionary& request, Wanted wanted) {
   const std::string* path = stringAt(request, keys::kVolume);
   const Record record = path == nullptr ? nullptr : storedRecord();
-  const std::int32_t code = record ? validate(*record) : kNotValidated;
-  Dictionary to_count;
+  std::int32_t code = kNotValidated;
+  std::shared_ptr<const Dictionary> to_count;
   if (record) {
-    if (const auto* entry = record->volume(*path)) to_count = amountsOf(*entry);
+    code = validate(*record, [this](const std::string& volume) { return freespaceOf(volume); });
+    to_count = record->amounts(*path);
   }
-  logTrace("%s servicesToCount: %@", "cachedInfo", to_count);
-  Array to_query = servicesNotIn(to_count);
+  if (!to_count) to_count = nothing();
+  logTrace("%s servicesToCount: %@", "cachedInfo", *to_count);
+  Array to_query;
+  if (wanted == Wanted::kToQueryAsWell) to_query = servicesNotIn(*to_count);
   storeValidated(code, record);
   if (to_query.empty()) {
     logTrace("%s using all cached info", "cachedInfo");
   } else {
     logTrace("%s servicesToQuery: %@", "cachedInfo", Value(to_query));
   }
-  Dictionary answer;
-  answer.set(keys::kServicesToCount, std::move(to_count));
-  answer.set(keys::kServicesToQuery, std::move(to_query));
-  return answer;
+  return {.to_count = std::move(to_count), .to_query = std::move(to_query)};
 }
 
 // Each answer renews the free space and the date of the whole volume, and the record is stored
@@ -84,10 +94,14 @@ void SpacekeepPurgeableOperation::writeStatistics(const std::string& service_id,
   const Value* amount = entry.find(keys::kAmount);
   if (volume == nullptr || volume->string() == nullptr || amount == nullptr) return;
   if (!record) record = std::make_shared<SpacekeepRecentInfo>();
-  record->update(*volume->string(), service_id,
-                 {.amount = *amount, .timestamp = recentDate(rt::wallClockNs())},
-                 platform().volumes.volumeFreespace(volume));
-  static_cast<void>(validate(*record));
+  const std::string& path = *volume->string();
+  const std::uint64_t freespace_bytes = freespaceOf(path);
+  record->update(path, service_id, {.amount = *amount, .timestamp = recentDate(rt::wallClockNs())},
+                 freespace_bytes);
+  // This volume was measured just now.
+  static_cast<void>(validate(*record, [&](const std::string& other) {
+    return other == path ? freespace_bytes : freespaceOf(other);
+  }));
   daemon_->clientSetStateSync(record, keys::kRecentServiceStats);
 }
 
@@ -110,19 +124,24 @@ void SpacekeepPurgeableOperation::storeValidated(std::int32_t code, const Record
   }
 }
 
-std::int32_t SpacekeepPurgeableOperation::validate(SpacekeepRecentInfo& record) const {
-  const RecentInfoContext context{.now = recentDate(rt::wallClockNs()),
-                                  .freespace = [this](const std::string& path) {
-                                    const Value volume = path;
-                                    return platform().volumes.volumeFreespace(&volume);
-                                  }};
-  return record.validate(kAgeLimitSeconds, kFreespaceThresholdBytes, context);
+std::int32_t SpacekeepPurgeableOperation::validate(SpacekeepRecentInfo& record,
+                                                   Freespace freespace) {
+  return record.validate(kAgeLimitSeconds, kFreespaceThresholdBytes,
+                         {.now = recentDate(rt::wallClockNs()), .freespace = std::move(freespace)});
 }
 
+std::uint64_t SpacekeepPurgeableOperation::freespaceOf(const std::string& path) const {
+  const Value volume = path;
+  return platform().volumes.volumeFreespace(&volume);
+}
+
+// Both are in the order of their keys, so one walk over the two finds them.
 Array SpacekeepPurgeableOperation::servicesNotIn(const Dictionary& known) const {
   Array missing;
+  const auto* next = known.begin();
   for (const auto& entry : services()) {
-    if (!known.contains(entry.first)) missing.emplace_back(entry.first);
+    while (next != known.end() && next->key < entry.first) ++next;
+    if (next == known.end() || next->key != entry.first) missing.emplace_back(entry.first);
   }
   return missing;
 }

@@ -68,6 +68,7 @@ std::shared_ptr<SKService> Spacekeep::openService(const CheckIn& check_in) {
   service->setEndpoint(check_in.endpoint);
   service->connection = platform_.connector.connectionFromEndpoint(check_in.endpoint);
   services_[check_in.service_id] = service;
+  snapshot_ = nullptr;
   ipc::Connection& connection = *service->connection;
   const auto removal = removalHandler(service);
   connection.setInvalidationHandler([removal] {
@@ -101,6 +102,7 @@ std::function<void()> Spacekeep::removalHandler(const std::shared_ptr<SKService>
       const auto ended = weak_service.lock();
       if (!ended || stored == daemon->services_.end() || stored->second != ended) return;
       daemon->services_.erase(stored);
+      daemon->snapshot_ = nullptr;
     });
   };
 }

@@ -5,7 +5,12 @@
 namespace spacekeep {
 
 std::shared_ptr<const ServiceMap> Spacekeep::copyServices() const {
-  return std::make_shared<const ServiceMap>(mutableServices());
+  std::shared_ptr<const ServiceMap> snapshot;
+  collection_queue_->sync([&] {
+    if (!snapshot_) snapshot_ = std::make_shared<const ServiceMap>(services_);
+    snapshot = snapshot_;
+  });
+  return snapshot;
 }
 
 ServiceMap Spacekeep::mutableServices() const {

@@ -166,6 +166,45 @@ TEST(RecentInfo, ASecondAnswerKeepsTheFirstAndRenewsFreeSpaceAndDate) {
   EXPECT_EQ(volume.services.at("two"), answerOf(2, 0));
 }
 
+// Validation remembers between which dates all answers are, and must not go by that for too long.
+TEST(RecentInfo, AnOldAnswerGoesThoughYoungerOnesWereValidatedSince) {
+  SpacekeepRecentInfo record;
+  record.update("/", "young", answerOf(1, 0), kFree);
+  EXPECT_TRUE(isUsable(judge(record)));
+  record.update("/", "old", answerOf(2, 121 * kSecond), kFree);
+  record.update("/", "younger", answerOf(3, 0), kFree);
+  EXPECT_EQ(judge(record), kChanged);
+  EXPECT_FALSE(record.volume("/")->services.contains("old"));
+  EXPECT_EQ(record.volume("/")->services.size(), 2U);
+  EXPECT_TRUE(isUsable(judge(record)));
+}
+
+TEST(RecentInfo, AnAnswerOfTheFutureGoesThoughOlderOnesWereValidatedSince) {
+  SpacekeepRecentInfo record = oneAnswer(60 * kSecond);
+  EXPECT_TRUE(isUsable(judge(record)));
+  record.update("/", "ahead", answerOf(2, -kSecond), kFree);
+  record.update("/", "now", answerOf(3, 0), kFree);
+  EXPECT_EQ(judge(record), kChanged);
+  EXPECT_FALSE(record.volume("/")->services.contains("ahead"));
+}
+
+TEST(RecentInfo, TheAmountsFollowEveryChange) {
+  SpacekeepRecentInfo record = oneAnswer(120 * kSecond);
+  EXPECT_EQ(record.amounts("/data"), nullptr);
+  const auto first = record.amounts("/");
+  EXPECT_EQ(*first, (Dictionary{{"cache", 5}}));
+  EXPECT_EQ(record.amounts("/"), first) << "made again without a change";
+  record.update("/", "other", answerOf(7, 0), kFree);
+  EXPECT_EQ(*record.amounts("/"), (Dictionary{{"cache", 5}, {"other", 7}}));
+  EXPECT_EQ(*first, (Dictionary{{"cache", 5}})) << "what was handed out does not change";
+  EXPECT_EQ(record.validate(119.0, kThreshold,
+                            {.now = Date{kNow}, .freespace = [](const auto&) { return kFree; }}),
+            kChanged);
+  EXPECT_EQ(*record.amounts("/"), (Dictionary{{"other", 7}}));
+  record.setVolumes({});
+  EXPECT_EQ(record.amounts("/"), nullptr);
+}
+
 TEST(RecentInfo, AnAnswerForANewVolumeAddsAnEntryBesideTheOthers) {
   SpacekeepRecentInfo record = oneAnswer(0);
   const SpacekeepRecentVolumeInfo before = *record.volume("/");

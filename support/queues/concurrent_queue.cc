@@ -62,9 +62,15 @@ void ConcurrentQueue::async(Task task) {
       self != nullptr && self->take(*this, task)) {
     return;
   }
-  const Lock lock(mutex_);
+  Lock lock(mutex_);
   pending_.push_back(std::move(task));
-  provideWorker();
+  if (!mayTakeTask() || idle_ == 0) {
+    provideWorker();
+    return;
+  }
+  // Without the lock, which the worker would wait for as soon as it woke up.
+  lock.unlock();
+  work_available_.notifyOne();
 }
 
 ConcurrentQueue::Counts ConcurrentQueue::counts() const {

@@ -87,9 +87,13 @@ SerialQueue::SerialQueue(Key, std::string label, ConcurrentQueue& global)
     : label_(std::move(label)), global_(global) {}
 
 void SerialQueue::async(Task task) {
-  const Lock lock(mutex_);
+  Lock lock(mutex_);
   items_.push_back({.task = std::move(task)});
-  startNext();
+  if (running_ || suspensions_ > 0) return;
+  running_ = true;
+  // Without the lock, which the worker would wait for as soon as it began.
+  lock.unlock();
+  global_.async([self = shared_from_this()] { self->drain(); });
 }
 
 void SerialQueue::sync(const std::function<void()>& task) {

@@ -141,8 +141,9 @@ void BusLink::process() {
   }
   forgetWritten();
   updateEvents();
-  // What is left gets a turn of its own: watching again tells at once what is there.
-  if (turns == kMessagesPerTurn) sd_event_source_set_io_events(io_, events_);
+  // What is left gets a turn of its own, and so does the end of the stream, so that the calls before
+  // it are served: watching again tells at once what is there.
+  if (turns == kMessagesPerTurn || peer_hung_up_) sd_event_source_set_io_events(io_, events_);
 }
 
 /// Lets sd-bus read at most one message, and only one whose size is known to be within the limit.
@@ -181,8 +182,8 @@ bool BusLink::processOnce() {
   }
   if (ended_ || progress <= 0) return false;
   // When this message was all there was, the next one wakes the loop by itself, and looking for it
-  // now would be a system call for nothing. The end of the stream was told already.
-  return !size_is_known || available != message_size_ || !queued_sizes_.empty() || peer_hung_up_;
+  // now would be a system call for nothing.
+  return !size_is_known || available != message_size_ || !queued_sizes_.empty();
 }
 
 BusLink::Ahead BusLink::lookAhead() {

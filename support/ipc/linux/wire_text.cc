@@ -29,6 +29,7 @@ bool isAccepted(std::uint32_t character, std::size_t length) {
 /// Length of the character at the start of `text`, 0 when it is not accepted.
 std::size_t characterLength(std::string_view text) {
   const auto first = static_cast<unsigned char>(text.front());
+  if (first > 0 && first < 0x80) return 1;
   const std::size_t length = lengthByFirstByte(first);
   if (length == 0 || length > text.size()) return 0;
   std::uint32_t character = length == 1 ? first : first & (0x7FU >> length);
@@ -40,19 +41,29 @@ std::size_t characterLength(std::string_view text) {
   return isAccepted(character, length) ? length : 0;
 }
 
+/// Bytes at the start of `text` that are accepted as they are.
+std::size_t acceptedLength(std::string_view text) {
+  std::size_t accepted = 0;
+  while (accepted < text.size()) {
+    const std::size_t length = characterLength(text.substr(accepted));
+    if (length == 0) break;
+    accepted += length;
+  }
+  return accepted;
+}
+
 }  // namespace
 
 std::string wireText(std::string_view text) {
   std::string result;
   result.reserve(text.size());
   while (!text.empty()) {
-    const std::size_t length = characterLength(text);
-    if (length == 0) {
-      result += kReplacement;
-    } else {
-      result += text.substr(0, length);
-    }
-    text.remove_prefix(length == 0 ? 1 : length);
+    const std::size_t accepted = acceptedLength(text);
+    result += text.substr(0, accepted);
+    text.remove_prefix(accepted);
+    if (text.empty()) break;
+    result += kReplacement;
+    text.remove_prefix(1);
   }
   return result;
 }

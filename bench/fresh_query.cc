@@ -74,6 +74,10 @@ int main(int count, char** arguments) {
       "waits for each answer {:.0f} us, bare loop that asks all first {:.0f} us\n",
       times.daemon_us.size(), services, times.void_rounds, daemon_us, one_by_one_us,
       all_at_once_us);
+  if (times.daemon_us.empty()) {
+    fmt::print("ratio one_by_one void\nratio all_at_once void\n");
+    return 1;
+  }
   fmt::print("point {} {:.0f}\n", services, daemon_us);
   fmt::print("ratio one_by_one {:.3f}\n", daemon_us / one_by_one_us);
   fmt::print("ratio all_at_once {:.3f}\n", daemon_us / all_at_once_us);

@@ -25,7 +25,7 @@ inline Message newCall(sd_bus* bus, const char* member) {
 }
 
 inline Message callAndWait(sd_bus* bus, sd_bus_message* call, const char* member) {
-  sd_bus_error error = SD_BUS_ERROR_NULL;
+  sd_bus_error error = {};
   sd_bus_message* reply = nullptr;
   const int result = sd_bus_call(bus, call, 0, &error, &reply);
   if (result < 0 && error.message != nullptr) std::fprintf(stderr, "%s\n", error.message);

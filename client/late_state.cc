@@ -76,6 +76,14 @@ void Spacekeep::archiveKeptRecord() {
   kept_record_ = std::move(archived);
 }
 
+// Its bytes may have been among what did not get to the disk.
+void Spacekeep::keepRecordToBeWritten(KeptRecord record) {
+  kept_record_ = std::move(record);
+  if (!kept_record_.record) return;
+  kept_record_.archive.reset();
+  writeSoon();
+}
+
 void Spacekeep::writeSoon() {
   if (late_write_is_due_ || !user_defaults_) return;
   late_write_is_due_ = true;

@@ -25,15 +25,12 @@ void Spacekeep::_clientSetState(ipc::OptionalValue value, const std::string& key
 // shall find later what was said not to be stored.
 std::optional<std::string> Spacekeep::writeState(ipc::OptionalValue value, const std::string& key) {
   if (!user_defaults_) return "there is no preferences suite";
-  static_cast<void>(persistentState());
-  std::optional<Value> before = user_defaults_->get(keys::kUserDefaults);
-  KeptRecord replaced;
-  if (key == kept_record_.key) replaced = std::exchange(kept_record_, {});
+  KeptRecord before = kept_record_;
   changeState(std::move(value), key);
   std::optional<std::string> why = user_defaults_->synchronize();
   if (!why) return std::nullopt;
-  user_defaults_->set(keys::kUserDefaults, std::move(before));
-  if (replaced.record) kept_record_ = std::move(replaced);
+  user_defaults_->discard(keys::kUserDefaults);
+  keepRecordToBeWritten(std::move(before));
   return why;
 }
 

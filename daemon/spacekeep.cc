@@ -69,7 +69,7 @@ void Spacekeep::scanDescriptors(const std::vector<std::string>& directories) {
                      [&](const Dictionary& descriptor) { collectService(descriptor, found); });
   }
   for (auto& [service_id, service] : found.services) {
-    services_.insert_or_assign(service_id, std::move(service));
+    registry_.set(service_id, std::move(service));
   }
   daemons_.insert(found.service_ids.begin(), found.service_ids.end());
 }
@@ -103,13 +103,12 @@ void Spacekeep::setUserDefaults(std::unique_ptr<PreferencesSuite> suite) {
 
 const ServiceMap& Spacekeep::services() const {
   collection_queue_->assertCurrent("services");
-  return services_;
+  return registry_.services();
 }
 
 void Spacekeep::setServices(ServiceMap services) {
   collection_queue_->assertCurrent("setServices");
-  services_ = std::move(services);
-  snapshot_ = nullptr;
+  registry_.replaceAll(std::move(services));
 }
 
 const std::set<std::string>& Spacekeep::daemons() const {

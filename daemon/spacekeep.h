@@ -25,6 +25,7 @@
 #include "client/purge_operations.h"
 #include "registry/service.h"
 #include "registry/service_protocol.h"
+#include "registry/service_registry.h"
 #include "support/platform.h"
 #include "support/queues/serial_queue.h"
 
@@ -173,6 +174,7 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   void keepRecord(std::shared_ptr<SpacekeepRecentInfo> record, const std::string& key);
   [[nodiscard]] StateObject recordOf(const std::string& key, Value value);
   void archiveKeptRecord();
+  void keepRecordToBeWritten(KeptRecord record);
   void writeSoon();
   void writeNow();
   /// Also on the creating thread, before any queue is in use.
@@ -193,9 +195,7 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   KeptRecord kept_record_;                           // confined to defaults_queue_
   bool late_write_is_due_ = false;                   // confined to defaults_queue_
   std::atomic<bool> finish_early_ = false;           // of purges that do not say
-  ServiceMap services_;                              // confined to collection_queue_
-  // Of services_ as it is, null after a change. Confined to collection_queue_.
-  mutable std::shared_ptr<const ServiceMap> snapshot_;
+  mutable ServiceRegistry registry_;                 // confined to collection_queue_
   std::optional<Array> operations_;
   std::set<std::string> daemons_;  // confined to daemons_queue_
   Dictionary default_values_;

@@ -39,19 +39,18 @@ bool Spacekeep::connectionIsEntitled(std::string_view entitlement) const {
 }
 
 void Spacekeep::registerService(const CheckIn& check_in) {
-  const auto known = services_.find(check_in.service_id);
-  std::shared_ptr<SKService> service;
-  if (known == services_.end() && services_.size() >= kMaxRegisteredServices) {
+  std::shared_ptr<SKService> service = registry_.find(check_in.service_id);
+  const std::size_t registered = registry_.services().size();
+  if (!service && registered >= kMaxRegisteredServices) {
     logProblem("%s refusing %@, %llu services are registered", "clientCheckin", check_in.service_id,
-               services_.size());
+               registered);
     check_in.reply(std::nullopt, "too many services are registered, try again later");
     return;
   }
-  if (known == services_.end()) {
-    service = openService(check_in);
-  } else {
+  if (service) {
     logTrace("%s operating on an existing service", "clientCheckin");
-    service = known->second;
+  } else {
+    service = openService(check_in);
   }
   service->setDoesPeriodic(truthAt(check_in.info, keys::kRolePeriodic));
   service->setDoesPurge(truthAt(check_in.info, keys::kRolePurge));
@@ -67,8 +66,7 @@ std::shared_ptr<SKService> Spacekeep::openService(const CheckIn& check_in) {
   auto service = std::make_shared<SKService>(check_in.service_id);
   service->setEndpoint(check_in.endpoint);
   service->connection = platform_.connector.connectionFromEndpoint(check_in.endpoint);
-  services_[check_in.service_id] = service;
-  snapshot_ = nullptr;
+  registry_.set(check_in.service_id, service);
   ipc::Connection& connection = *service->connection;
   const auto removal = removalHandler(service);
   connection.setInvalidationHandler([removal] {
@@ -98,11 +96,9 @@ std::function<void()> Spacekeep::removalHandler(const std::shared_ptr<SKService>
     const auto daemon = weak_daemon.lock();
     if (!daemon) return;
     daemon->collection_queue_->async([daemon, service_id, weak_service] {
-      const auto stored = daemon->services_.find(service_id);
       const auto ended = weak_service.lock();
-      if (!ended || stored == daemon->services_.end() || stored->second != ended) return;
-      daemon->services_.erase(stored);
-      daemon->snapshot_ = nullptr;
+      if (!ended || daemon->registry_.find(service_id) != ended) return;
+      daemon->registry_.remove(service_id);
     });
   };
 }

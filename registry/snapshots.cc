@@ -6,16 +6,13 @@ namespace spacekeep {
 
 std::shared_ptr<const ServiceMap> Spacekeep::copyServices() const {
   std::shared_ptr<const ServiceMap> snapshot;
-  collection_queue_->sync([&] {
-    if (!snapshot_) snapshot_ = std::make_shared<const ServiceMap>(services_);
-    snapshot = snapshot_;
-  });
+  collection_queue_->sync([&] { snapshot = registry_.snapshot(); });
   return snapshot;
 }
 
 ServiceMap Spacekeep::mutableServices() const {
   ServiceMap copy;
-  collection_queue_->sync([&] { copy = services_; });
+  collection_queue_->sync([&] { copy = registry_.services(); });
   return copy;
 }
 

@@ -99,7 +99,7 @@ std::optional<std::string> SqliteSuite::synchronize() {
     wish = SuiteHeadroom::Wish::kAtAnyCost;
   }
   if (failure.code != SQLITE_OK) {
-    return path_ + " cannot be written, what was set is kept for the next try: " + failure.reason +
+    return path_ + " cannot be written: " + failure.reason +
            (failure.no_room ? "; space has to be freed on its volume" : "");
   }
   headroom_.growIfLow(wish);

@@ -27,8 +27,7 @@ void announceLaunch(EventSources& events) {
 
 void runSynchronously(ConcurrentQueue& queue, Task task) {
   const auto group = std::make_shared<TaskGroup>();
-  // The task holds the group: the wait may end before the group is through with leaving it.
-  group->async(queue, [group, task = std::move(task)] { task(); });
+  asyncInGroup(group, queue, std::move(task));
   group->wait();
 }
 

@@ -100,9 +100,9 @@ void SpacekeepPurgeableOperation::askServices(const Dictionary& working_copy,
     const std::string& service_id = *value.string();
     if (optOutService(service_id, false)) continue;
     if (!updateInFlight(service_id, true)) continue;
-    // The task holds the group: it may outlast the wait.
-    group->async(platform().global,
-                 [self = self(), group, request, service = serviceFor(service_id)] {
+    // The wait may end before the task has run.
+    asyncInGroup(group, platform().global,
+                 [self = self(), request, service = serviceFor(service_id)] {
                    self->queryService(service, request);
                  });
   }

@@ -63,6 +63,15 @@ void TaskGroup::async(ConcurrentQueue& queue, Task task) {
   });
 }
 
+void asyncInGroup(const std::shared_ptr<TaskGroup>& group, ConcurrentQueue& queue, Task task) {
+  group->enter();
+  queue.async([group, task = std::move(task)]() mutable {
+    task();
+    task = nullptr;  // As in TaskGroup::async; the group is held until it has been left.
+    group->leave();
+  });
+}
+
 void TaskGroup::wait() { static_cast<void>(waitUntil(rt::kNever)); }
 
 WaitResult TaskGroup::waitForNs(std::uint64_t duration_ns) {

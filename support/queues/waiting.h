@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <memory>
 
 #include "support/queues/concurrent_queue.h"
 #include "support/runtime/runtime.h"
@@ -39,7 +40,8 @@ class TaskGroup {
  public:
   void enter();
   void leave();
-  /// enter(), run on `queue`, leave(). The group must live until the task has ended.
+  /// enter(), run on `queue`, leave(). The group must live until the task has ended; what the task
+  /// captured is gone by then and cannot keep it.
   void async(ConcurrentQueue& queue, Task task);
   void wait();
   [[nodiscard]] WaitResult waitForNs(std::uint64_t duration_ns);
@@ -53,5 +55,9 @@ class TaskGroup {
   rt::CondVar empty_;
   std::uint64_t entered_ = 0;
 };
+
+/// The same for whoever may stop waiting before the task has ended: the group lives as long as its
+/// tasks.
+void asyncInGroup(const std::shared_ptr<TaskGroup>& group, ConcurrentQueue& queue, Task task);
 
 }  // namespace spacekeep

@@ -110,6 +110,29 @@ TEST(TaskGroup, WaitTimesOutWhileATaskRunsAndSucceedsAfterwards) {
   });
 }
 
+TEST(TaskGroup, LivesUntilItsLastTaskHasLeftAlsoWhenNobodyWaitsForItAnyMore) {
+  inEverySchedule(100, [] {
+    ConcurrentQueue queue({});
+    auto group = std::make_shared<TaskGroup>();
+    CountingSemaphore go_on(0);
+    CountingSemaphore captured_gone(0);
+    std::atomic<bool> group_was_there = false;
+    // Ends with the task, right before the group is left.
+    const auto tell = [&, weak = std::weak_ptr<TaskGroup>(group)](int*) {
+      group_was_there = !weak.expired();
+      captured_gone.signal();
+    };
+    static int marker = 0;
+    asyncInGroup(group, queue,
+                 [&go_on, captured = std::shared_ptr<int>(&marker, tell)] { go_on.wait(); });
+    EXPECT_EQ(group->waitForNs(kSecondNs), WaitResult::kTimedOut);
+    group.reset();
+    go_on.signal();
+    captured_gone.wait();
+    EXPECT_TRUE(group_was_there);
+  });
+}
+
 TEST(TaskGroup, ManyThreadsMayWait) {
   inEverySchedule(100, [] {
     ConcurrentQueue queue({});

@@ -81,8 +81,9 @@ std::optional<Value> dateOf(plist_t node) {
   for (std::size_t i = 1; i <= 8; ++i) bits = bits << 8 | encoded[kHeaderBytes + i];
   const auto seconds = std::bit_cast<double>(bits);
   if (!plistDateFits(seconds)) return std::nullopt;
-  // Whole seconds apart from the rest: their product with 10^9 would lose what the double has.
-  const double whole = std::floor(seconds);
+  // Whole seconds apart from the rest: their product with 10^9 would lose what the double has. Cut
+  // off towards the epoch, since in the first second of the range the one below is out of it.
+  const double whole = std::trunc(seconds);
   const auto rest_ns = static_cast<std::int64_t>(std::llround((seconds - whole) * 1e9));
   return Value(
       Date{(static_cast<std::int64_t>(whole) + kPlistEpochUnixSeconds) * 1'000'000'000 + rest_ns});

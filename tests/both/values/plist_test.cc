@@ -254,6 +254,26 @@ TEST(PlistBinary, NumbersKeepTheirFullRange) {
   }
 }
 
+TEST(PlistBinary, DatesInTheFirstAndLastFractionOfASecondOfTheRangeAreKept) {
+  for (const double unix_seconds : {-9'223'372'036.7, 9'223'372'036.7}) {
+    const double seconds = unix_seconds - 978'307'200;
+    Bytes document = bytesOf("bplist00\x33");
+    for (int shift = 56; shift >= 0; shift -= 8) {
+      document.push_back(static_cast<std::uint8_t>(std::bit_cast<std::uint64_t>(seconds) >> shift));
+    }
+    const std::uint8_t table = static_cast<std::uint8_t>(document.size());
+    document.insert(document.end(), {8, 0, 0, 0, 0, 0, 0, 1, 1});
+    for (const std::uint8_t number : {std::uint8_t{1}, std::uint8_t{0}, table}) {
+      document.insert(document.end(), {0, 0, 0, 0, 0, 0, 0, number});
+    }
+    const auto result = parsePlist(document);
+    const auto* value = std::get_if<Value>(&result);
+    ASSERT_TRUE(value != nullptr && value->date() != nullptr) << unix_seconds;
+    // Doubles of this size are about two microseconds apart.
+    EXPECT_NEAR(static_cast<double>(value->date()->unix_ns), unix_seconds * 1e9, 10'000);
+  }
+}
+
 TEST(PlistBinary, DatesAreCloseAfterOneRoundAndStableAfterThat) {
   for (const std::int64_t unix_ns :
        {std::int64_t{0}, std::int64_t{-1}, std::int64_t{1'700'000'000'123'456'789},

@@ -6,6 +6,8 @@
 #include <cstddef>
 #include <optional>
 
+#include "support/values/text.h"
+
 namespace spacekeep::ctl {
 namespace {
 
@@ -80,7 +82,7 @@ std::string describeFault(std::string_view text, const Parts& parts) {
   if (parts.unit == "%") return "percentages are not known, give an amount";
   if (parts.unit.starts_with(',')) return "write a point, not a comma, before the fraction";
   if (parts.has_point && parts.fraction.empty()) return "there is no digit after the point";
-  if (!factorOf(parts.unit)) return fmt::format("the unit \"{}\" is not known", parts.unit);
+  if (!factorOf(parts.unit)) return fmt::format("the unit \"{}\" is not known", lineOf(parts.unit));
   if (parts.has_point && *factorOf(parts.unit) == 1) return "there are no fractions of a byte";
   return {};
 }
@@ -89,7 +91,7 @@ SizeError errorFor(std::string_view text, std::string_view fault) {
   return {
       fmt::format("\"{}\" is no size: {}. Sizes look like 1000000, 500M, 1.5GiB (steps of 1024) "
                   "or 750MB (steps of 1000)",
-                  text, fault)};
+                  lineOf(text), fault)};
 }
 
 }  // namespace

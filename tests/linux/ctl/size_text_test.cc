@@ -52,6 +52,14 @@ TEST(SizeText, SizesAsPeopleWriteThem) {
   }
 }
 
+TEST(SizeText, ControlCharactersOfWhatIsNoSizeAreShownEscaped) {
+  for (const char* text : {"12\x1b[31m", "\r500M", "5\n\x07"}) {
+    const auto size = parseSize(text);
+    ASSERT_TRUE(std::holds_alternative<SizeError>(size)) << text;
+    for (const char c : std::get<SizeError>(size).text) EXPECT_GE(c, ' ') << text;
+  }
+}
+
 struct BadCase {
   const char* text;
   const char* fault;

@@ -219,17 +219,17 @@ std::optional<Value> WireReader::readValue(int depth, int wrappings) {
 }
 
 std::optional<Value> WireReader::readArray(const char* contents, int depth) {
-  if (depth > kMaxValueDepth) return refuse("is nested too deep");
-  if (contents[0] == '{') {
-    auto dictionary = readDictionary(contents, depth);
-    return dictionary ? std::optional<Value>(std::move(*dictionary)) : std::nullopt;
-  }
-  if (std::string_view(contents) == "y") {
+  if (std::string_view(contents) == "y") {  // nests nothing, so that its depth does not count
     const void* bytes = nullptr;
     std::size_t size = 0;
     if (sd_bus_message_read_array(message_, 'y', &bytes, &size) < 0) return malformed();
     const auto* first = static_cast<const std::uint8_t*>(bytes);
     return Value(size == 0 ? Data{} : Data{{first, first + size}});
+  }
+  if (depth > kMaxValueDepth) return refuse("is nested too deep");
+  if (contents[0] == '{') {
+    auto dictionary = readDictionary(contents, depth);
+    return dictionary ? std::optional<Value>(std::move(*dictionary)) : std::nullopt;
   }
   if (sd_bus_message_enter_container(message_, 'a', contents) <= 0) return malformed();
   Array array;

@@ -93,6 +93,13 @@ TEST_F(RoundTrip, NestingUpToTheLimitPasses) {
   EXPECT_EQ(echo(value), value);
 }
 
+TEST_F(RoundTrip, DataInTheDeepestArrayPasses) {
+  Value value(Data{{1, 2, 3}});
+  for (int level = 0; level < kMaxValueDepth; ++level) value = Array{value};
+  const Arguments sent = arguments({}, std::nullopt, value);
+  EXPECT_EQ(echo(sent), sent);
+}
+
 TEST_F(RoundTrip, NestingBeyondTheLimitFailsTheCallAndNothingElse) {
   EXPECT_NE(errorOf(arguments({{"deep", nested(kMaxValueDepth)}})), "");
   EXPECT_NE(errorOf(arguments({}, std::nullopt, nested(kMaxValueDepth + 1))), "");

@@ -78,6 +78,21 @@ TEST(SuiteFile, ADatabaseDamagedInTheMiddleIsSetAside) {
   EXPECT_EQ(log.count(kLogProblem, "It was set aside as"), 1u);
 }
 
+TEST(SuiteFile, ADatabaseWhoseKeysAreOutOfOrderIsSetAsideAndWhatIsStoredThenIsKept) {
+  const TemporaryDirectory directory;
+  for (const char* key : {"key-a", "key-b", "key-c"}) store(directory, key, 1);
+  std::string content = contentOf(fileOf(directory));
+  const std::size_t first = content.find("key-a");
+  ASSERT_NE(first, std::string::npos);
+  content[first] = 'z';
+  directory.write(std::string(kName) + ".sqlite", content);
+  store(directory, "key-m", 2);
+  EXPECT_EQ(fetch(directory, "key-m"), Value(2));
+  const auto aside = setAsideFiles(directory);
+  ASSERT_EQ(aside.size(), 2u);
+  EXPECT_EQ(contentOf(std::min(aside[0], aside[1])), content);
+}
+
 TEST(SuiteFile, ATruncatedDatabaseIsSetAside) {
   const TemporaryDirectory directory;
   store(directory, "k", Data{std::vector<std::uint8_t>(50'000, 1)});

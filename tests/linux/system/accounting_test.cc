@@ -23,6 +23,8 @@ namespace {
 constexpr std::uint64_t kFileBytes = 128 * 1024;
 constexpr std::uint64_t kAskedBytes = 20ULL * 1024 * 1024 + 12345;
 constexpr int kFilesEach = 300;
+/// What a file system may itself give back with so many files: blocks of its own trees.
+constexpr std::uint64_t kOwnBlocksBytes = 64 * 1024;
 
 std::uint64_t freeBytes(const std::string& path) {
   struct statvfs space = {};
@@ -113,6 +115,12 @@ class Accounting : public testing::TestWithParam<const char*> {
     close(locked_);
   }
 
+  /// Deleted files are taken apart in the background: their blocks come back some time later.
+  [[nodiscard]] static bool givesBackLate() {
+    const std::string type = GetParam();
+    return type == "xfs" || type == "btrfs";
+  }
+
   Sandbox sandbox_;
   Process daemon_;
   std::vector<Process> services_;
@@ -137,13 +145,19 @@ TEST_P(Accounting, TheAmountIsTheChangeOfFreeSpaceAndWhatExceedsItIsExplained) {
   const std::uint64_t freed = unsignedAt(outcome, "SPACEKEEP_AMOUNT").value_or(0);
   const std::uint64_t begin = unsignedAt(outcome, "SPACEKEEP_FREESPACE_BEGIN").value_or(0);
   const std::uint64_t end = unsignedAt(outcome, "SPACEKEEP_FREESPACE_END").value_or(0);
+  const std::uint64_t reported = unsignedAt(outcome, "SPACEKEEP_AMOUNT_REPORTED").value_or(0);
   EXPECT_EQ(begin, before);
-  EXPECT_EQ(end, after);
   EXPECT_EQ(freed, end - begin);
   EXPECT_GE(freed, kAskedBytes);
+  if (givesBackLate()) {
+    // Between the daemon's look and this one only what was deleted before can have come back.
+    EXPECT_GE(after, end);
+    EXPECT_LE(after - end, reported - std::min(reported, freed) + kOwnBlocksBytes);
+  } else {
+    EXPECT_EQ(end, after);
+  }
 
   const Answers answers = answersIn(sandbox_.daemonLog());
-  const std::uint64_t reported = unsignedAt(outcome, "SPACEKEEP_AMOUNT_REPORTED").value_or(0);
   EXPECT_EQ(reported, answers.replies_total);
   EXPECT_LE(answers.most_beyond_share, kFileBytes) << "a request took more than one file too many";
   std::printf(

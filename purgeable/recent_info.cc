@@ -104,6 +104,12 @@ std::shared_ptr<const Dictionary> SpacekeepRecentInfo::amounts(const std::string
   return amounts;
 }
 
-Date recentDate(std::int64_t unix_ns) { return {unix_ns - unix_ns % 1000}; }
+// Down on both sides of 1970, or a date before it would move at each round through an archive. The
+// very first microsecond of the range has nothing below it.
+Date recentDate(std::int64_t unix_ns) {
+  std::int64_t rest_ns = unix_ns % 1000;
+  if (rest_ns < 0 && unix_ns > INT64_MIN + 1000) rest_ns += 1000;
+  return {unix_ns - rest_ns};
+}
 
 }  // namespace spacekeep

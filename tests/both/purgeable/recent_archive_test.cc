@@ -81,6 +81,18 @@ TEST(RecentArchive, EveryMicrosecondComesBackAsItself) {
   }
 }
 
+TEST(RecentArchive, DatesBefore1970ComeBackAsThemselves) {
+  for (const std::int64_t unix_ns :
+       {-1'000L, -1'297'999'999'000'000L, -1'613'425'601'000'001'000L}) {
+    const SpacekeepRecentInfo record({{"/", {.services = {}, .timestamp = Date{unix_ns}}}});
+    const auto back = recentInfoFromArchive(archivedRecentInfo(record));
+    ASSERT_TRUE(back.has_value()) << unix_ns;
+    EXPECT_EQ(back->volume("/")->timestamp, Date{unix_ns});
+  }
+  EXPECT_EQ(recentDate(-1), Date{-1'000});
+  EXPECT_EQ(recentDate(INT64_MIN), Date{INT64_MIN + 808});
+}
+
 TEST(RecentArchive, TheBytesDescribeThemselves) {
   const Dictionary archive = document();
   EXPECT_EQ(*archive.find("format"), Value("SpacekeepRecentInfo"));

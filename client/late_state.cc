@@ -36,7 +36,10 @@ StateObject Spacekeep::clientGetStateSync(const std::string& key) {
   logTrace("%s %d", "clientGetStateSync", kReadEntryLine);
   StateObject answer;
   if (key == kept_record_.key && kept_record_.isNewerThanState()) {
+    // The same read for whoever follows it in the log, without the way through bytes.
+    logTrace("%s ENTRY", "_clientGetState");
     answer = kept_record_.record;
+    logTrace("%s EXIT", "_clientGetState");
   } else {
     _clientGetState(key, [&](ipc::OptionalValue value) {
       if (value) answer = recordOf(key, std::move(*value));

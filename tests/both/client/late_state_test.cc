@@ -26,6 +26,19 @@ TEST(LateState, ARecordComesBackEqualWhileClientsGetItsArchive) {
   });
 }
 
+TEST(LateState, AReadOfARecordThatIsNewerThanItsBytesIsTracedAsAnyOtherRead) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    const SpacekeepRecentInfo record = recordOf("/", "cache", 5);
+    world.setSync(shared(record), kKey);
+    const auto reads = [&] { return world.world.trace().linesWithFormat("%s EXIT").size(); };
+    const std::size_t before = reads();
+    EXPECT_EQ(world.record(), record);
+    EXPECT_EQ(reads() - before, 2U);  // _clientGetState and clientGetStateSync
+  });
+}
+
 TEST(LateState, TheBytesThatClientsGetAreCurrentAtOnceAlsoInTheWholeState) {
   inEverySchedule(kSchedules, [] {
     StateWorld world;

@@ -198,8 +198,10 @@ TEST_F(Inbox, ItsThreadSleepsWhileNothingHappensAndWakesSeldomWhileMuchDoes) {
     woken = inbox_->wakeUps();
     ASSERT_LT(elapsedNs(begin), 60'000 * kNsPerMs);
   }
+  // Counted before the time is taken: this thread may stand still for long in between.
+  const std::uint64_t woken = inbox_->wakeUps();
   const std::uint64_t pauses = elapsedNs(begin) / EventInbox::kPauseNs;
-  EXPECT_LE(inbox_->wakeUps(), pauses + 2);
+  EXPECT_LE(woken, pauses + 1);
   EXPECT_GT(made, 20U);
   EXPECT_EQ(names().size(), std::min<std::uint64_t>(made, 100));
 }

@@ -67,7 +67,10 @@ Authentication::Progress Authentication::advance(std::string& why) {
     switch (readLine(why)) {
       case Read::kNothing:
         return Progress::kMore;
-      case Read::kEnd:
+      case Read::kLeft:
+        why = "the peer left during authentication";
+        return Progress::kLeft;
+      case Read::kWrong:
         return Progress::kFailed;
       case Read::kLine:
         break;
@@ -84,10 +87,7 @@ Authentication::Read Authentication::readLine(std::string& why) {
   std::array<char, kMaxLineBytes> ahead{};
   const ssize_t seen = ::recv(fd_, ahead.data(), ahead.size(), MSG_PEEK | MSG_DONTWAIT);
   if (seen < 0 && (errno == EAGAIN || errno == EINTR)) return Read::kNothing;
-  if (seen <= 0) {
-    why = "the peer left during authentication";
-    return Read::kEnd;
-  }
+  if (seen <= 0) return Read::kLeft;
   std::size_t wanted = static_cast<std::size_t>(seen);
   if (state_ == State::kNul) {
     wanted = 1;
@@ -95,13 +95,12 @@ Authentication::Read Authentication::readLine(std::string& why) {
     wanted = static_cast<std::size_t>(static_cast<const char*>(end) - ahead.data()) + 1;
   }
   if (::recv(fd_, ahead.data(), wanted, MSG_DONTWAIT) != static_cast<ssize_t>(wanted)) {
-    why = "the peer left during authentication";
-    return Read::kEnd;
+    return Read::kLeft;
   }
   if (state_ == State::kNul) {
     if (ahead[0] != '\0') {
       why = "what the peer sent is no D-Bus authentication";
-      return Read::kEnd;
+      return Read::kWrong;
     }
     state_ = State::kStart;
     return readLine(why);
@@ -109,12 +108,12 @@ Authentication::Read Authentication::readLine(std::string& why) {
   line_.append(ahead.data(), wanted);
   if (line_.size() > kMaxLineBytes) {
     why = "a line of the authentication is too long";
-    return Read::kEnd;
+    return Read::kWrong;
   }
   if (line_.back() != '\n') return readLine(why);
   if (line_.size() < 2 || line_[line_.size() - 2] != '\r' || ++lines_ > kMaxLines) {
     why = "what the peer sent is no D-Bus authentication";
-    return Read::kEnd;
+    return Read::kWrong;
   }
   return Read::kLine;
 }

@@ -16,7 +16,7 @@ namespace spacekeep::ipc {
 class Authentication {
  public:
   enum class Role { kServer, kClient };
-  enum class Progress { kMore, kDone, kFailed };
+  enum class Progress { kMore, kDone, kFailed, kLeft };
 
   /// Does not take over `fd`, a non-blocking stream socket. `peer_uid` is what the kernel says of
   /// the peer; a server takes no other claim.
@@ -24,11 +24,12 @@ class Authentication {
 
   /// A client has to speak first. False when the peer is gone.
   bool begin();
-  /// Whenever there may be something to read. kFailed says in `why` what was wrong.
+  /// Whenever there may be something to read. kFailed says in `why` what was wrong, kLeft that the
+  /// peer is gone.
   Progress advance(std::string& why);
 
  private:
-  enum class Read { kLine, kNothing, kEnd };
+  enum class Read { kLine, kNothing, kLeft, kWrong };
   enum class State { kNul, kStart, kData, kAuthenticated };
 
   Read readLine(std::string& why);

@@ -100,6 +100,11 @@ void BusLink::authenticate() {
     case Authentication::Progress::kFailed:
       end(LinkEnd::kRefused, why);
       return;
+    case Authentication::Progress::kLeft:
+      // A server writes down who came and went without a word; a client has to find out whether
+      // the server has died.
+      end(role_ == Authentication::Role::kServer ? LinkEnd::kRefused : LinkEnd::kPeerLeft, why);
+      return;
     case Authentication::Progress::kDone:
       break;
   }

@@ -55,13 +55,16 @@ TEST(ConnectionEnd, APeerThatClosesWhileItLivesIsAnInvalidation) {
   EXPECT_EQ(pending.ends(), 1U);
 }
 
-/// A process that serves one connection at `path` and answers nothing, ended by a signal.
+enum class Does { kServe, kNeverAccept };
+
+/// A process that listens at `path`, serves one connection and answers nothing, ended by a signal.
 class OtherProcess {
  public:
-  explicit OtherProcess(const std::string& path) : pid_(::fork()) {
+  explicit OtherProcess(const std::string& path, Does does = Does::kServe) : pid_(::fork()) {
     if (pid_ != 0) return;
     std::string why;
     const auto listening = bindListeningSocket(path, 0600, why);
+    while (does == Does::kNeverAccept) ::pause();
     sd_bus* bus = nullptr;
     int fd = -1;
     while (fd < 0) fd = ::accept(listening->fd(), nullptr, nullptr);
@@ -106,6 +109,25 @@ TEST(ConnectionEnd, APeerWhoseProcessIsKilledIsAnInterruption) {
     EXPECT_EQ(ends.interruptions, 1);
     EXPECT_TRUE(pending.wait().error);
     EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).error);
+  }
+}
+
+TEST(ConnectionEnd, APeerWhoseProcessIsKilledDuringAuthenticationIsAnInterruption) {
+  const spacekeep::test::TemporaryDirectory directory;
+  OtherProcess service(directory / "service.sock", Does::kNeverAccept);
+  ConcurrentQueue global{{}};
+  IpcLoop loop;
+  Ends ends;
+  {
+    ConnectionLimits limits;
+    limits.peer_death_ns = kLongNs;
+    const auto connection =
+        watched(loop, global, connectedTo(directory / "service.sock"), ends, limits);
+    PendingCall pending(connection, "number", {std::int32_t{1}});
+    service.end();
+    EXPECT_TRUE(eventually([&] { return ends.all() == 1; }));
+    EXPECT_EQ(ends.interruptions, 1);
+    EXPECT_TRUE(pending.wait().error);
   }
 }
 

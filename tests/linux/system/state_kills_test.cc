@@ -17,6 +17,7 @@
 #include "support/runtime/runtime.h"
 #include "tests/linux/system/sandbox.h"
 #include "tests/linux/system/state_client.h"
+#include "tests/linux/system/state_writer.h"
 
 namespace spacekeep::system_test {
 namespace {
@@ -29,54 +30,6 @@ int killsAskedFor() {
   const char* asked = std::getenv("SPACEKEEP_STATE_KILLS");
   return asked == nullptr ? kEverydayKills : std::max(1, std::atoi(asked));
 }
-
-/// One client with a key of its own, whose value it counts up, one call at a time.
-class Writer {
- public:
-  explicit Writer(int number) : key_("KEY" + std::to_string(number)), number_(number) {}
-
-  /// Writes until the daemon is gone.
-  void writeUntilTheEnd(const std::string& socket) {
-    auto client = sdk::Client::connect({.socket_path = socket, .on_disconnect = {}});
-    if (!client) return;
-    while (true) {
-      ++sent_;
-      if (!client->setState(key_, value(sent_)).ok()) return;
-      answered_ = sent_;
-      ++answers_;
-    }
-  }
-  /// What is stored now: the last answered value or the one that was under way.
-  void check(sdk::Client& client) {
-    const sdk::StateReply reply = client.state(key_);
-    ASSERT_FALSE(reply.error) << reply.error->text;
-    for (std::uint64_t possible = answered_; possible <= sent_; ++possible) {
-      if (possible == 0 ? !reply.value : reply.value == value(possible)) {
-        answered_ = sent_ = possible;
-        return;
-      }
-    }
-    ++lost_;
-    ADD_FAILURE() << key_ << ": answered " << answered_ << ", sent " << sent_
-                  << ", and the daemon holds neither";
-  }
-  [[nodiscard]] std::uint64_t answers() const { return answers_; }
-  [[nodiscard]] std::uint64_t lost() const { return lost_; }
-
- private:
-  // Of changing size, up to some pages: commits of every shape.
-  [[nodiscard]] Value value(std::uint64_t count) const {
-    const std::size_t size = (count * 977) % (number_ == 0 ? 20'000 : 500);
-    return Dictionary{{"COUNT", count}, {"TEXT", std::string(size, 'x')}};
-  }
-
-  const std::string key_;
-  const int number_;
-  std::uint64_t sent_ = 0;
-  std::uint64_t answered_ = 0;
-  std::uint64_t answers_ = 0;
-  std::uint64_t lost_ = 0;
-};
 
 class StateKills : public testing::Test {
  protected:
@@ -99,14 +52,18 @@ class StateKills : public testing::Test {
       ADD_FAILURE() << "no answer after a start: " << sandbox_.daemonLog();
       return took_ms;
     }
-    for (Writer& writer : writers_) writer.check(*client);
+    for (StateWriter& writer : writers_) EXPECT_TRUE(writer.check(*client));
     return took_ms;
+  }
+  void writeUntilTheEnd(StateWriter& writer) {
+    auto client = sdk::Client::connect({.socket_path = sandbox_.socketPath(), .on_disconnect = {}});
+    if (client) writer.writeUntilTheEnd(*client);
   }
   void writeAndKillAfter(std::uint64_t delay_ns) {
     std::vector<std::thread> threads;
     threads.reserve(writers_.size());
-    for (Writer& writer : writers_) {
-      threads.emplace_back([this, &writer] { writer.writeUntilTheEnd(sandbox_.socketPath()); });
+    for (StateWriter& writer : writers_) {
+      threads.emplace_back([this, &writer] { writeUntilTheEnd(writer); });
     }
     rt::sleepNs(delay_ns);
     daemon_.signal(SIGKILL);
@@ -116,7 +73,7 @@ class StateKills : public testing::Test {
 
   Sandbox sandbox_;
   Process daemon_;
-  std::vector<Writer> writers_;
+  std::vector<StateWriter> writers_;
 };
 
 TEST_F(StateKills, LoseNothingThatWasAnsweredAndNeverKeepTheDaemonFromStarting) {
@@ -132,7 +89,7 @@ TEST_F(StateKills, LoseNothingThatWasAnsweredAndNeverKeepTheDaemonFromStarting) 
   }
   std::uint64_t answers = 0;
   std::uint64_t lost = 0;
-  for (const Writer& writer : writers_) {
+  for (const StateWriter& writer : writers_) {
     answers += writer.answers();
     lost += writer.lost();
   }

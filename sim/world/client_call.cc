@@ -14,6 +14,13 @@ std::optional<Dictionary> firstDictionary(const ipc::Arguments& arguments) {
   return std::nullopt;
 }
 
+std::optional<Value> firstValue(const ipc::Arguments& arguments) {
+  for (const ipc::Argument& argument : arguments) {
+    if (const auto* value = std::get_if<ipc::OptionalValue>(&argument)) return *value;
+  }
+  return std::nullopt;
+}
+
 }  // namespace
 
 ClientCall::ClientCall(Trace& trace, std::string member)
@@ -59,8 +66,8 @@ bool ClientCall::waitForNs(std::uint64_t duration_ns) {
 }
 
 void ClientCall::reply(ipc::Arguments arguments) {
-  trace_.add(ClientAnswered{number_, member_, firstDictionary(arguments)});
   const std::scoped_lock lock(mutex_);
+  trace_.add(ClientAnswered{number_, member_, firstDictionary(arguments), firstValue(arguments)});
   ++answers_;
   if (state_ != State::kOpen) return;
   answer_ = std::move(arguments);
@@ -71,12 +78,15 @@ void ClientCall::fail(const ipc::Error& error) {
   const std::scoped_lock lock(mutex_);
   if (state_ != State::kOpen) return;
   error_ = error.text;
+  trace_.add(ClientRefused{number_, member_, error.name + ": " + error.text});
   finish(State::kFailed);
 }
 
 void ClientCall::drop() {
   const std::scoped_lock lock(mutex_);
-  if (state_ == State::kOpen) finish(State::kDropped);
+  if (state_ != State::kOpen) return;
+  trace_.add(ClientDropped{number_, member_});
+  finish(State::kDropped);
 }
 
 void ClientCall::finish(State state) {

@@ -4,6 +4,19 @@
 #include <utility>
 
 namespace spacekeep::sim {
+namespace {
+
+Dictionary dictionaryOf(const InMemoryDisk::Contents& contents) {
+  Dictionary all;
+  for (const auto& [key, value] : contents) all.set(key, value);
+  return all;
+}
+
+void sleepIfAny(std::uint64_t duration_ns) {
+  if (duration_ns != 0) rt::sleepNs(duration_ns);
+}
+
+}  // namespace
 
 InMemoryDisk::Contents InMemoryDisk::read(const std::string& suite) const {
   const std::scoped_lock lock(mutex_);
@@ -13,8 +26,24 @@ InMemoryDisk::Contents InMemoryDisk::read(const std::string& suite) const {
 
 void InMemoryDisk::write(const std::string& suite, Contents contents) {
   const std::scoped_lock lock(mutex_);
+  if (is_over_ != nullptr && is_over_()) return;
+  if (trace_ != nullptr) trace_->add(DiskWritten{suite, dictionaryOf(contents)});
   suites_[suite] = std::move(contents);
   ++writes_;
+}
+
+void InMemoryDisk::refused(const std::string& suite, const std::string& reason) {
+  if (trace_ != nullptr) trace_->add(DiskRefused{suite, reason});
+}
+
+void InMemoryDisk::setWriteTimeNs(std::uint64_t duration_ns) {
+  const std::scoped_lock lock(mutex_);
+  write_time_ns_ = duration_ns;
+}
+
+std::uint64_t InMemoryDisk::writeTimeNs() const {
+  const std::scoped_lock lock(mutex_);
+  return write_time_ns_;
 }
 
 std::uint64_t InMemoryDisk::writes() const {
@@ -46,14 +75,20 @@ InMemoryPreferencesSuite::InMemoryPreferencesSuite(InMemoryDisk& disk, std::stri
     : disk_(disk), name_(std::move(name)), known_(disk.read(name_)) {}
 
 std::optional<std::string> InMemoryPreferencesSuite::synchronize() {
-  if (auto failure = refresh()) return failure;
+  if (auto failure = refresh()) {
+    if (!unwritten_.empty()) disk_.refused(name_, *failure);
+    return failure;
+  }
   if (unwritten_.empty()) return std::nullopt;
+  const std::uint64_t half_ns = disk_.writeTimeNs() / 2;
+  sleepIfAny(half_ns);
   for (auto& [key, value] : unwritten_) {
     known_.erase(key);
     if (value) known_.emplace(key, std::move(*value));
   }
   unwritten_.clear();
   disk_.write(name_, known_);
+  sleepIfAny(half_ns);
   return std::nullopt;
 }
 

@@ -11,6 +11,7 @@
 #include <string>
 #include <string_view>
 
+#include "sim/world/trace.h"
 #include "support/preferences/preferences_suite.h"
 #include "support/runtime/runtime.h"
 
@@ -21,21 +22,33 @@ class InMemoryDisk {
  public:
   using Contents = std::map<std::string, Value, std::less<>>;
 
+  InMemoryDisk() = default;
+  /// Tells the trace of each write, and takes none once `is_over` (null: never).
+  InMemoryDisk(Trace& trace, bool (*is_over)()) : trace_(&trace), is_over_(is_over) {}
+
   [[nodiscard]] Contents read(const std::string& suite) const;
   void write(const std::string& suite, Contents contents);
   [[nodiscard]] std::uint64_t writes() const;
+  /// From now on a write takes that long, and lands in the middle of it.
+  void setWriteTimeNs(std::uint64_t duration_ns);
+  [[nodiscard]] std::uint64_t writeTimeNs() const;
   /// From now on opening a suite fails, or works again.
   void refuseToOpen(bool refuse);
   /// From now on synchronize() and refresh() fail with this text; empty: works again.
   void failSynchronize(std::string reason);
   [[nodiscard]] bool refusesToOpen() const;
   [[nodiscard]] std::optional<std::string> synchronizeFailure() const;
+  /// For the trace: a write of the suite came to nothing.
+  void refused(const std::string& suite, const std::string& reason);
 
  private:
+  Trace* trace_ = nullptr;
+  bool (*is_over_)() = nullptr;
   mutable rt::Mutex mutex_;
   // Protected by mutex_.
   std::map<std::string, Contents> suites_;
   std::uint64_t writes_ = 0;
+  std::uint64_t write_time_ns_ = 0;
   bool refuse_to_open_ = false;
   std::string failure_;
 };

@@ -51,6 +51,7 @@ struct ServiceBehaviour {
   CallBehaviour notify;
   /// A cancel ends a held or delayed purge call at once, with what it has freed (nothing).
   bool cancel_stops_purge = false;
+  bool answers_twice = false;    ///< each call; the wire takes the first answer only
   std::optional<Value> opt_out;  ///< sent as "SPACEKEEP_OPT_OUT" with each purgeable answer
   std::uint64_t periodic_amount = 0;
 };

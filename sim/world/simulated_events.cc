@@ -21,12 +21,18 @@ void CountingKeepAlive::begin() {
   const std::scoped_lock lock(mutex_);
   ++open_;
   ++begun_;
+  changed();
 }
 
 void CountingKeepAlive::end() {
   const std::scoped_lock lock(mutex_);
   --open_;
   went_negative_ = went_negative_ || open_ < 0;
+  changed();
+}
+
+void CountingKeepAlive::changed() {
+  if (trace_ != nullptr) trace_->add(KeepAliveIs{open_});
 }
 
 std::int64_t CountingKeepAlive::open() const {

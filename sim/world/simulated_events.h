@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "sim/world/trace.h"
 #include "support/events/events.h"
 #include "support/queues/waiting.h"
 #include "support/runtime/runtime.h"
@@ -16,6 +17,8 @@ namespace spacekeep::sim {
 
 class CountingKeepAlive final : public KeepAlive {
  public:
+  CountingKeepAlive() = default;
+  explicit CountingKeepAlive(Trace& trace) : trace_(&trace) {}
   void begin() override;
   void end() override;
   [[nodiscard]] std::int64_t open() const;
@@ -24,6 +27,9 @@ class CountingKeepAlive final : public KeepAlive {
   [[nodiscard]] bool wentNegative() const;
 
  private:
+  void changed();  // with mutex_ held
+
+  Trace* trace_ = nullptr;
   mutable rt::Mutex mutex_;
   // Protected by mutex_.
   std::int64_t open_ = 0;

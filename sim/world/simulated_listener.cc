@@ -6,6 +6,21 @@
 #include "support/runtime/locks.h"
 
 namespace spacekeep::sim {
+namespace {
+
+ClientAsked askedBy(const SimulatedPeer& peer, std::uint64_t call, std::string_view member,
+                    const ipc::Arguments& arguments) {
+  ClientAsked asked{.call = call, .member = std::string(member), .client = peer.name()};
+  asked.rights.assign(peer.entitlements().begin(), peer.entitlements().end());
+  for (const ipc::Argument& argument : arguments) {
+    if (const auto* info = std::get_if<Dictionary>(&argument)) asked.info = *info;
+    if (const auto* text = std::get_if<std::string>(&argument)) asked.text = *text;
+    if (const auto* value = std::get_if<ipc::OptionalValue>(&argument)) asked.value = *value;
+  }
+  return asked;
+}
+
+}  // namespace
 
 class SimulatedListener::Handle final : public ipc::Listener {
  public:
@@ -54,11 +69,7 @@ std::shared_ptr<ClientCall> SimulatedListener::call(const std::shared_ptr<Simula
                                                     std::string_view member,
                                                     ipc::Arguments arguments) {
   auto call = std::make_shared<ClientCall>(trace_, std::string(member));
-  ClientAsked asked{call->number(), std::string(member), {}};
-  for (const ipc::Argument& argument : arguments) {
-    if (const auto* info = std::get_if<Dictionary>(&argument)) asked.info = *info;
-  }
-  trace_.add(std::move(asked));
+  trace_.add(askedBy(*peer, call->number(), member, arguments));
   const std::string refused = refusal(*peer, member, arguments);
   if (!refused.empty()) {
     call->fail({"org.freedesktop.DBus.Error.Failed", refused});

@@ -18,6 +18,9 @@ class SimulatedPeer final : public ipc::PeerConnection {
   SimulatedPeer(std::string name, std::set<std::string, std::less<>> entitlements);
 
   [[nodiscard]] const std::string& name() const { return name_; }
+  [[nodiscard]] const std::set<std::string, std::less<>>& entitlements() const {
+    return entitlements_;
+  }
   [[nodiscard]] bool holds(std::string_view entitlement) const;
   /// There is no process behind a simulated peer, so asking for its identity is a panic.
   [[nodiscard]] const access::PeerIdentity& identity() const override;

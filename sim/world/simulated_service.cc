@@ -112,7 +112,8 @@ std::size_t SimulatedService::recordArrival(const IncomingCall& incoming) {
                  tokenOf(other.info) == token;
         }));
   }
-  trace_.add(ServiceAsked{id_, record.member, record.call, record.urgency, record.amount, token});
+  trace_.add(ServiceAsked{id_, record.member, record.call, record.urgency, record.amount, token,
+                          record.info});
   records_.push_back(std::move(record));
   return records_.size() - 1;
 }
@@ -152,8 +153,10 @@ void SimulatedService::end(std::uint64_t call) {
 void SimulatedService::finish(OpenCall open) {
   Dictionary answer;
   const bool fails = open.behaviour.answer == Answer::kFailsDuringCall;
+  bool twice = false;
   {
     const std::scoped_lock lock(mutex_);
+    twice = behaviour_.answers_twice;
     RecordedCall& record = records_[open.record];
     record.ended_ns = trace_.nowNs();
     record.state = fails ? RecordedCall::State::kFailed : RecordedCall::State::kAnswered;
@@ -162,7 +165,8 @@ void SimulatedService::finish(OpenCall open) {
     if (fails) {
       trace_.add(ServiceCallFailed{id_, record.member, record.call});
     } else {
-      trace_.add(ServiceAnswered{id_, record.member, record.call, record.reported, record.freed});
+      trace_.add(
+          ServiceAnswered{id_, record.member, record.call, record.reported, record.freed, answer});
     }
   }
   if (fails) {
@@ -174,6 +178,7 @@ void SimulatedService::finish(OpenCall open) {
     const bool nothing = open.behaviour.answer == Answer::kRepliesNothing;
     out.emplace_back(nothing ? ipc::OptionalDictionary() : ipc::OptionalDictionary(answer));
   }
+  if (twice) open.incoming.reply(out);
   open.incoming.reply(std::move(out));
 }
 

@@ -75,7 +75,12 @@ bool SimulatedVolumes::validateVolume(const Dictionary& info) {
 
 std::uint64_t SimulatedVolumes::volumeFreespace(const Value* volume) {
   const std::string* path = volume == nullptr ? nullptr : volume->string();
-  return path == nullptr ? 0 : freeBytes(*path);
+  if (path == nullptr) return 0;
+  const std::scoped_lock lock(mutex_);
+  const auto found = volumes_.find(*path);
+  const std::uint64_t free_bytes = found == volumes_.end() ? 0 : found->second.free;
+  trace_.add(FreeSpaceLooked{*path, free_bytes});
+  return free_bytes;
 }
 
 void SimulatedVolumes::setLowSpaceSettings(const LowSpaceSettings& settings) {

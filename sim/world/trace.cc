@@ -28,7 +28,8 @@ struct BodyText {
   std::string operator()(const ServiceAsked& asked) const {
     return "asked " + asked.service + " " + asked.member + " #" + std::to_string(asked.call) +
            " urgency " + std::to_string(asked.urgency) + " amount " + numberOrNone(asked.amount) +
-           (asked.token.empty() ? "" : " token " + asked.token);
+           (asked.token.empty() ? "" : " token " + asked.token) +
+           (asked.member == "serviceNotify" ? " " + textOf(asked.info) : "");
   }
   std::string operator()(const ServiceAnswered& answered) const {
     return "answered " + answered.service + " " + answered.member + " #" +
@@ -47,23 +48,69 @@ struct BodyText {
            (distribution ? std::to_string(sent.value) : std::to_string(sent.count));
   }
   std::string operator()(const ClientAsked& asked) const {
-    return "client #" + std::to_string(asked.call) + " calls " + asked.member + " " +
-           (asked.info ? textOf(*asked.info) : "");
+    std::string text = "client #" + std::to_string(asked.call) + " " + asked.client + " calls " +
+                       asked.member + " " + (asked.info ? textOf(*asked.info) : "") + asked.text;
+    if (asked.value) text += " = " + textOf(*asked.value);
+    return text;
   }
   std::string operator()(const ClientAnswered& answered) const {
-    return "client #" + std::to_string(answered.call) + " gets " +
-           (answered.answer ? textOf(*answered.answer) : "(no dictionary)");
+    const std::string who = "client #" + std::to_string(answered.call) + " gets ";
+    if (answered.value) return who + textOf(*answered.value);
+    return who + (answered.answer ? textOf(*answered.answer) : "(no dictionary)");
   }
   std::string operator()(const WorldChanged& changed) const { return "world " + changed.what; }
+  std::string operator()(const FreeSpaceLooked& look) const {
+    return "looks at " + look.volume + " " + std::to_string(look.free);
+  }
+  std::string operator()(const ClientRefused& refused) const {
+    return "client #" + std::to_string(refused.call) + " is refused: " + refused.error;
+  }
+  std::string operator()(const ClientDropped& dropped) const {
+    return "client #" + std::to_string(dropped.call) + " is never answered";
+  }
+  std::string operator()(const LifeBegan& life) const {
+    return "life " + std::to_string(life.life) + " begins, wall clock " +
+           std::to_string(life.wall_clock_ns);
+  }
+  std::string operator()(const LifeEnded& life) const {
+    return "life " + std::to_string(life.life) + (life.killed ? " is killed" : " ends");
+  }
+  std::string operator()(const ClockJumped& jump) const {
+    return "wall clock jumps by " + std::to_string(jump.by_ns);
+  }
+  std::string operator()(const DiskWritten& written) const {
+    return "disk " + written.suite + " " + textOf(written.contents);
+  }
+  std::string operator()(const DiskRefused& refused) const {
+    return "disk refuses " + refused.suite + ": " + refused.reason;
+  }
+  std::string operator()(const StreamEventSent& sent) const {
+    std::string text = "stream event " + textOf(sent.event) + ", low:";
+    for (const std::string& volume : sent.low_volumes) text += " " + volume;
+    return text;
+  }
+  std::string operator()(const KeepAliveIs& keep) const {
+    return "keep-alive " + std::to_string(keep.open);
+  }
+  std::string operator()(const ActivityRan& ran) const {
+    return "activity in state " + std::to_string(ran.state);
+  }
 };
 
 }  // namespace
 
-Trace::Trace() : start_ticks_(rt::ticks()) { events_.reserve(512); }
+Trace::Trace(TraceStart start)
+    : start_ticks_(rt::ticks()),
+      start_ns_(start.at_ns),
+      is_over_(start.is_over),
+      last_call_(start.last_call) {
+  events_.reserve(512);
+}
 
-std::uint64_t Trace::nowNs() const { return ticksToNs(rt::ticks() - start_ticks_); }
+std::uint64_t Trace::nowNs() const { return start_ns_ + ticksToNs(rt::ticks() - start_ticks_); }
 
 void Trace::add(EventBody body) {
+  if (is_over_ != nullptr && is_over_()) return;
   // Each thread has slots of its own, so their address tells threads apart.
   const void* thread = &rt::threadSlot(rt::ThreadSlot::kPoolWorker);
   const std::scoped_lock lock(mutex_);

@@ -25,14 +25,17 @@ ConcurrentQueue::Options queueOptions(const World::Options& options) {
 World::World() : World(Options{}) {}
 
 World::World(Options options)
-    : log_capture_(trace_),
+    : trace_(options.trace),
+      log_capture_(trace_),
       global_(std::make_unique<ConcurrentQueue>(queueOptions(options))),
       delays_(*global_),
       volumes_(trace_, delays_),
       statistics_(trace_),
+      disk_(trace_, options.trace.is_over),
       connector_(*global_),
       listener_(*global_, trace_),
       events_(*global_),
+      keep_alive_(trace_),
       caller_(*global_, connector_, spacekeepServiceInterface()),
       platform_(makePlatform()) {
   if (const auto base = rt::timebase()) {

@@ -39,6 +39,7 @@ class World {
  public:
   struct Options {
     std::size_t parallelism = 4;  ///< of the global queue
+    TraceStart trace{};           ///< where the trace of an earlier world is taken up
   };
 
   World();

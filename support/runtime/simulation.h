@@ -55,6 +55,9 @@ ScheduleReport runSchedule(const ScheduleOptions& options, const std::function<v
 /// True inside runSchedule.
 [[nodiscard]] bool insideSchedule();
 
+/// True while what is left of a schedule is unwound: what happens now is no part of the run.
+[[nodiscard]] bool clearingAway();
+
 /// Moves the wall clock without moving the monotonic counter.
 void jumpWallClockNs(std::int64_t by_ns);
 

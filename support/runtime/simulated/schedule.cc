@@ -94,6 +94,8 @@ ScheduleReport runSchedule(const ScheduleOptions& options, const std::function<v
 
 bool insideSchedule() { return Scheduler::current() != nullptr; }
 
+bool clearingAway() { return insideSchedule() && Scheduler::current()->unwinding(); }
+
 void jumpWallClockNs(std::int64_t by_ns) {
   if (!insideSchedule()) panic("jumpWallClockNs outside a schedule");
   Scheduler::current()->jumpWallClockNs(by_ns);

@@ -1,0 +1,19 @@
+# SPACEKEEP_COVERAGE: a directory for the counts of executed lines and branches (clang only). Counted
+# is what stands in the seven folders of the daemon, and nothing else. The directory is compiled into
+# the programs, so a daemon that a test starts with an empty environment and a root of its own counts
+# too: /dev is the one directory that such a root has in common with the machine. The counts live in a
+# shared mapping of a file there (%c, which needs the relocation), so those of a killed process stay;
+# %m: one file per program, for all its processes.
+set(SPACEKEEP_COVERAGE "" CACHE PATH "Where programs keep their counts of executed code")
+if(SPACEKEEP_COVERAGE)
+  set(list ${CMAKE_BINARY_DIR}/counted_sources.list)
+  set(text "[clang]\ndefault:skip\n")
+  foreach(folder IN ITEMS daemon support registry client operations purge purgeable)
+    string(APPEND text "source:${CMAKE_SOURCE_DIR}/${folder}/*=allow\n")
+  endforeach()
+  file(CONFIGURE OUTPUT ${list} CONTENT "${text}" @ONLY)
+  set(counts "-fprofile-instr-generate=${SPACEKEEP_COVERAGE}/%m%c.profraw")
+  add_compile_options(${counts} -fcoverage-mapping -fprofile-list=${list}
+                      "SHELL:-mllvm -runtime-counter-relocation")
+  string(APPEND CMAKE_EXE_LINKER_FLAGS " -fprofile-instr-generate")
+endif()

@@ -22,31 +22,31 @@ namespace spacekeep::sim {
 enum class SystemEnd {
   kFinished,    ///< every call has ended and nothing is left to do
   kSilentPing,  ///< the daemon waits for a ping that was never answered, as described
-  kDeadlock,    ///< somebody waits who ought not to; see LifeOfDaemon::report
+  kDeadlock,    ///< somebody waits who ought not to
   kStuck,       ///< goes round in circles
 };
 
-/// A call of a client, as it stood when its life ended.
+/// A call of a client, as the trace tells of it when its life ended.
 struct CallOfClient {
   unsigned life = 0;
   std::string client;
-  std::set<std::string, std::less<>> rights;
   std::string member;
-  ClientCall::State state = ClientCall::State::kOpen;  ///< open: the crash came first
+  ClientCall::State state = ClientCall::State::kOpen;  ///< open: the kill came first
   unsigned answers = 0;
   std::string error;
-  ipc::Arguments answer;
+  std::optional<Dictionary> answer;  ///< the first one, of members that answer with one
+  std::optional<Value> value;        ///< of "clientGetState"
 };
 
 /// What a service saw in one life.
 struct ServiceOfLife {
-  std::vector<RecordedCall> calls;
   std::uint64_t asked_twice = 0;  ///< by one purge at once
   std::map<std::string, OwnedBytes> owns_at_end;
 };
 
 struct LifeOfDaemon {
   rt::ScheduleReport report;
+  SystemEnd end = SystemEnd::kFinished;
   bool killed = false;         ///< at a step of the schedule; else it came to its end
   std::uint64_t began_ns = 0;  ///< on the time line of the trace
   std::int64_t wall_clock_began_ns = 0;
@@ -63,8 +63,8 @@ struct LifeOfDaemon {
 struct SystemRun {
   SystemPlan plan;
   std::uint64_t seed = 0;
-  SystemEnd end = SystemEnd::kFinished;  ///< of the last life
-  std::vector<std::string> blocked;      ///< who waits for what, unless it finished
+  SystemEnd end = SystemEnd::kFinished;  ///< of the first life that did not finish, if any
+  std::vector<std::string> blocked;      ///< who waits for what in that life
   std::vector<LifeOfDaemon> lives;
   std::vector<Event> events;
   std::map<std::uint64_t, CallOfClient> calls;  ///< by the number that the trace names

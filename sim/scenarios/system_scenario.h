@@ -177,6 +177,7 @@ struct PlannedCrash {
 
 struct SystemPlan {
   std::size_t parallelism = 4;
+  std::uint64_t disk_write_ns = 0;  ///< how long a write of the state takes
   std::set<Fault> faults;
   std::vector<PlannedVolume> volumes;
   std::vector<SystemService> services;

@@ -32,6 +32,11 @@ void InMemoryDisk::write(const std::string& suite, Contents contents) {
   ++writes_;
 }
 
+void InMemoryDisk::restore(const std::string& suite, Contents contents) {
+  const std::scoped_lock lock(mutex_);
+  suites_[suite] = std::move(contents);
+}
+
 void InMemoryDisk::refused(const std::string& suite, const std::string& reason) {
   if (trace_ != nullptr) trace_->add(DiskRefused{suite, reason});
 }

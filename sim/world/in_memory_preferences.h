@@ -28,6 +28,8 @@ class InMemoryDisk {
 
   [[nodiscard]] Contents read(const std::string& suite) const;
   void write(const std::string& suite, Contents contents);
+  /// What was on it before the world began.
+  void restore(const std::string& suite, Contents contents);
   [[nodiscard]] std::uint64_t writes() const;
   /// From now on a write takes that long, and lands in the middle of it.
   void setWriteTimeNs(std::uint64_t duration_ns);

@@ -188,6 +188,7 @@ void SimulatedConnection::keepPing(ipc::RemoteProxy::ReplyHandler reply) {
   if (abandoned_) {
     global_.async([reply = std::move(reply)] { reply({}); });
   } else {
+    if (service_ != nullptr) service_->pingLost();
     lost_pings_.push_back(std::move(reply));
   }
 }

@@ -33,6 +33,12 @@ void CountingKeepAlive::end() {
 
 void CountingKeepAlive::changed() {
   if (trace_ != nullptr) trace_->add(KeepAliveIs{open_});
+  if (open_ <= 0) idle_.notifyAll();
+}
+
+void CountingKeepAlive::waitUntilIdle() {
+  const std::scoped_lock lock(mutex_);
+  while (open_ > 0) idle_.wait(mutex_);
 }
 
 std::int64_t CountingKeepAlive::open() const {
@@ -76,8 +82,14 @@ void SimulatedEventSources::park() {
   {
     const std::scoped_lock lock(mutex_);
     parked_ = true;
+    has_parked_.notifyAll();
   }
   unparked_.wait();
+}
+
+void SimulatedEventSources::waitUntilParked() {
+  const std::scoped_lock lock(mutex_);
+  while (!parked_) has_parked_.wait(mutex_);
 }
 
 bool SimulatedEventSources::runActivity(const std::string& name, ActivityState state) {

@@ -25,6 +25,8 @@ class CountingKeepAlive final : public KeepAlive {
   [[nodiscard]] std::uint64_t begun() const;
   /// True when end() was once called more often than begin().
   [[nodiscard]] bool wentNegative() const;
+  /// Waits until no transaction is open, without any time limit.
+  void waitUntilIdle();
 
  private:
   void changed();  // with mutex_ held
@@ -35,6 +37,7 @@ class CountingKeepAlive final : public KeepAlive {
   std::int64_t open_ = 0;
   std::uint64_t begun_ = 0;
   bool went_negative_ = false;
+  rt::CondVar idle_;
 };
 
 class SimulatedEventSources final : public EventSources {
@@ -48,6 +51,7 @@ class SimulatedEventSources final : public EventSources {
   [[nodiscard]] int postNotification(const std::string& name) override;
   /// Waits until unpark().
   void park() override;
+  void waitUntilParked();
 
   /// Runs the activity's handler in that state on the global queue. False when nobody registered.
   bool runActivity(const std::string& name, ActivityState state);
@@ -79,6 +83,7 @@ class SimulatedEventSources final : public EventSources {
   void (*termination_handler_)(int) = nullptr;
   int notification_result_ = 0;
   bool parked_ = false;
+  rt::CondVar has_parked_;
 };
 
 }  // namespace spacekeep::sim

@@ -269,6 +269,15 @@ void SimulatedService::answerPingsFromNowOn() {
   for (const std::uint64_t call : pings) end(call);
 }
 
+void SimulatedService::grow(const std::string& volume, std::size_t urgency, std::uint64_t bytes) {
+  const std::uint64_t taken = volumes_.write(volume, bytes);
+  const std::scoped_lock lock(mutex_);
+  behaviour_.owns[volume].at(urgency) += taken;
+  trace_.add(WorldChanged{id_ + " owns " + std::to_string(taken) + " more on " + volume});
+}
+
+void SimulatedService::pingLost() { trace_.add(WorldChanged{id_ + " " + kPingLost}); }
+
 void SimulatedService::die() {
   {
     const std::scoped_lock lock(mutex_);

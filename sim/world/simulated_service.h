@@ -24,6 +24,9 @@ namespace spacekeep::sim {
 
 class SimulatedConnection;
 
+/// What the trace says of a service, after its ID, whose ping will never be answered.
+inline constexpr const char* kPingLost = "never answers a ping: its connection has ended";
+
 /// Each answer with a dictionary holds its RecordedCall::call under this key.
 inline constexpr const char* kCallKey = "SIMULATED_CALL";
 
@@ -70,6 +73,8 @@ class SimulatedService : public std::enable_shared_from_this<SimulatedService> {
   // Changing the world.
   void setBehaviour(ServiceBehaviour behaviour);
   [[nodiscard]] ServiceBehaviour behaviour() const;
+  /// Its data grow, at the cost of the volume; by less when there is no room.
+  void grow(const std::string& volume, std::size_t urgency, std::uint64_t bytes);
   /// Answers every call that is held (Answer::kNever) as if its behaviour had been kReplies.
   void answerHeldCalls();
   /// Answers held pings, and every further one at once. Other held calls stay held.
@@ -84,6 +89,8 @@ class SimulatedService : public std::enable_shared_from_this<SimulatedService> {
   void abandon();
 
   // For connections.
+  /// For the trace: the daemon waits for ever for an answer to a ping.
+  void pingLost();
   void receive(IncomingCall incoming);
   void connected(const std::shared_ptr<SimulatedConnection>& connection);
   /// The calls that came over it are given up.

@@ -37,7 +37,11 @@ void SimulatedVolumes::giveBack(const std::string& volume, std::uint64_t bytes,
     addFree(volume, bytes);
     return;
   }
-  delays_.after(after_ns, [this, volume, bytes] { addFree(volume, bytes); });
+  addOutstanding(volume, bytes);
+  delays_.after(after_ns, [this, volume, bytes] {
+    addOutstanding(volume, 0 - bytes);
+    addFree(volume, bytes);
+  });
 }
 
 void SimulatedVolumes::setFree(const std::string& volume, std::uint64_t free_bytes) {
@@ -91,6 +95,19 @@ void SimulatedVolumes::setLowSpaceSettings(const LowSpaceSettings& settings) {
 std::optional<LowSpaceSettings> SimulatedVolumes::lowSpaceSettings() const {
   const std::scoped_lock lock(mutex_);
   return low_space_settings_;
+}
+
+std::uint64_t SimulatedVolumes::outstandingBytes(const std::string& volume) const {
+  const std::scoped_lock lock(mutex_);
+  const auto found = volumes_.find(volume);
+  return found == volumes_.end() ? 0 : found->second.outstanding;
+}
+
+// Modulo 2^64, so that it takes away as well.
+void SimulatedVolumes::addOutstanding(const std::string& volume, std::uint64_t bytes) {
+  const std::scoped_lock lock(mutex_);
+  const auto found = volumes_.find(volume);
+  if (found != volumes_.end()) found->second.outstanding += bytes;
 }
 
 void SimulatedVolumes::addFree(const std::string& volume, std::uint64_t bytes) {

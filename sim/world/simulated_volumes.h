@@ -32,6 +32,8 @@ class SimulatedVolumes final : public Volumes {
   void setFree(const std::string& volume, std::uint64_t free_bytes);
   void setLowSpace(std::vector<std::string> volumes);
   [[nodiscard]] std::uint64_t freeBytes(const std::string& volume) const;
+  /// Given up, and not back yet.
+  [[nodiscard]] std::uint64_t outstandingBytes(const std::string& volume) const;
   /// The last settings given, none when there were none yet. They decide nothing here: which volumes
   /// are short is what setLowSpace() says.
   [[nodiscard]] std::optional<LowSpaceSettings> lowSpaceSettings() const;
@@ -46,9 +48,11 @@ class SimulatedVolumes final : public Volumes {
   struct Volume {
     std::uint64_t size = 0;
     std::uint64_t free = 0;
+    std::uint64_t outstanding = 0;
   };
 
   void addFree(const std::string& volume, std::uint64_t bytes);
+  void addOutstanding(const std::string& volume, std::uint64_t bytes);
   void set(const std::string& volume, Volume& state, std::uint64_t free_bytes);
 
   Trace& trace_;

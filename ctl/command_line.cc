@@ -8,6 +8,7 @@
 #include <map>
 #include <memory>
 
+#include "ctl/check_service/check_service.h"
 #include "ctl/commands.h"
 #include "ctl/help_layout.h"
 #include "ctl/size_text.h"
@@ -27,6 +28,7 @@ struct Options {
   StateOptions state;
   VolumesOptions volumes;
   std::string token;
+  CheckServiceOptions check;
 };
 using SharedOptions = std::shared_ptr<Options>;
 
@@ -180,6 +182,42 @@ void addCancel(CLI::App& app, const SharedOptions& options, Command& chosen) {
   cancel.add_option("TOKEN", options->token, "The purge's token")->required();
 }
 
+void addCheckService(CLI::App& app, const SharedOptions& options, Command& chosen) {
+  auto& check = addCommand(
+      app, "check-service",
+      "Run a service through what the daemon asks of it\n"
+      "Says in words what is wrong. Needs no daemon: this tool stands in for it, starts COMMAND "
+      "and asks it to give up all the data that it can give up on the volume. The exit status is 7 "
+      "when a check failed. Write -- before the command, as in:\n"
+      "  check-service --volume /data -- my-cache --verbose",
+      options, chosen, [](const Options& o) { return runCheckService(o.common, o.check); });
+  CheckServiceOptions& wanted = options->check;
+  check.add_option("COMMAND", wanted.command,
+                   "The service and its arguments; {socket} stands for the daemon's socket, which "
+                   "is also in SPACEKEEP_SOCKET");
+  check
+      .add_option("--volume", wanted.volume,
+                  "Mount point of the volume that holds the service's data")
+      ->option_text("PATH")
+      ->required();
+  check.add_option("--endpoint", wanted.endpoint, "Socket of a service that listens already")
+      ->option_text("SOCKET");
+  check
+      .add_option("--data", wanted.data, "Where the service keeps its data, to tell what vanished")
+      ->option_text("PATH");
+  check
+      .add_option("--in-use", wanted.in_use,
+                  "File to hold open, locked and mapped during purges, or directory of such")
+      ->option_text("PATH");
+  check
+      .add_option("--patience", wanted.patience_seconds,
+                  "Seconds after which an answer counts as missing, 1 to 600 (default 20)")
+      ->option_text("SECONDS")
+      ->check(CLI::Range(1, 600));
+  check.add_flag("--yes", wanted.yes, "Give up the data without asking first");
+  check.add_flag("--no-purge", wanted.no_purge, "Only the checks that give up no data");
+}
+
 void addCommonOptions(CLI::App& app, CommonOptions& common, const std::string& version) {
   app.set_version_flag("--version", "spacekeepctl " + version, "Show the version");
   app.add_flag("--json", common.json, "Write the result as one JSON object");
@@ -190,7 +228,8 @@ void addCommonOptions(CLI::App& app, CommonOptions& common, const std::string& v
   app.formatter(std::make_shared<HelpLayout>(styleOf(STDOUT_FILENO).columns));
   app.footer(
       "Exit status: 0 done, 1 the purge did not reach its amount, 2 wrong usage, 3 daemon not "
-      "reachable, 4 refused, 5 failed, 6 the key has no value. See spacekeepctl(1).");
+      "reachable, 4 refused, 5 failed, 6 the key has no value, 7 a check failed. See "
+      "spacekeepctl(1).");
   app.fallthrough();
 }
 
@@ -203,7 +242,7 @@ int commandMissing(const CLI::App& app) {
   const bool in_state = app.got_subcommand("state");
   std::fprintf(stderr, "A command is required: %s\nRun with --help for more information.\n",
                in_state ? "state get, state set, state unset or state list"
-                        : "purge, query, state, volumes or cancel");
+                        : "purge, query, state, volumes, cancel or check-service");
   return static_cast<int>(ExitCode::kUsage);
 }
 
@@ -221,6 +260,7 @@ std::variant<Command, int> parseCommandLine(int argc, const char* const* argv,
   addState(app, options, chosen, type_text);
   addVolumes(app, options, chosen);
   addCancel(app, options, chosen);
+  addCheckService(app, options, chosen);
   app.require_subcommand(0, 1);  // "none" is told below, so that an unknown word is named
   try {
     app.parse(argc, argv);

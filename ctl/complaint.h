@@ -11,13 +11,14 @@ namespace spacekeep::ctl {
 
 /// How the tool ends. Scripts rely on these numbers; the man page lists them.
 enum class ExitCode : int {
-  kDone = 0,         ///< what was asked for was done; purge: the amount was reached
-  kNotReached = 1,   ///< the purge ended with less
-  kUsage = 2,        ///< the command line is wrong; nothing was asked
-  kUnreachable = 3,  ///< nobody listens at the socket
-  kRefused = 4,      ///< the daemon refused: no right, or no such volume
-  kFailed = 5,       ///< the connection or the daemon failed meanwhile
-  kNoValue = 6,      ///< state get: the key has no value
+  kDone = 0,          ///< what was asked for was done; purge: the amount was reached
+  kNotReached = 1,    ///< the purge ended with less
+  kUsage = 2,         ///< the command line is wrong; nothing was asked
+  kUnreachable = 3,   ///< nobody listens at the socket
+  kRefused = 4,       ///< the daemon refused: no right, or no such volume
+  kFailed = 5,        ///< the connection or the daemon failed meanwhile
+  kNoValue = 6,       ///< state get: the key has no value
+  kChecksFailed = 7,  ///< check-service: at least one check failed
 };
 
 struct CommonOptions {

@@ -107,11 +107,11 @@ std::string printAge(double seconds) {
   constexpr double kMinute = 60;
   constexpr double kHour = 60 * kMinute;
   constexpr double kDay = 24 * kHour;
-  const double age = std::max(seconds, 0.0);
-  if (age < 2 * kMinute) return fmt::format("{:.0f} s", std::floor(age));
-  if (age < 2 * kHour) return fmt::format("{:.0f} min", std::floor(age / kMinute));
-  if (age < 2 * kDay) return fmt::format("{:.0f} h", std::floor(age / kHour));
-  return fmt::format("{:.0f} days", std::floor(age / kDay));
+  const double age_seconds = std::max(seconds, 0.0);
+  if (age_seconds < 2 * kMinute) return fmt::format("{:.0f} s", std::floor(age_seconds));
+  if (age_seconds < 2 * kHour) return fmt::format("{:.0f} min", std::floor(age_seconds / kMinute));
+  if (age_seconds < 2 * kDay) return fmt::format("{:.0f} h", std::floor(age_seconds / kHour));
+  return fmt::format("{:.0f} days", std::floor(age_seconds / kDay));
 }
 
 }  // namespace spacekeep::ctl

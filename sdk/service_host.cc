@@ -1,4 +1,5 @@
 #include <spacekeep/service.h>
+#include <stdlib.h>
 
 #include <functional>
 #include <memory>
@@ -11,6 +12,17 @@
 #include "sdk/socket_loop.h"
 
 namespace spacekeep::sdk {
+namespace {
+
+/// Whoever starts a service may put another daemon in front of it, which takes no word of the
+/// program's own. Not so in a program with more rights than its starter (secure_getenv(3)).
+std::string daemonSocketOf(const CheckInOptions& options) {
+  const char* given = secure_getenv("SPACEKEEP_SOCKET");
+  const bool left_open = options.socket_path == kDefaultSocketPath;
+  return left_open && given != nullptr && *given != '\0' ? given : options.socket_path;
+}
+
+}  // namespace
 
 class ServiceHost::Impl {
  public:
@@ -54,6 +66,7 @@ Result<ServiceHost> ServiceHost::checkIn(std::string id, std::shared_ptr<Service
                                          CheckInOptions options) {
   if (id.empty()) return Error{ErrorKind::kInvalidArgument, "a service needs an ID to check in"};
   if (!service) return Error{ErrorKind::kInvalidArgument, "there is no service to check in"};
+  options.socket_path = daemonSocketOf(options);
   auto impl = std::make_unique<Impl>(std::move(service), options);
   impl->start([id = std::move(id), options = std::move(options)](Impl& self) {
     CheckInLoop(id, options, self.engine, self.control, self.served).run();

@@ -109,6 +109,7 @@ struct ServiceOptions {
 
 /// For a service that makes itself known while it runs. Its user needs "SERVICE_ENTITLEMENT".
 struct CheckInOptions : ServiceOptions {
+  /// Left as it is, the environment variable SPACEKEEP_SOCKET names another one, for tests.
   std::string socket_path = kDefaultSocketPath;
   bool does_purge = true;
   bool does_periodic = false;

@@ -110,19 +110,19 @@ void checkServiceStatistics(const PurgeStory& story, Findings& findings) {
     ++expected[reply.service].times;
     expected[reply.service].count += static_cast<std::int64_t>(reply.amount);
   }
-  for (const PlannedService& service : story.run.scenario.services) {
-    const Sent& balance = expected[service.id];
-    const auto total = sent.find(service.id + ".purged");
+  for (const std::string& service : story.run.service_ids) {
+    const Sent& balance = expected[service];
+    const auto total = sent.find(service + ".purged");
     const Sent told = total == sent.end() ? Sent() : total->second;
     if (told.times != balance.times || told.count != balance.count) {
-      findings.push_back(service.id + ".purged counts " + std::to_string(told.count) +
-                         " bytes in " + std::to_string(told.times) + " reports, booked were " +
+      findings.push_back(service + ".purged counts " + std::to_string(told.count) + " bytes in " +
+                         std::to_string(told.times) + " reports, booked were " +
                          std::to_string(balance.count) + " in " + std::to_string(balance.times));
     }
-    const auto elapsed = sent.find(service.id + "_purgeElapsedNanoseconds");
+    const auto elapsed = sent.find(service + "_purgeElapsedNanoseconds");
     const std::uint64_t times = elapsed == sent.end() ? 0 : elapsed->second.times;
     if (times != balance.times) {
-      findings.push_back(service.id + "_purgeElapsedNanoseconds was sent " + std::to_string(times) +
+      findings.push_back(service + "_purgeElapsedNanoseconds was sent " + std::to_string(times) +
                          " times for " + std::to_string(balance.times) + " replies");
     }
   }
@@ -166,6 +166,7 @@ void checkPurgeStatistics(const PurgeStory& story, Findings& findings) {
 void checkReportingServices(const PurgeStory& story, Findings& findings) {
   for (std::size_t index = 0; index < story.operations.size(); ++index) {
     const Operation& operation = story.operations[index];
+    if (operation.end_at == kNowhere) continue;
     for (const Pass& pass : operation.passes) {
       const std::string key =
           "SPACEKEEP_URGENCY_" + std::to_string(pass.urgency) + "_OPERATION_INFO";

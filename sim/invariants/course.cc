@@ -20,17 +20,18 @@ const char* wordFor(rt::ScheduleEnd end) {
   return "?";
 }
 
-const PlannedPurge* plannedWith(const PurgeRun& run, const std::string& token) {
-  for (const PlannedPurge& purge : run.scenario.purges) {
+const PlannedPurge* plannedWith(const PurgeView& run, const std::string& token) {
+  for (const PlannedPurge& purge : run.scenario->purges) {
     const Value* planned = purge.info.find("SPACEKEEP_TOKEN");
     if (planned != nullptr && textOf(*planned) == token) return &purge;
   }
   return nullptr;
 }
 
-bool isKnownVolume(const PurgeRun& run, const Dictionary& info) {
+bool isKnownVolume(const PurgeView& run, const Dictionary& info) {
   const std::string* volume = stringAt(info, "SPACEKEEP_VOLUME");
-  return volume != nullptr && std::any_of(run.scenario.volumes.begin(), run.scenario.volumes.end(),
+  const std::vector<PlannedVolume>& volumes = run.scenario->volumes;
+  return volume != nullptr && std::any_of(volumes.begin(), volumes.end(),
                                           [&](const auto& known) { return known.path == *volume; });
 }
 
@@ -72,11 +73,11 @@ std::string problemWith(const PurgeStory& story, const PlannedPurge& plan,
 }  // namespace
 
 void checkEnd(const PurgeStory& story, Findings& findings) {
-  const rt::ScheduleReport& report = story.run.report;
-  if (report.end != rt::ScheduleEnd::kFinished) {
-    findings.push_back(std::string("the schedule ended as ") + wordFor(report.end));
+  if (story.run.end != rt::ScheduleEnd::kFinished) {
+    findings.push_back(std::string("the schedule ended as ") + wordFor(story.run.end));
   }
-  for (const std::string& blocked : report.blocked) findings.push_back("left blocked: " + blocked);
+  for (const std::string& blocked : story.run.blocked)
+    findings.push_back("left blocked: " + blocked);
 }
 
 void checkOddities(const PurgeStory& story, Findings& findings) {
@@ -126,7 +127,7 @@ void checkOnlyPurgingServicesAreAsked(const PurgeStory& story, Findings& finding
   for (const Event& event : story.run.events) {
     const auto* asked = std::get_if<ServiceAsked>(&event.body);
     if (asked == nullptr || asked->member != "servicePurge") continue;
-    for (const PlannedService& service : story.run.scenario.services) {
+    for (const PlannedService& service : story.run.scenario->services) {
       const bool may_purge = service.purges || service.purges_after_second_check_in.value_or(false);
       if (service.id == asked->service && !may_purge) {
         findings.push_back(service.id + " does not purge and was asked to");

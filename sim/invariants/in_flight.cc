@@ -7,15 +7,7 @@
 namespace spacekeep::sim {
 namespace {
 
-using Request = std::pair<std::string, std::string>;  // service and token
-
-const std::string* tokenOf(const PurgeStory& story, std::uint64_t call) {
-  for (const Event& event : story.run.events) {
-    const auto* asked = std::get_if<ServiceAsked>(&event.body);
-    if (asked != nullptr && asked->call == call) return &asked->token;
-  }
-  return nullptr;
-}
+using Request = std::pair<std::string, std::size_t>;  // service and purge
 
 /// Purge calls that a service has received and neither answered nor seen fail.
 std::map<std::string, std::int64_t> openCalls(const PurgeStory& story) {
@@ -36,20 +28,24 @@ std::map<std::string, std::int64_t> openCalls(const PurgeStory& story) {
 
 void checkNeverAskedTwiceAtOnce(const PurgeStory& story, Findings& findings) {
   std::map<Request, std::int64_t> open;
+  const auto operationOf = [&](std::uint64_t call) {
+    const auto found = story.operation_of_call.find(call);
+    return found == story.operation_of_call.end() ? kNowhere : found->second;
+  };
   for (const Event& event : story.run.events) {
     if (const auto* asked = std::get_if<ServiceAsked>(&event.body)) {
       if (asked->member != "servicePurge") continue;
-      if (++open[{asked->service, asked->token}] > 1) {
+      const std::size_t operation = operationOf(asked->call);
+      const bool is_clear = operation != kNowhere && !story.operations[operation].blurred;
+      if (++open[{asked->service, operation}] > 1 && is_clear) {
         findings.push_back(asked->service + " was asked again before it had answered");
       }
     } else if (const auto* answered = std::get_if<ServiceAnswered>(&event.body)) {
-      const std::string* token = tokenOf(story, answered->call);
-      if (answered->member == "servicePurge" && token != nullptr) {
-        --open[{answered->service, *token}];
+      if (answered->member == "servicePurge") {
+        --open[{answered->service, operationOf(answered->call)}];
       }
     } else if (const auto* failed = std::get_if<ServiceCallFailed>(&event.body)) {
-      const std::string* token = tokenOf(story, failed->call);
-      if (failed->member == "servicePurge" && token != nullptr) --open[{failed->service, *token}];
+      if (failed->member == "servicePurge") --open[{failed->service, operationOf(failed->call)}];
     }
   }
   for (const auto& [service, times] : story.run.asked_twice) {

@@ -1,6 +1,6 @@
 // Thread safety: pure functions.
 //
-// What must hold in every purge run, whatever the schedule. Each invariant looks at the story of a
+// What must hold of purges in every run, whatever the schedule. Each invariant looks at the story of a
 // run and says in words what it found wrong; nothing said means that it holds.
 #pragma once
 
@@ -14,9 +14,17 @@ namespace spacekeep::sim {
 
 using Findings = std::vector<std::string>;
 
+/// Where an invariant on purges holds.
+enum class Holds {
+  kAlways,
+  kAtTheEnd,    ///< in runs that are not cut: it compares what was begun with what came of it
+  kInScenario,  ///< it compares with the plan of a purge scenario
+};
+
 struct Invariant {
   const char* name;
   void (*check)(const PurgeStory& story, Findings& findings);
+  Holds holds = Holds::kAlways;
 };
 
 [[nodiscard]] std::span<const Invariant> purgeInvariants();
@@ -28,6 +36,8 @@ struct Violation {
 
 /// Judges a run. A run that did not come to its end is not looked at any further.
 [[nodiscard]] std::vector<Violation> judge(const PurgeRun& run);
+/// Judges the purges of a life of the whole daemon by what can be said of them without a scenario.
+void judgePurges(const PurgeStory& life, std::vector<Violation>& violations);
 
 // The course of a run.
 void checkEnd(const PurgeStory& story, Findings& findings);

@@ -29,8 +29,7 @@ std::vector<std::uint64_t> PurgeStory::freeBetween(const std::string& volume, st
 bool PurgeStory::hadFreed(const Operation& operation, std::uint64_t bytes, std::size_t first,
                           std::size_t last) const {
   const std::string* volume = volumeOf(operation);
-  const std::uint64_t begin =
-      unsignedAt(operation.outcome, "SPACEKEEP_FREESPACE_BEGIN").value_or(0);
+  const std::uint64_t begin = operation.free_at_begin;
   const auto values = freeBetween(volume == nullptr ? "" : *volume, first, last);
   return std::any_of(values.begin(), values.end(), [&](std::uint64_t free) {
     return bytes == (free > begin ? free - begin : 0);
@@ -39,8 +38,7 @@ bool PurgeStory::hadFreed(const Operation& operation, std::uint64_t bytes, std::
 
 bool PurgeStory::hadReached(const Operation& operation, std::size_t first, std::size_t last) const {
   const std::string* volume = volumeOf(operation);
-  const std::uint64_t begin =
-      unsignedAt(operation.outcome, "SPACEKEEP_FREESPACE_BEGIN").value_or(0);
+  const std::uint64_t begin = operation.free_at_begin;
   const auto values = freeBetween(volume == nullptr ? "" : *volume, first, last);
   return std::any_of(values.begin(), values.end(), [&](std::uint64_t free) {
     return (free > begin ? free - begin : 0) >= operation.needed;
@@ -92,6 +90,36 @@ bool PurgeStory::wasIdle(std::size_t operation, std::size_t first, std::size_t l
     idle = count <= 0;
   }
   return idle;
+}
+
+bool PurgeStory::mayFinishEarly(const Operation& operation) const {
+  if (operation.request.contains("SPACEKEEP_FINISH_EARLY")) {
+    return truthAt(operation.request, "SPACEKEEP_FINISH_EARLY");
+  }
+  return run.may_finish_early_by_default;
+}
+
+bool isRequestOf(const Operation& operation, const Dictionary& request) {
+  for (const char* key : {"SPACEKEEP_TOKEN", "SPACEKEEP_VOLUME"}) {
+    const Value* own = operation.request.find(key);
+    const Value* other = request.find(key);
+    if ((own == nullptr) != (other == nullptr)) return false;
+    if (own != nullptr && *own != *other) return false;
+  }
+  return unsignedAt(request, "SPACEKEEP_FREESPACE_BEGIN") == operation.free_at_begin;
+}
+
+PurgeView viewOf(const PurgeRun& run) {
+  PurgeView view;
+  view.events = run.events;
+  view.scenario = &run.scenario;
+  view.end = run.report.end;
+  view.blocked = run.report.blocked;
+  for (const PlannedService& service : run.scenario.services) {
+    view.service_ids.push_back(service.id);
+  }
+  view.asked_twice = run.asked_twice;
+  return view;
 }
 
 std::string PurgeStory::name(const Operation& operation) const {

@@ -1,4 +1,4 @@
-// Thread safety: plain values; PurgeStory refers to the run it was made from.
+// Thread safety: plain values; PurgeStory refers to the events it was made from.
 //
 // What a trace says about purges, put in order: operations with their urgencies, share
 // computations, replies and failures. A position is an index into the events of the run.
@@ -9,6 +9,7 @@
 #include <map>
 #include <optional>
 #include <set>
+#include <span>
 #include <string>
 #include <vector>
 
@@ -18,6 +19,21 @@
 namespace spacekeep::sim {
 
 inline constexpr std::size_t kNowhere = SIZE_MAX;
+
+/// What purges are read from: a run of a purge scenario, or one life of the whole daemon.
+struct PurgeView {
+  std::span<const Event> events;
+  const PurgeScenario* scenario = nullptr;  ///< null in a life of the whole daemon
+  rt::ScheduleEnd end = rt::ScheduleEnd::kFinished;
+  std::vector<std::string> blocked;
+  std::vector<std::string> service_ids;
+  std::map<std::string, std::uint64_t> asked_twice;  ///< as the services counted it
+  bool cut = false;  ///< the process was killed, or stands still: what was begun may lack its end
+  /// In a life of the whole daemon: requests that do not say it may end as soon as they can.
+  bool may_finish_early_by_default = false;
+};
+
+[[nodiscard]] PurgeView viewOf(const PurgeRun& run);
 
 /// A line "donation (...) = ...".
 struct Share {
@@ -89,6 +105,7 @@ struct Operation {
   std::size_t cancelling_at = kNowhere;  ///< "cancelling purge"
   std::size_t end_at = kNowhere;         ///< "result"
   Dictionary outcome;
+  std::uint64_t free_at_begin = 0;  ///< what the volume showed
   std::vector<Pass> passes;
   std::set<std::string> services;  ///< those that were offered a share
   /// Lines of another purge could not be told from this one's: only what needs no attribution
@@ -97,13 +114,15 @@ struct Operation {
 };
 
 struct PurgeStory {
-  explicit PurgeStory(const PurgeRun& run);
+  explicit PurgeStory(PurgeView view);
+  explicit PurgeStory(const PurgeRun& whole) : PurgeStory(viewOf(whole)) {}
 
-  const PurgeRun& run;
+  const PurgeView run;
   std::vector<Operation> operations;
   std::vector<ShareTask> tasks;
   std::vector<Reply> replies;
   std::vector<Failure> failures;
+  std::map<std::uint64_t, std::size_t> operation_of_call;  ///< of purge calls of services
   std::vector<std::string> oddities;  ///< lines that stand where they cannot be
 
   [[nodiscard]] std::uint64_t timeAt(std::size_t at) const { return run.events[at].at_ns; }
@@ -124,7 +143,12 @@ struct PurgeStory {
   [[nodiscard]] bool wasIdle(std::size_t operation, std::size_t first, std::size_t last,
                              bool asked_only) const;
   [[nodiscard]] std::string name(const Operation& operation) const;
+  /// Asked for by the request, or by the client state for requests that say nothing.
+  [[nodiscard]] bool mayFinishEarly(const Operation& operation) const;
 };
+
+/// Whether the operation named what it is about as `request` does: token, volume and free space.
+[[nodiscard]] bool isRequestOf(const Operation& operation, const Dictionary& request);
 
 /// A reply that met its share is followed by another offer.
 [[nodiscard]] inline bool metItsShare(const Reply& reply) { return reply.amount >= reply.donation; }

@@ -22,11 +22,13 @@ struct ThreadState {
   std::size_t reply = kNowhere;
   std::size_t failure = kNowhere;
   std::size_t last_at = 0;
+  std::uint64_t last_look = 0;  ///< at the free space of a volume
+  bool elsewhere = false;       ///< at work for something that is no purge
 };
 
 struct AskedCall {
   std::string service;
-  std::string token;
+  std::size_t operation = kNowhere;
   std::uint64_t amount = 0;
   std::int32_t urgency = 0;
 };
@@ -41,8 +43,9 @@ class Reader {
       if (const auto* line = std::get_if<LogLine>(&event.body)) {
         readLine(at, event.thread, *line);
       } else if (const auto* asked = std::get_if<ServiceAsked>(&event.body)) {
-        asked_[asked->call] = {asked->service, asked->token, asked->amount.value_or(0),
-                               asked->urgency};
+        if (asked->member == "servicePurge") readRequest(at, *asked);
+      } else if (const auto* look = std::get_if<FreeSpaceLooked>(&event.body)) {
+        threads_[event.thread].last_look = look->free;
       } else if (const auto* sent = std::get_if<StatisticSent>(&event.body)) {
         readStatistic(at, event.thread, *sent);
       }
@@ -56,6 +59,13 @@ class Reader {
  private:
   void readLine(std::size_t at, unsigned thread, const LogLine& line) {
     ThreadState& state = threads_[thread];
+    if (isOfNoPurge(line)) {
+      state.elsewhere = true;
+      state.task = state.reply = state.failure = kNowhere;
+      return;
+    }
+    if (beginsPartOfAPurge(line)) state.elsewhere = false;
+    if (state.elsewhere) return;
     if (line.format == formats::kBegin) {
       begin(at, thread, line);
     } else if (line.format == formats::kQueuing) {
@@ -74,6 +84,19 @@ class Reader {
     }
   }
 
+  // Queries and periodic passes keep in-flight sets as well, and their threads may have worked for a
+  // purge before.
+  [[nodiscard]] static bool isOfNoPurge(const LogLine& line) {
+    return line.format == formats::kQueryEntry || line.format == formats::kQueryTook ||
+           line.format == formats::kFailedNamed || line.format == formats::kPeriodicCalling ||
+           line.format == formats::kPeriodicReplied;
+  }
+
+  [[nodiscard]] static bool beginsPartOfAPurge(const LogLine& line) {
+    return line.format == formats::kBegin || line.format == formats::kQueuing ||
+           line.format == formats::kPurged || line.format == formats::kFailed;
+  }
+
   void begin(std::size_t at, unsigned thread, const LogLine& line) {
     Operation operation;
     operation.thread = thread;
@@ -84,8 +107,31 @@ class Reader {
     operation.needed = unsignedAt(operation.request, "SPACEKEEP_AMOUNT").value_or(0);
     const Value* token = operation.request.find("SPACEKEEP_TOKEN");
     if (token != nullptr) operation.token = textOf(*token);
+    operation.free_at_begin = threads_[thread].last_look;
     threads_[thread].operation = story_.operations.size();
     story_.operations.push_back(std::move(operation));
+  }
+
+  // Purges of the low-space handling name nothing but volume and free space. Two of them that do not
+  // differ in that run one after the other.
+  void readRequest(std::size_t at, const ServiceAsked& asked) {
+    AskedCall call = {asked.service, kNowhere, asked.amount.value_or(0), asked.urgency};
+    for (std::size_t i = 0; i < story_.operations.size(); ++i) {
+      Operation& operation = story_.operations[i];
+      if (!isRequestOf(operation, asked.info)) continue;
+      if (call.operation != kNowhere) {
+        Operation& earlier = story_.operations[call.operation];
+        const bool may_be_its =
+            earlier.end_at == kNowhere || story_.timeAt(earlier.end_at) == story_.timeAt(at);
+        if (may_be_its) earlier.blurred = operation.blurred = true;
+      }
+      call.operation = i;
+    }
+    if (call.operation == kNowhere) {
+      story_.oddities.push_back(asked.service + " was asked by no purge that runs");
+    }
+    story_.operation_of_call[asked.call] = call.operation;
+    asked_[asked.call] = call;
   }
 
   void donation(std::size_t at, const ThreadState& state, const LogLine& line) {
@@ -192,15 +238,10 @@ class Reader {
     }
   }
 
-  [[nodiscard]] std::size_t operationWithToken(const std::string& token) const {
-    for (std::size_t i = 0; i < story_.operations.size(); ++i) {
-      if (story_.operations[i].token == token) return i;
-    }
-    return kNowhere;
-  }
-
   void attributeReplies() {
     for (Reply& reply : story_.replies) {
+      // The process was killed before the reply was told apart from others.
+      if (reply.call == 0 && story_.run.cut) continue;
       const auto asked = asked_.find(reply.call);
       if (asked == asked_.end() || asked->second.service != reply.service) {
         story_.oddities.push_back("a reply of " + reply.service + " to nothing that was asked");
@@ -208,24 +249,29 @@ class Reader {
       }
       reply.donation = asked->second.amount;
       reply.urgency = asked->second.urgency;
-      reply.operation = operationWithToken(asked->second.token);
+      reply.operation = asked->second.operation;
     }
   }
 
-  // A donation names the bytes needed, which no two purges share. A computation that stopped before
-  // it belongs to the running purge, unless a purge that has ended may still have one to come.
+  // A donation names the bytes needed, which no two purges of clients share. Else a computation
+  // belongs to the running purge, unless a purge that has ended may still have one to come.
   void attributeTasks() {
     for (ShareTask& task : story_.tasks) {
       if (!task.share) continue;
+      std::vector<std::size_t> possible;
       for (std::size_t i = 0; i < story_.operations.size(); ++i) {
-        if (story_.operations[i].needed != task.share->needed) continue;
-        task.operation = i;
-        story_.operations[i].services.insert(task.service);
+        if (story_.operations[i].needed == task.share->needed) possible.push_back(i);
       }
+      if (possible.size() == 1) give(task, possible.front());
     }
     for (ShareTask& task : story_.tasks) {
       if (task.operation == kNowhere) attributeUnnamed(task);
     }
+  }
+
+  void give(ShareTask& task, std::size_t operation) {
+    task.operation = operation;
+    story_.operations[operation].services.insert(task.service);
   }
 
   void attributeUnnamed(ShareTask& task) {
@@ -233,6 +279,7 @@ class Reader {
     for (std::size_t i = 0; i < story_.operations.size(); ++i) {
       const Operation& operation = story_.operations[i];
       if (operation.begin_at > task.at) continue;
+      if (task.share && task.share->needed != operation.needed) continue;
       if (operation.end_at > task.at || outstandingTasks(i, task) > 0) possible.push_back(i);
     }
     if (possible.empty()) {
@@ -240,11 +287,7 @@ class Reader {
         if (story_.operations[i].begin_at < task.at) possible.push_back(i);
       }
     }
-    if (possible.size() == 1) {
-      task.operation = possible.front();
-      story_.operations[task.operation].services.insert(task.service);
-      return;
-    }
+    if (possible.size() == 1) return give(task, possible.front());
     for (const std::size_t i : possible) story_.operations[i].blurred = true;
   }
 
@@ -298,8 +341,8 @@ class Reader {
 }  // namespace
 
 // A run that was broken off has no story, only a great many events.
-PurgeStory::PurgeStory(const PurgeRun& run_given) : run(run_given) {
-  if (run.report.end == rt::ScheduleEnd::kFinished) Reader(*this).read();
+PurgeStory::PurgeStory(PurgeView view) : run(std::move(view)) {
+  if (run.end == rt::ScheduleEnd::kFinished || run.cut) Reader(*this).read();
 }
 
 }  // namespace spacekeep::sim

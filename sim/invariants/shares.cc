@@ -135,8 +135,7 @@ std::size_t firstWake(const PurgeStory& story, std::size_t index) {
   for (const Reply& reply : story.replies) {
     if (reply.operation == index && reply.signals > 0) first = std::min(first, reply.removing_at);
   }
-  if (truthAt(operation.request, "SPACEKEEP_FINISH_EARLY") &&
-      story.hadReached(operation, operation.begin_at, first)) {
+  if (story.mayFinishEarly(operation) && story.hadReached(operation, operation.begin_at, first)) {
     return operation.begin_at;
   }
   return first;
@@ -221,6 +220,8 @@ void checkDivisor(const PurgeStory& story, Findings& findings) {
   for (const ShareTask& task : story.tasks) {
     if (!task.share || task.operation == kNowhere) continue;
     const Operation& operation = story.operations[task.operation];
+    // Of a purge that was cut short not every service has been seen.
+    if (operation.end_at == kNowhere) continue;
     if (operation.blurred || task.share->at > firstWake(story, task.operation)) continue;
     std::uint64_t surely = 0;
     std::uint64_t possibly = 0;

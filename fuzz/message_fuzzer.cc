@@ -13,6 +13,7 @@
 
 #include "client/client_protocol.h"
 #include "fuzz/helpers/promises.h"
+#include "fuzz/helpers/wire_bytes.h"
 #include "support/ipc/linux/authenticated_bus.h"
 #include "support/ipc/linux/sockets.h"
 #include "support/ipc/linux/wire_reader.h"
@@ -24,38 +25,10 @@ namespace {
 
 using fuzz::require;
 
-void pad(std::string& bytes) { bytes.resize((bytes.size() + 7) / 8 * 8, '\0'); }
-
-void appendNumber(std::string& bytes, std::size_t number) {
-  for (unsigned shift = 0; shift < 32; shift += 8) {
-    bytes += static_cast<char>(number >> shift & 0xff);
-  }
-}
-
-void appendField(std::string& fields, char code, char type, std::string_view text) {
-  pad(fields);
-  fields += {code, 1, type, 0};
-  if (type == 'g') {
-    fields += static_cast<char>(text.size());
-  } else {
-    appendNumber(fields, text.size());
-  }
-  fields += text;
-  fields += '\0';
-}
-
 std::string messageWith(std::string_view signature, std::string_view body) {
-  std::string fields;
-  appendField(fields, 1, 'o', kObjectPath);
-  appendField(fields, 3, 's', "call");
-  if (!signature.empty()) appendField(fields, 8, 'g', signature);
-  std::string message{'l', 1, 0, 1};
-  appendNumber(message, body.size());
-  appendNumber(message, 1);
-  appendNumber(message, fields.size());
-  message += fields;
-  pad(message);
-  return message + std::string(body);
+  const fuzz::MessageHead head{
+      .path = kObjectPath, .member = "call", .signature = std::string(signature)};
+  return fuzz::messageBytes(head, body);
 }
 
 class Bus {

@@ -20,6 +20,10 @@ void require(bool holds, const char* promise);
 /// may forge a line of its own.
 void checkLogLines();
 
+/// To the fuzzer each reason that a problem line gives in brackets counts as code that was reached:
+/// for what stands behind a library that is not compiled for fuzzing. After checkLogLines().
+void learnFromLogLines();
+
 /// `text` has no control character and is UTF-8.
 [[nodiscard]] bool isOneLine(std::string_view text);
 

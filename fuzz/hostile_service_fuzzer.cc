@@ -124,29 +124,52 @@ void callEverything(Daemon& daemon, const std::shared_ptr<Connection>& connectio
   }
 }
 
+fuzz::MessageType typeOf(std::uint8_t kind) {
+  switch (kind % 8) {
+    case 4:
+      return fuzz::MessageType::kError;
+    case 5:
+      return fuzz::MessageType::kCall;
+    case 6:
+      return fuzz::MessageType::kSignal;
+    default:
+      return fuzz::MessageType::kReturn;
+  }
+}
+
 std::string recordedMessage(fuzz::PieceReader& input) {
   const std::uint8_t kind = input.byte();
   if (kind % 8 == 7) return std::string(input.piece());
   fuzz::MessageHead head;
-  head.type = static_cast<fuzz::MessageType>(kind % 8 < 4 ? 2 : kind % 8 - 3);
-  if (head.type == fuzz::MessageType::kReturn && kind % 8 > 3)
-    head.type = fuzz::MessageType::kError;
+  head.type = typeOf(kind);
   head.serial = 1U + input.byte();
   head.reply_serial = input.byte() % 12;
   head.signature = std::string(input.take(input.byte() % 32));
+  head.descriptors = kind / 8 % 2;
   if (head.type == fuzz::MessageType::kError) head.error_name = std::string(input.shortPiece());
-  if (head.type == fuzz::MessageType::kCall) {
+  if (head.type == fuzz::MessageType::kCall || head.type == fuzz::MessageType::kSignal) {
     head.path = kObjectPath;
+    head.interface = "com.quorvel.SpacekeepServiceProtocol";
     head.member = "servicePing";
   }
-  head.descriptors = kind / 8 % 2;
   return fuzz::messageBytes(head, input.piece());
 }
 
-/// The first byte says how much is done for the input: nothing, the handshake, or the headers too.
+/// What the first byte of an input says.
+struct Manner {
+  explicit Manner(std::uint8_t choice)
+      : help(choice % 3U),
+        calls_are_held(choice / 3U % 2 == 0),
+        invalidates(choice / 6U % 2 == 1) {}
+
+  unsigned help;        ///< done for the input: nothing, the handshake, or the headers too
+  bool calls_are_held;  ///< made before the connection is resumed
+  bool invalidates;     ///< the daemon ends the connection itself
+};
+
 std::string streamOf(std::string_view text) {
   fuzz::PieceReader input(text);
-  const std::uint8_t help = input.byte() % 3;
+  const unsigned help = Manner(input.byte()).help;
   if (help == 0) return std::string(input.rest());
   std::string stream = "DATA\r\nOK 0123456789abcdef0123456789abcdef\r\nAGREE_UNIX_FD\r\n";
   if (help == 1) return stream += input.rest();
@@ -162,17 +185,17 @@ void examine(std::string_view input) {
   if (!fuzz::sendAll(pair.second->fd(), streamOf(input), {pair.second->fd()})) return;
   ::shutdown(pair.second->fd(), SHUT_WR);
   const auto course = std::make_shared<Course>();
-  {
-    const auto connection =
-        connectionFromDescriptor(daemon.loop, daemon.global, pair.first, kLimits);
-    connection->setInvalidationHandler([course] { course->connectionEnded(); });
-    connection->setInterruptionHandler([] { require(false, "the peer's process lives"); });
-    connection->setRemoteInterface(spacekeepServiceInterface());
-    callEverything(daemon, connection, course);
-    course->awaitInvocations();
-    connection->resume();
-    course->awaitEverything();
-  }
+  const auto connection = connectionFromDescriptor(daemon.loop, daemon.global, pair.first, kLimits);
+  connection->setInvalidationHandler([course] { course->connectionEnded(); });
+  connection->setInterruptionHandler([] { require(false, "the peer's process lives"); });
+  connection->setRemoteInterface(spacekeepServiceInterface());
+  const Manner manner(fuzz::PieceReader(input).byte());
+  if (!manner.calls_are_held) connection->resume();
+  callEverything(daemon, connection, course);
+  course->awaitInvocations();
+  if (manner.calls_are_held) connection->resume();
+  if (manner.invalidates) connection->invalidate();
+  course->awaitEverything();
 }
 
 /// What has ended is let go of on other threads, soon.

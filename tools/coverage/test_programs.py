@@ -20,7 +20,7 @@ def command_of(program, build):
 def programs_of(build):
     """Paths below `build`: cheap programs first, those that need Linux last."""
     kinds = ('test_simulated_', 'test_both_simulated_', 'test_both_threads_', 'test_linux_')
-    found = sorted(path for path in (build / 'tests').glob('test_*') if path.is_file())
+    found = sorted(path for path in (build / 'tests').glob('test_*') if path.is_file() and os.access(path, os.X_OK))
     ordered = [path for kind in kinds for path in found if path.name.startswith(kind)]
     simulation = build / 'sim' / 'spacekeep-sim'
     return [str(path.relative_to(build)) for path in ordered + [simulation] if path.exists()]

@@ -58,24 +58,42 @@ class Trial:
             if len(objects) == 1 and not self._compile(objects, compiled):
                 return ledger.NOT_A_MUTANT, 'does not compile'
             for program in asked:
-                parts = {part: self._build.objects_of(part, objects) for part in self._reach.parts_of(program)}
-                if not any(parts.values()):
-                    continue
-                for part, mine in parts.items():
-                    if not mine or part in linked:
-                        continue
-                    if not self._compile([name for name in mine if name not in compiled], compiled):
-                        return ledger.NOT_A_MUTANT, 'does not compile'
-                    if self._build.link(part, mine, self._objects) is not None:
-                        return ledger.NOT_A_MUTANT, 'does not link'
-                    linked.append(part)
-                found = suite.ask(program, self._build.directory, self._reach.seconds.get(program, 10.0))
+                missing = self._link(program, objects, compiled, linked)
+                if missing is not None:
+                    return ledger.NOT_A_MUTANT, missing
+                slow = self._reach.slow_tests_of(program)
+                quick_seconds = max(0.0, self._reach.seconds.get(program, 10.0) - sum(slow.values()))
+                found = self._ask(program, linked, quick_seconds, '-' + ':'.join(slow) if slow else '')
                 if found is not None:
-                    return ledger.CAUGHT, f'{pathlib.Path(program).name}: {found}'
+                    return ledger.CAUGHT, found
+            for program in asked:
+                slow = self._reach.slow_tests_of(program)
+                found = self._ask(program, linked, sum(slow.values()), ':'.join(slow)) if slow else None
+                if found is not None:
+                    return ledger.CAUGHT, found
             return ledger.SURVIVED, ', '.join(pathlib.Path(program).name for program in asked) or 'no test reaches the line'
         finally:
             for part in linked:
                 self._build.restore(part)
+
+    def _link(self, program, objects, compiled, linked):
+        """Links the program and those that it starts with the change. Gives None, or what is in the way."""
+        for part in self._reach.parts_of(program):
+            mine = [] if part in linked else self._build.objects_of(part, objects)
+            if not mine:
+                continue
+            if not self._compile([name for name in mine if name not in compiled], compiled):
+                return 'does not compile'
+            if self._build.link(part, mine, self._objects) is not None:
+                return 'does not link'
+            linked.append(part)
+        return None
+
+    def _ask(self, program, linked, usual_seconds, tests):
+        if not any(part in linked for part in self._reach.parts_of(program)):
+            return None
+        found = suite.ask(program, self._build.directory, usual_seconds, tests)
+        return None if found is None else f'{pathlib.Path(program).name}: {found}'
 
     def _compile(self, objects, compiled):
         if self._build.compile(objects, self._objects) is not None:

@@ -1,6 +1,7 @@
 """Which lines each test program reaches, and how long it takes, from the last coverage run."""
 import json
 import pathlib
+import re
 import sys
 
 sys.path.insert(0, str(pathlib.Path(__file__).resolve().parent.parent / 'coverage'))
@@ -10,6 +11,9 @@ from test_programs import programs_of  # noqa: E402
 # Programs that tests on Linux start.
 STARTED = ('daemon/spacekeepd', 'ctl/spacekeepctl', 'services/spacekeep-cachedir', 'tests/test-peer',
            'tests/socket-service', 'sdk/example_thumbnail_cache', 'sdk/example_make_room', 'sdk/example_on_demand')
+
+# A test that takes longer than all the others of most programs together.
+SLOW_MS = 3000
 
 
 class Reach:
@@ -25,6 +29,12 @@ class Reach:
         if 'test_linux_' not in program:
             return [program]
         return [part for part in STARTED if (self._build / part).exists()] + [program]
+
+    def slow_tests_of(self, program):
+        """{test: seconds} of a program: asked when the quick ones of all programs have said nothing."""
+        log = self._build / 'coverage' / pathlib.Path(program).name / 'log'
+        took = re.findall(r'^\[ +OK \] (\S+?),? .*?\((\d+) ms\)$', log.read_text(errors='replace'), re.MULTILINE)
+        return {name: int(ms) / 1000 for name, ms in took if int(ms) >= SLOW_MS}
 
     def _lines_of(self, program, source):
         folder = self._build / 'coverage' / pathlib.Path(program).name

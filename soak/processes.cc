@@ -1,0 +1,90 @@
+#include "soak/processes.h"
+
+#include <fcntl.h>
+#include <grp.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <ctime>
+#include <fstream>
+#include <sstream>
+#include <utility>
+
+namespace soak {
+namespace {
+
+int statusOf(int raw) { return WIFEXITED(raw) ? WEXITSTATUS(raw) : 128 + WTERMSIG(raw); }
+
+[[noreturn]] void become(char** arguments, const std::string& log, uid_t uid) {
+  const int out = ::open(log.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
+  const int in = ::open("/dev/null", O_RDONLY);
+  ::dup2(in, 0);
+  ::dup2(out, 1);
+  ::dup2(out, 2);
+  if (uid != 0 && (::setgroups(0, nullptr) != 0 || ::setgid(uid) != 0 || ::setuid(uid) != 0)) {
+    ::_exit(126);
+  }
+  ::execv(arguments[0], arguments);
+  ::_exit(127);
+}
+
+}  // namespace
+
+Process::Process(const std::vector<std::string>& command, const std::string& log, uid_t uid) {
+  std::vector<char*> arguments;
+  arguments.reserve(command.size() + 1);
+  for (const std::string& word : command) arguments.push_back(const_cast<char*>(word.c_str()));
+  arguments.push_back(nullptr);
+  pid_ = ::fork();
+  if (pid_ == 0) become(arguments.data(), log, uid);
+}
+
+Process::Process(Process&& other) noexcept
+    : pid_(std::exchange(other.pid_, -1)), status_(other.status_) {}
+
+Process& Process::operator=(Process&& other) noexcept {
+  std::swap(pid_, other.pid_);
+  std::swap(status_, other.status_);
+  return *this;
+}
+
+Process::~Process() {
+  if (pid_ <= 0 || status_) return;
+  ::kill(pid_, SIGKILL);
+  ::waitpid(pid_, nullptr, 0);
+}
+
+std::optional<int> Process::ended() {
+  int raw = 0;
+  if (pid_ > 0 && !status_ && ::waitpid(pid_, &raw, WNOHANG) == pid_) status_ = statusOf(raw);
+  return status_;
+}
+
+int Process::wait() {
+  int raw = 0;
+  if (pid_ > 0 && !status_ && ::waitpid(pid_, &raw, 0) == pid_) status_ = statusOf(raw);
+  return status_.value_or(-1);
+}
+
+std::string readFile(const std::string& path) {
+  std::ifstream stream(path);
+  std::ostringstream text;
+  text << stream.rdbuf();
+  return text.str();
+}
+
+double monotonicSeconds() {
+  timespec now = {};
+  ::clock_gettime(CLOCK_MONOTONIC, &now);
+  return static_cast<double>(now.tv_sec) + static_cast<double>(now.tv_nsec) / 1e9;
+}
+
+void sleepSeconds(double seconds) {
+  const auto whole = static_cast<time_t>(seconds);
+  const timespec duration = {whole,
+                             static_cast<long>((seconds - static_cast<double>(whole)) * 1e9)};
+  ::nanosleep(&duration, nullptr);
+}
+
+}  // namespace soak

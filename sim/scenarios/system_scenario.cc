@@ -22,7 +22,7 @@ std::set<Fault> drawFaults(Random& random) {
   for (std::size_t i = 0; i + 1 < kFaultCount; ++i) {
     if (random.percent(share)) faults.insert(static_cast<Fault>(i));
   }
-  if (!random.percent(25)) faults.erase(Fault::kCrashes);
+  if (random.percent(50)) faults.erase(Fault::kCrashes);
   if (random.below(100) == 0) faults.insert(Fault::kSilentPing);
   return faults;
 }
@@ -43,7 +43,7 @@ void drawCrashes(Draw& draw) {
   const std::uint64_t crashes = draw.random.percent(75) ? 1 : 2;
   for (std::uint64_t i = 0; i < crashes; ++i) {
     PlannedCrash crash;
-    crash.at_step = draw.random.between(1, draw.random.oneOf<std::uint64_t>({300, 3000, 12'000}));
+    crash.at_step = draw.random.between(1, draw.random.oneOf<std::uint64_t>({200, 1500, 5000}));
     crash.down_for_ns = drawMoment(draw.random);
     crash.store_refuses_to_open = draw.chance(Fault::kFailingDisk, 15);
     draw.plan.crashes.push_back(crash);

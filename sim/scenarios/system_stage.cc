@@ -42,8 +42,11 @@ SystemStage::SystemStage(SystemRun& run, unsigned number, LifeOfDaemon& life, La
   for (const BadDescriptor& bad : run_.plan.bad_descriptors) addBadDescriptor(bad);
 }
 
-SystemStage::~SystemStage() {
-  noteDown();
+SystemStage::~SystemStage() { takeDown(); }
+
+// Called twice when the life is cut off in the middle of it.
+void SystemStage::takeDown() {
+  if (!std::exchange(noted_down_, true)) noteDown();
   world_.shutDown();
   Spacekeep::resetSharedSpacekeep();
   world_.events().unpark();
@@ -86,6 +89,7 @@ void SystemStage::play() {
   startDaemon();
   startActions();
   waitForEverybody();
+  takeDown();
 }
 
 void SystemStage::startDaemon() {

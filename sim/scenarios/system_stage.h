@@ -35,6 +35,7 @@ class SystemStage {
   void startDaemon();
   void startActions();
   void waitForEverybody();
+  void takeDown();
   void noteDown();
 
   void perform(const PlannedAction& action);
@@ -53,6 +54,7 @@ class SystemStage {
   World world_;
   StageServices services_;
   rt::Thread daemon_;
+  bool noted_down_ = false;
   CountingSemaphore action_done_{0};
   std::size_t actions_ = 0;
   rt::Mutex mutex_;

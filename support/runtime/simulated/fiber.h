@@ -52,6 +52,7 @@ struct Fiber {
   // While left-over fibers are unwound.
   bool told_to_unwind = false;
   unsigned fruitless_wakes = 0;
+  unsigned locks_while_unwinding = 0;
 };
 
 using WaitList = std::vector<Fiber*>;

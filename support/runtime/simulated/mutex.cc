@@ -54,7 +54,7 @@ void acquireOrUnwind(Scheduler& scheduler, MutexState& mutex) {
   while (mutex.locked) {
     if (mutex.holder == scheduler.running().id) panic("a lock was taken twice by the same thread");
     scheduler.block(WaitKind::kLock, &mutex.waiters, kNever, mutex.holder);
-    scheduler.throwIfUnwinding();
+    scheduler.throwAtLockIfUnwinding();
   }
   acquire(scheduler, mutex);
 }
@@ -82,7 +82,7 @@ void Mutex::lock() {
   auto& state = stateIn<MutexState>(storage_);
   Scheduler* const scheduler = Scheduler::current();
   if (scheduler == nullptr) return lockOutside(state);
-  scheduler->throwIfUnwinding();
+  scheduler->throwAtLockIfUnwinding();
   scheduler->reach(Point::kLock);
   acquireOrUnwind(*scheduler, state);
 }

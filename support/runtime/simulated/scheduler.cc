@@ -79,7 +79,7 @@ void Scheduler::switchAway(bool for_good) {
 
 void Scheduler::reach(Point point) {
   if (unwinding_) {
-    if (++unwinding_steps_ > options_.max_steps) giveUpRunning();
+    if (++unwinding_steps_ > kMaxUnwindingSteps) giveUpRunning();
     return;
   }
   Fiber* const self = running_;

@@ -62,6 +62,9 @@ class Scheduler {
   /// Called where an exception may leave: throws Abandoned while left-over fibers are unwound,
   /// except in a destructor that already runs because of an exception.
   void throwIfUnwinding() const;
+  /// The same for locks, after a few that are let through: destructors take locks, and one that was
+  /// under way when the schedule ended must not be left by an exception.
+  void throwAtLockIfUnwinding() const;
   /// Gives the running fiber up as it stands. Its stack is never touched again.
   [[noreturn]] void giveUpRunning();
 
@@ -76,6 +79,8 @@ class Scheduler {
 
  private:
   static constexpr std::uint64_t kSpuriousOneIn = 16;
+  /// Not `max_steps`: a schedule that is cut off after a few steps still has all to clear away.
+  static constexpr std::uint64_t kMaxUnwindingSteps = 5'000'000;
   using TimerKey = std::pair<std::uint64_t, std::uint32_t>;  // deadline, fiber id
 
   static void fiberMain();

@@ -15,6 +15,7 @@ namespace spacekeep::rt::simulated {
 namespace {
 
 constexpr unsigned kMaxFruitlessWakes = 100;
+constexpr unsigned kLocksLetThrough = 300;
 
 std::terminate_handler previous_terminate = nullptr;
 
@@ -45,6 +46,11 @@ std::vector<std::shared_ptr<Fiber>>& givenUpFibers() {
 
 void Scheduler::throwIfUnwinding() const {
   if (unwinding_ && std::uncaught_exceptions() == 0) throw Abandoned{};
+}
+
+void Scheduler::throwAtLockIfUnwinding() const {
+  if (!unwinding_ || std::uncaught_exceptions() != 0) return;
+  if (++running_->locks_while_unwinding > kLocksLetThrough) throw Abandoned{};
 }
 
 void Scheduler::unwindLeftOvers() {

@@ -42,6 +42,12 @@ bool eventually(const std::function<bool()>& condition) {
   return true;
 }
 
+std::uint64_t wakeUpsInNs(const IpcLoop& loop, std::uint64_t duration_ns) {
+  const std::uint64_t before = loop.wakeups();
+  rt::sleepNs(duration_ns);  // the time that is measured
+  return loop.wakeups() - before;
+}
+
 ServerOptions TestServer::defaultOptions() {
   ServerOptions options;
   options.refuse_own_process = false;

@@ -39,6 +39,9 @@ inline constexpr std::uint64_t kLongNs = 30'000'000'000;  // only ever waited fo
 /// True once `condition` holds; gives up after kLongNs.
 [[nodiscard]] bool eventually(const std::function<bool()>& condition);
 
+/// How often the loop wakes up in that time.
+[[nodiscard]] std::uint64_t wakeUpsInNs(const IpcLoop& loop, std::uint64_t duration_ns);
+
 class TestServer {
  public:
   explicit TestServer(ServerOptions options = defaultOptions());

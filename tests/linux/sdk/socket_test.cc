@@ -77,26 +77,37 @@ TEST_F(SocketTest, ServesEveryConnectionAtAGivenSocketUntilItIsStopped) {
 }
 
 TEST_F(SocketTest, StopsByItselfWhenNothingIsAskedButNotWhileAPurgeRuns) {
-  SocketOptions options;
-  options.listening_fd = dup(listen()->fd());
-  options.stop_when_idle = milliseconds(50);
+  const auto listening = listen();
   const auto service = std::make_shared<TestService>();
   service->holding = true;
-  auto host = ServiceHost::serveSocket(service, options);
-  ASSERT_TRUE(host);
-  std::string why;
-  auto connection =
-      ipc::connectToPath(daemon_.loop, daemon_.queue, directory_.serviceSocket(), why);
-  ASSERT_NE(connection, nullptr) << why;
-  connection->setRemoteInterface(spacekeepServiceInterface());
-  connection->resume();
-  const SpacekeepServiceProtocol proxy(connection->remoteProxy([](const ipc::Error&) {}));
+  std::optional<ServiceHost> host;
+  std::shared_ptr<ipc::Connection> connection;
+  std::optional<SpacekeepServiceProtocol> proxy;
   const auto answered = std::make_shared<std::atomic<bool>>(false);
-  proxy.servicePurge(1, {}, [answered](const ipc::OptionalDictionary&) { *answered = true; });
-  ASSERT_TRUE(eventually([&] { return service->inside == 1; }));
+  // The machine may hold the caller up for longer than the host waits for a call. Then the host is
+  // right to stop, and the next one is asked.
+  for (int attempt = 0; attempt < 20 && service->inside == 0; ++attempt) {
+    if (connection) connection->invalidate();
+    SocketOptions options;
+    options.listening_fd = dup(listening->fd());
+    options.stop_when_idle = milliseconds(50);
+    auto started = ServiceHost::serveSocket(service, options);
+    ASSERT_TRUE(started);
+    host.emplace(std::move(*started));
+    std::string why;
+    connection = ipc::connectToPath(daemon_.loop, daemon_.queue, directory_.serviceSocket(), why);
+    ASSERT_NE(connection, nullptr) << why;
+    connection->setRemoteInterface(spacekeepServiceInterface());
+    connection->resume();
+    proxy.emplace(connection->remoteProxy([](const ipc::Error&) {}));
+    proxy->servicePurge(1, {}, [answered](const ipc::OptionalDictionary&) { *answered = true; });
+    ASSERT_TRUE(eventually(
+        [&] { return service->inside == 1 || host->status().state == HostState::kStopped; }));
+  }
+  ASSERT_EQ(service->inside, 1);
   rt::sleepNs(300'000'000);  // several times the idle time, in which the host must not stop
   EXPECT_EQ(host->status().state, HostState::kServing);
-  proxy.serviceCancelPurge([] {});
+  proxy->serviceCancelPurge([] {});
   EXPECT_TRUE(eventually([&] { return answered->load(); }));
   host->waitUntilStopped();
   EXPECT_EQ(host->status().state, HostState::kStopped);
@@ -150,7 +161,8 @@ TEST_F(SocketTest, AProcessStartedWithAHandedOverSocketServesAtItAndEndsWhenIdle
   const auto listening = listen();
   int output[2];
   ASSERT_EQ(pipe2(output, O_CLOEXEC), 0);
-  const pid_t child = startActivated(listening->fd(), output[1], "300");
+  // Longer than the machine may hold up the call: a process that is idle is right to end.
+  const pid_t child = startActivated(listening->fd(), output[1], "3000");
   ASSERT_GT(child, 0);
   close(output[1]);
   EXPECT_EQ(purgeThroughSocket(99), 99U);  // the connection waited in the backlog for the process

@@ -84,18 +84,20 @@ struct Route {
   std::string_view lane;
   std::size_t lane_width;
   bool brief;
+  bool turn_per_user;
   Serve serve;
 };
 
 constexpr Route kRoutes[] = {
-    {"clientCheckin", ServeMode::kInOrder, "", 1, false, checkin},
-    {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, purgeableSpace},
-    {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false,
+    {"clientCheckin", ServeMode::kInOrder, "", 1, false, false, checkin},
+    {"clientPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, false,
+     purgeableSpace},
+    {"clientItemizedPurgeableSpace", ServeMode::kLane, "query", kQueryLaneWidth, false, false,
      itemizedPurgeableSpace},
-    {"clientPurge", ServeMode::kLane, "purge", kPurgeLaneWidth, false, purge},
-    {"clientCancelPurge", ServeMode::kLane, "cancel", kCancelLaneWidth, true, cancelPurge},
-    {"clientSetState", ServeMode::kInOrder, "", 1, true, setState},
-    {"clientGetState", ServeMode::kInOrder, "", 1, true, getState},
+    {"clientPurge", ServeMode::kLane, "purge", kPurgeLaneWidth, false, false, purge},
+    {"clientCancelPurge", ServeMode::kLane, "cancel", kCancelLaneWidth, true, false, cancelPurge},
+    {"clientSetState", ServeMode::kInOrder, "", 1, true, true, setState},
+    {"clientGetState", ServeMode::kInOrder, "", 1, true, true, getState},
 };
 
 void serveCall(const Route& route, const std::weak_ptr<SpacekeepClientProtocol>& weak, Arguments in,
@@ -124,6 +126,7 @@ ipc::ServedInterface makeClientAdaptor(std::weak_ptr<SpacekeepClientProtocol> ex
                               .lane = route.lane,
                               .lane_width = route.lane_width,
                               .brief = route.brief,
+                              .turn_per_user = route.turn_per_user,
                               .serve = [&route, exported](Arguments in, Responder responder) {
                                 serveCall(route, exported, std::move(in), std::move(responder));
                               }});

@@ -64,6 +64,9 @@ struct ServedMethod {
   /// Served by the thread that reads the messages: for handlers that are over in microseconds
   /// unless they have to wait for a queue.
   bool brief = false;
+  /// Of all calls of one user that say so, one is served at a time, until it is answered: for work
+  /// that goes through one queue of the process, so that no user's backlog holds up another user.
+  bool turn_per_user = false;
   std::function<void(Arguments, Responder)> serve;
 };
 

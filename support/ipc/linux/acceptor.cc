@@ -18,7 +18,7 @@ namespace spacekeep::ipc {
 
 namespace {
 
-constexpr int kConnectionsPerTurn = 32;  // then the open connections have their turn
+constexpr int kConnectionsPerTurn = 4;  // then the open connections have their turn
 
 bool isShortage(int error) {
   return error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
@@ -41,7 +41,10 @@ Acceptor::~Acceptor() {
 bool Acceptor::start() {
   const int fd = listening_->fd();
   ::fcntl(fd, F_SETFL, ::fcntl(fd, F_GETFL) | O_NONBLOCK);
-  return sd_event_add_io(loop_.event(), &readable_, fd, EPOLLIN, &Acceptor::onReadable, this) >= 0;
+  // Peers that come and go must not hold up the calls of those that are there.
+  return sd_event_add_io(loop_.event(), &readable_, fd, EPOLLIN, &Acceptor::onReadable, this) >=
+             0 &&
+         sd_event_source_set_priority(readable_, SD_EVENT_PRIORITY_IDLE) >= 0;
 }
 
 int Acceptor::onReadable(sd_event_source*, int, std::uint32_t, void* self) {

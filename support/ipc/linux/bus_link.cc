@@ -21,7 +21,7 @@ namespace spacekeep::ipc {
 namespace {
 
 constexpr std::size_t kHeaderBytes = 16;
-constexpr int kMessagesPerTurn = 32;  // then other connections have their turn
+constexpr int kMessagesPerTurn = 8;  // then other connections have their turn
 
 /// A 32-bit number of the header in the byte order that the header states.
 std::uint64_t numberAt(const unsigned char* header, std::size_t offset) {
@@ -69,7 +69,19 @@ void BusLink::start(int fd, uid_t peer_uid) {
 // their turn, none is looked at again while the others are served.
 bool BusLink::watch() {
   events_ = bus_ == nullptr ? EPOLLIN : EPOLLIN | EPOLLRDHUP | EPOLLET;
-  return sd_event_add_io(loop_.event(), &io_, fd_, events_, &BusLink::onIo, this) >= 0;
+  if (sd_event_add_io(loop_.event(), &io_, fd_, events_, &BusLink::onIo, this) < 0) return false;
+  waits_behind_others_ = false;
+  // Who has not said who he is comes after those who have.
+  setPriority(bus_ == nullptr && role_ == Authentication::Role::kServer);
+  return true;
+}
+
+/// A peer that keeps its connection busy is served when no quiet one has anything to say, so the
+/// small call of one waits for a few messages of the others, however many connections are busy.
+void BusLink::setPriority(bool waits_behind_others) {
+  if (std::exchange(waits_behind_others_, waits_behind_others) == waits_behind_others) return;
+  sd_event_source_set_priority(
+      io_, waits_behind_others ? SD_EVENT_PRIORITY_IDLE : SD_EVENT_PRIORITY_NORMAL);
 }
 
 int BusLink::onTimeout(sd_event_source*, std::uint64_t, void* self) {
@@ -146,6 +158,7 @@ void BusLink::process() {
   }
   forgetWritten();
   updateEvents();
+  setPriority(turns == kMessagesPerTurn && role_ == Authentication::Role::kServer);
   // What is left gets a turn of its own, and so does the end of the stream, so that the calls before
   // it are served: watching again tells at once what is there.
   if (turns == kMessagesPerTurn || peer_hung_up_) sd_event_source_set_io_events(io_, events_);

@@ -56,6 +56,8 @@ class BusLink {
   void start(int fd, uid_t peer_uid);
   [[nodiscard]] bool ready() const { return bus_ != nullptr; }
   [[nodiscard]] bool ended() const { return ended_; }
+  /// Within linkMessage: the size of the message, or the most that it can be.
+  [[nodiscard]] std::size_t messageBytes() const { return message_size_; }
   /// For making messages. Null until ready.
   [[nodiscard]] sd_bus* bus() const { return bus_; }
 
@@ -80,6 +82,7 @@ class BusLink {
   bool judgeHeader(const unsigned char* header);
   bool messageWasDropped(std::size_t available);
   void updateEvents();
+  void setPriority(bool waits_behind_others);
   void forgetWritten();
   void end(LinkEnd how, const std::string& why);
   void release();
@@ -95,6 +98,7 @@ class BusLink {
   sd_bus* bus_ = nullptr;
   int fd_ = -1;
   std::uint32_t events_ = 0;
+  bool waits_behind_others_ = false;
   bool processing_ = false;
   bool ended_ = false;
   bool peer_hung_up_ = false;

@@ -13,6 +13,7 @@
 
 #include "support/ipc/arguments.h"
 #include "support/ipc/linux/ipc_loop.h"
+#include "support/ipc/linux/user_turns.h"
 #include "support/ipc/served.h"
 #include "support/queues/concurrent_queue.h"
 
@@ -24,9 +25,10 @@ struct ServerLimits {
   std::size_t connections_per_uid = 256;  ///< root included
   std::uint64_t authentication_ns = 5'000'000'000;
   std::size_t message_bytes = 1024 * 1024;
-  std::size_t unanswered_calls = 64;              ///< per connection
-  std::size_t queued_messages = 256;              ///< per connection, not yet taken by the peer
-  std::size_t queued_bytes = 4 * 1024 * 1024;     ///< per connection, estimated
+  std::size_t unanswered_calls = 64;           ///< per connection
+  std::size_t queued_messages = 256;           ///< per connection, not yet taken by the peer
+  std::size_t queued_bytes = 4 * 1024 * 1024;  ///< per connection, estimated
+  UserTurnLimits turns;
   std::uint64_t accept_pause_ns = 1'000'000'000;  ///< after running out of descriptors
 };
 

@@ -6,12 +6,13 @@ namespace spacekeep::ipc {
 
 OpenCall::OpenCall(std::shared_ptr<ServerContext> context,
                    std::weak_ptr<ServedConnection> connection, const MethodDescription& method,
-                   std::uint64_t serial, bool wants_answer)
+                   std::uint64_t serial, bool wants_answer, std::optional<uid_t> turn_of)
     : context_(std::move(context)),
       connection_(std::move(connection)),
       method_(method),
       serial_(serial),
-      wants_answer_(wants_answer) {}
+      wants_answer_(wants_answer),
+      turn_of_(turn_of) {}
 
 OpenCall::~OpenCall() {
   finish([](ServedConnection&) {});
@@ -29,12 +30,14 @@ void OpenCall::finish(Act act) {
   if (finished_.exchange(true)) return;
   const GatePass pass(context_->gate);
   if (!pass.inside()) return;
-  context_->loop.post([connection = connection_, act = std::move(act)] {
-    const auto alive = connection.lock();
-    if (alive == nullptr) return;
-    alive->forgetCall();
-    act(*alive);
-  });
+  context_->loop.post(
+      [context = context_, turn_of = turn_of_, connection = connection_, act = std::move(act)] {
+        if (turn_of) context->turns.end(*turn_of);
+        const auto alive = connection.lock();
+        if (alive == nullptr) return;
+        alive->forgetCall();
+        act(*alive);
+      });
 }
 
 void OpenCall::reply(Arguments arguments) {

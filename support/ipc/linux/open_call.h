@@ -7,6 +7,7 @@
 #include <atomic>
 #include <cstdint>
 #include <memory>
+#include <optional>
 
 #include "support/ipc/linux/served_connection.h"
 #include "support/ipc/linux/server_context.h"
@@ -16,7 +17,8 @@ namespace spacekeep::ipc {
 class OpenCall {
  public:
   OpenCall(std::shared_ptr<ServerContext> context, std::weak_ptr<ServedConnection> connection,
-           const MethodDescription& method, std::uint64_t serial, bool wants_answer);
+           const MethodDescription& method, std::uint64_t serial, bool wants_answer,
+           std::optional<uid_t> turn_of);
   ~OpenCall();
   OpenCall(const OpenCall&) = delete;
   OpenCall& operator=(const OpenCall&) = delete;
@@ -35,6 +37,7 @@ class OpenCall {
   const MethodDescription& method_;
   const std::uint64_t serial_;
   const bool wants_answer_;
+  const std::optional<uid_t> turn_of_;  ///< the user whose turn ends with this call
   std::atomic<bool> finished_{false};
 };
 

@@ -142,31 +142,43 @@ void ServedConnection::serve(sd_bus_message* call, const MethodDescription& meth
     refuse(call, kErrorInvalidArgs, std::string(method.name) + ": " + reader.problem());
     return;
   }
-  std::uint64_t serial = 0;
-  if (sd_bus_message_get_cookie(call, &serial) < 0) return;
-  ++unanswered_;
-  auto open = std::make_shared<OpenCall>(context_, weak_from_this(), method, serial,
-                                         sd_bus_message_get_expect_reply(call) > 0);
   const auto& methods = context_->interface.methods;
   const auto served =
       std::find_if(methods.begin(), methods.end(),
                    [&method](const auto& candidate) { return candidate.name == method.name; });
-  run(*served, [context = context_, peer = peer_, served = &*served, open = std::move(open),
-                arguments = std::move(*arguments)]() mutable {
-    const GatePass pass(context->gate);
-    if (!pass.inside()) return;
-    const ServingScope scope(peer.get());
-    served->serve(std::move(arguments), OpenCall::responderFor(std::exchange(open, nullptr)));
-  });
+  const std::size_t bytes = link_.messageBytes();
+  if (served->turn_per_user) {
+    if (const std::string why = context_->turns.refusal(identity().uid(), bytes); !why.empty()) {
+      refuse(call, kErrorLimitsExceeded, why);
+      return;
+    }
+  }
+  std::uint64_t serial = 0;
+  if (sd_bus_message_get_cookie(call, &serial) < 0) return;
+  ++unanswered_;
+  auto open = std::make_shared<OpenCall>(
+      context_, weak_from_this(), method, serial, sd_bus_message_get_expect_reply(call) > 0,
+      served->turn_per_user ? std::optional(identity().uid()) : std::nullopt);
+  run(*served, bytes,
+      [context = context_, peer = peer_, served = &*served, open = std::move(open),
+       arguments = std::move(*arguments)]() mutable {
+        const GatePass pass(context->gate);
+        if (!pass.inside()) return;
+        const ServingScope scope(peer.get());
+        served->serve(std::move(arguments), OpenCall::responderFor(std::exchange(open, nullptr)));
+      });
 }
 
-void ServedConnection::run(const ServedMethod& method, Task task) {
+void ServedConnection::run(const ServedMethod& method, std::size_t bytes, Task task) {
   // Brief or not, by the same way, so that the calls of one connection keep their order.
-  context_->loop.serveSoon(
-      method.brief ? &context_->global : nullptr,
-      [self = shared_from_this(), served = &method, task = std::move(task)]() mutable {
-        self->schedule(*served, std::move(task));
-      });
+  auto start = [self = shared_from_this(), served = &method, task = std::move(task)]() mutable {
+    self->context_->loop.serveSoon(served->brief ? &self->context_->global : nullptr,
+                                   [self, served, task = std::move(task)]() mutable {
+                                     self->schedule(*served, std::move(task));
+                                   });
+  };
+  if (method.mode == ServeMode::kLane) return start();
+  context_->turns.add(identity().uid(), {method.turn_per_user, bytes, std::move(start)});
 }
 
 void ServedConnection::schedule(const ServedMethod& method, Task task) {

@@ -42,7 +42,7 @@ class ServedConnection final : public BusLink::Owner,
                         const std::string& member);
   void dispatchServed(sd_bus_message* call, const std::string& member);
   void serve(sd_bus_message* call, const MethodDescription& method);
-  void run(const ServedMethod& method, Task task);
+  void run(const ServedMethod& method, std::size_t bytes, Task task);
   void schedule(const ServedMethod& method, Task task);
   void sendText(sd_bus_message* call, const std::string& text);
   void sendEmpty(sd_bus_message* call);

@@ -13,6 +13,7 @@
 #include "support/ipc/linux/ipc_loop.h"
 #include "support/ipc/linux/refusal_log.h"
 #include "support/ipc/linux/sockets.h"
+#include "support/ipc/linux/user_turns.h"
 #include "support/ipc/served.h"
 #include "support/ipc/serving_gate.h"
 
@@ -25,7 +26,8 @@ struct ServerContext {
         global(global_queue),
         interface(std::move(served)),
         options(std::move(server_options)),
-        lanes(std::make_shared<Lanes>(global_queue)) {
+        lanes(std::make_shared<Lanes>(global_queue)),
+        turns(options.limits.turns) {
     endpoint_rules.refuse_own_process = options.refuse_own_process;
   }
 
@@ -35,6 +37,7 @@ struct ServerContext {
   const ServerOptions options;
   const std::shared_ptr<Lanes> lanes;  ///< any thread
   ServingGate gate;                    ///< any thread; loop is there at least while one is inside
+  UserTurns turns;                     ///< IPC thread
   EndpointRules endpoint_rules;        ///< IPC thread
   RefusalLog refusals;                 ///< IPC thread
 };

@@ -158,6 +158,13 @@ TEST(ClientAdaptor, ServesEveryDescribedMethodInOrderAndInItsLane) {
   EXPECT_EQ(served.methods[4].lane_width, 16U);
 }
 
+TEST(ClientAdaptor, StateCallsOfOneUserTakeTurnsAndNoOthers) {
+  for (const ipc::ServedMethod& method : makeClientAdaptor({}).methods) {
+    const bool is_of_state = method.name == "clientSetState" || method.name == "clientGetState";
+    EXPECT_EQ(method.turn_per_user, is_of_state) << method.name;
+  }
+}
+
 TEST(ClientAdaptor, WithoutItsObjectFailsTheCall) {
   const ipc::ServedInterface served = makeClientAdaptor({});
   std::string error_name;

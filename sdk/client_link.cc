@@ -14,6 +14,13 @@
 #include "support/runtime/locks.h"
 
 namespace spacekeep::sdk {
+namespace {
+
+/// On a busy machine a killed daemon's sockets close long before its process is gone. A program would
+/// take the wrong answer for a missing right and give up, which is worse than to be told late.
+constexpr std::uint64_t kDeathOfTheDaemonNs = 2'000'000'000;
+
+}  // namespace
 
 /// What the link shares with handlers that may run while it is being destroyed.
 struct ClientLink::Shared {
@@ -120,7 +127,10 @@ Result<std::unique_ptr<ClientLink>> ClientLink::open(ClientOptions options) {
   std::unique_ptr<ClientLink> link(new ClientLink(std::move(options)));
   const std::string& path = link->shared_->options.socket_path;
   std::string why;
-  link->connection_ = ipc::connectToPath(link->engine_.loop, link->engine_.queue, path, why);
+  ipc::ConnectionLimits limits;
+  limits.peer_death_ns = kDeathOfTheDaemonNs;
+  link->connection_ =
+      ipc::connectToPath(link->engine_.loop, link->engine_.queue, path, why, limits);
   if (!link->connection_) {
     return Error{ErrorKind::kUnreachable,
                  fmt::format("cannot connect to the daemon at {}: {}", path, why)};

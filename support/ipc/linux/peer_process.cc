@@ -1,5 +1,6 @@
 #include "support/ipc/linux/peer_process.h"
 
+#include <poll.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
@@ -31,6 +32,11 @@ int openPeerPidfd(int socket) {
   length = sizeof peer;
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) return -1;
   return static_cast<int>(::syscall(SYS_pidfd_open, peer.pid, 0));
+}
+
+bool isDead(int pidfd) {
+  pollfd state = {pidfd, POLLIN, 0};
+  return ::poll(&state, 1, 0) > 0;
 }
 
 }  // namespace
@@ -69,8 +75,10 @@ int PeerProcess::onDeath(sd_event_source*, int, std::uint32_t, void* self) {
   return 0;
 }
 
+// Where this thread had to wait for its turn, both have happened, and the death may be told second.
 int PeerProcess::onPatienceEnd(sd_event_source*, std::uint64_t, void* self) {
-  static_cast<PeerProcess*>(self)->tell(false);
+  auto* process = static_cast<PeerProcess*>(self);
+  process->tell(isDead(process->pidfd_->fd()));
   return 0;
 }
 

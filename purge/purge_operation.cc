@@ -39,7 +39,7 @@ bool SpacekeepPurgeOperation::initWithInfo(const Value& request, ServiceSnapshot
 void SpacekeepPurgeOperation::startOperation(OperationCompletion completion) {
   Run run{.outcome = std::make_shared<PurgeOutcome>(info()),
           .completion = std::move(completion),
-          .user_timeout_seconds = readUserTimeout(),
+          .user_timeout_seconds = readUserTimeoutSeconds(),
           .start_ticks = 0};
   if (!takeAmountNeeded(run)) return;
   const std::uint64_t freespace_bytes =
@@ -52,7 +52,7 @@ void SpacekeepPurgeOperation::startOperation(OperationCompletion completion) {
   finish(run);
 }
 
-std::uint64_t SpacekeepPurgeOperation::readUserTimeout() const {
+std::uint64_t SpacekeepPurgeOperation::readUserTimeoutSeconds() const {
   const std::uint64_t asked_seconds = unsignedAt(info(), keys::kPurgeTimeout).value_or(0);
   logTrace("%s user_timeout_seconds: %llu", "startOperation", asked_seconds);
   return std::min(asked_seconds, purge::kMaxUserTimeoutSeconds);

@@ -78,7 +78,7 @@ class SpacekeepPurgeOperation : public SpacekeepOperation {
   enum class Pass { kGoOn, kStop };
 
   // The course of one purge.
-  [[nodiscard]] std::uint64_t readUserTimeout() const;
+  [[nodiscard]] std::uint64_t readUserTimeoutSeconds() const;
   [[nodiscard]] bool takeAmountNeeded(const Run& run);
   void finish(const Run& run);
   void cancelIfShort(std::uint64_t freed_bytes);

@@ -2,7 +2,6 @@
 
 #include <deque>
 #include <map>
-#include <mutex>
 #include <utility>
 
 #include "ctl/check_service/patience.h"
@@ -11,6 +10,7 @@
 #include "support/ipc/linux/bus_link.h"
 #include "support/ipc/linux/wire_reader.h"
 #include "support/ipc/linux/wire_writer.h"
+#include "support/runtime/locks.h"
 #include "support/runtime/runtime.h"
 
 namespace spacekeep::ctl {

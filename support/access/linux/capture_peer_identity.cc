@@ -7,7 +7,7 @@
 
 #include <array>
 #include <cerrno>
-#include <cstdlib>
+#include <charconv>
 #include <string>
 #include <utility>
 
@@ -92,8 +92,12 @@ std::optional<int> pidOf(int pidfd) {
   constexpr std::string_view kField = "\nPid:";
   const std::size_t at = text->find(kField);
   if (at == std::string::npos) return std::nullopt;
-  const int pid = std::atoi(text->c_str() + at + kField.size());
-  return pid > 0 ? std::optional<int>(pid) : std::nullopt;
+  const char* number = text->c_str() + at + kField.size();
+  while (*number == ' ' || *number == '\t') ++number;
+  int pid = 0;
+  const auto [end, problem] = std::from_chars(number, text->c_str() + text->size(), pid);
+  const bool is_whole = problem == std::errc() && (*end == '\n' || *end == '\0');
+  return is_whole && pid > 0 ? std::optional<int>(pid) : std::nullopt;
 }
 
 bool stillRuns(int pidfd) {

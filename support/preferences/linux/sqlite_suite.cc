@@ -42,6 +42,10 @@ std::span<const std::uint8_t> columnBytes(sqlite3_stmt* row, int column) {
   return {bytes, static_cast<std::size_t>(sqlite3_column_bytes(row, column))};
 }
 
+void logCannotOpen(const std::string& name, const std::string& reason) {
+  logProblem("%s the suite %@ cannot be opened: %@", "openPreferencesSuite", name, reason);
+}
+
 }  // namespace
 
 std::unique_ptr<SqliteSuite> SqliteSuite::open(const std::string& directory,
@@ -49,7 +53,7 @@ std::unique_ptr<SqliteSuite> SqliteSuite::open(const std::string& directory,
                                                SqliteSuiteOptions options) {
   auto opened = openSuiteFile(directory, name);
   if (const auto* error = std::get_if<SuiteFileError>(&opened)) {
-    logProblem("%s the suite %@ cannot be opened: %@", "openPreferencesSuite", name, error->reason);
+    logCannotOpen(name, error->reason);
     return nullptr;
   }
   Database database = std::get<Database>(std::move(opened));
@@ -65,7 +69,7 @@ std::unique_ptr<SqliteSuite> SqliteSuite::open(const std::string& directory,
     suite->prepareFile();
     return suite;
   }
-  logProblem("%s the suite %@ cannot be opened: %@", "openPreferencesSuite", name, failure.reason);
+  logCannotOpen(name, failure.reason);
   return nullptr;
 }
 

@@ -160,14 +160,14 @@ struct PowerCase {
 };
 
 TEST(DailySchedule, HowItWaitsForMainsPower) {
-  constexpr std::uint64_t kWait = kDay - 10 * kMinute;
+  constexpr std::uint64_t kWaitNs = kDay - 10 * kMinute;
   const PowerCase cases[] = {
       {"not wanted", false, false, 0, DailyStep::kRun, 0},
       {"wanted and there", true, true, 0, DailyStep::kRun, 0},
       {"wanted and missing", true, false, 0, DailyStep::kWaitForPower, 10 * kMinute},
-      {"looks no later than the end of the wait", true, false, kWait - kMinute,
+      {"looks no later than the end of the wait", true, false, kWaitNs - kMinute,
        DailyStep::kWaitForPower, kMinute},
-      {"the wait is over", true, false, kWait, DailyStep::kRun, 0},
+      {"the wait is over", true, false, kWaitNs, DailyStep::kRun, 0},
       {"comes back meanwhile", true, true, 5 * kHour, DailyStep::kRun, 0},
   };
   const DailyPlan plan{.record = ranAgo(0, at(0)), .since_boot_ns = 0, .delay_ns = 0};

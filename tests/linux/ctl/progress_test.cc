@@ -62,7 +62,8 @@ TEST(Progress, AwayFromATerminalThereIsOneLinePerUrgencyAndOneForTheRest) {
     ProgressDisplay display(ProgressDisplay::Kind::kLines,
                             {.asked_bytes = 1024, .urgency_limit = 2, .timeout_seconds = {}},
                             "/nowhere/at/all", file.get(), 80);
-    for (const double elapsed : {0.0, 0.2, 1.9, 2.0, 2.2, 5.0, 6.0, 7.0}) display.show(elapsed);
+    for (const double elapsed_seconds : {0.0, 0.2, 1.9, 2.0, 2.2, 5.0, 6.0, 7.0})
+      display.show(elapsed_seconds);
   }
   std::rewind(file.get());
   char text[1024] = {};

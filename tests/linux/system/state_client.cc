@@ -21,7 +21,7 @@ std::unique_ptr<sdk::Client> connectToStarting(const Sandbox& sandbox) {
     if (client && !client->state("SPACEKEEP_CACHE_ENABLED").error) {
       return std::make_unique<sdk::Client>(std::move(*client));
     }
-    rt::sleepNs(1'000'000);
+    rt::sleepNs(1'000'000);  // until the daemon listens
   }
   return nullptr;
 }

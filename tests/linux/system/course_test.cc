@@ -79,8 +79,18 @@ class Course : public testing::Test {
     EXPECT_TRUE(reply.outcome);
     if (!reply.outcome) return 0;
     EXPECT_EQ(unsignedAt(*reply.outcome, "SPACEKEEP_TOTAL_AVAILABLE"),
-              unsignedAt(*reply.outcome, kServiceId));
+              unsignedAt(*reply.outcome, kServiceId).value_or(0));
     return unsignedAt(*reply.outcome, "SPACEKEEP_TOTAL_AVAILABLE").value_or(0);
+  }
+  /// A query waits less than half a second for a service that does not answer. On a busy machine
+  /// this one may take longer to start or to count; then its answer is there for a later query.
+  [[nodiscard]] std::uint64_t availableOnceAnswered(sdk::Client& client) {
+    std::uint64_t bytes = available(client);
+    for (int again = 0; again < 100 && bytes == 0; ++again) bytes = available(client);
+    return bytes;
+  }
+  [[nodiscard]] std::size_t timesAnsweredFromMemory() const {
+    return timesIn(sandbox_.daemonLog(), "using all cached info");
   }
   [[nodiscard]] std::size_t timesAsked() const {
     return timesIn(sandbox_.daemonLog(), std::string("^^^asking ") + kServiceId);
@@ -93,11 +103,13 @@ class Course : public testing::Test {
 
 TEST_F(Course, AServiceIsAskedOnceCountedFromMemoryPurgedAndAskedAgainBecauseFreeSpaceMoved) {
   auto client = connect();
+  EXPECT_EQ(availableOnceAnswered(client), kCacheBytes);
+  const std::size_t asked = timesAsked();
+  const std::size_t from_memory = timesAnsweredFromMemory();
+  EXPECT_GE(asked, 1U);
   EXPECT_EQ(available(client), kCacheBytes);
-  EXPECT_EQ(timesAsked(), 1U);
-  EXPECT_EQ(available(client), kCacheBytes);
-  EXPECT_EQ(timesAsked(), 1U) << "the second answer comes from memory";
-  EXPECT_EQ(timesIn(sandbox_.daemonLog(), "using all cached info"), 3U);
+  EXPECT_EQ(timesAsked(), asked) << "the second answer comes from memory";
+  EXPECT_EQ(timesAnsweredFromMemory(), from_memory + 2) << "in both looks of the query";
 
   const sdk::Reply purge = client.purge({.volume = "/volumes/disk",
                                          .amount = kPurgedBytes,
@@ -109,8 +121,8 @@ TEST_F(Course, AServiceIsAskedOnceCountedFromMemoryPurgedAndAskedAgainBecauseFre
   const std::uint64_t freed = unsignedAt(*purge.outcome, "SPACEKEEP_AMOUNT").value_or(0);
   EXPECT_GE(freed, kPurgedBytes);
 
-  EXPECT_EQ(available(client), kCacheBytes - freed);
-  EXPECT_EQ(timesAsked(), 2U) << "the free space has moved, so the old answer is worth nothing";
+  EXPECT_EQ(availableOnceAnswered(client), kCacheBytes - freed);
+  EXPECT_GT(timesAsked(), asked) << "the free space has moved, so the old answer is worth nothing";
   EXPECT_EQ(timesIn(sandbox_.daemonLog(), "Recent Info is invalid, deleting..."), 1U);
 }
 

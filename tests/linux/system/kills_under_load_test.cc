@@ -69,7 +69,7 @@ class Lives {
         ++figures_.before_the_first_answer;
       } else {
         lookAtTheRestart();
-        rt::sleepNs(random_() % (100 * kMs));
+        rt::sleepNs(random_() % (100 * kMs));  // the kill comes at any moment
       }
       if (!world_.killDaemon()) endedByItself();
       ++figures_.kills;

@@ -52,26 +52,41 @@ class Build:
             return next((said for said in pool.map(one, objects) if said is not None), None)
 
     def link(self, program, objects, where):
-        """Links the program in its place with the objects below `where` instead of its own."""
+        """Links the program in its place with the objects below `where` instead of its own.
+
+        What compiles has the names that it had, so it links; if not, something is wrong here.
+        """
         command = _with_output(self.link_command(program), program, program + '.mutant')
-        extra = []
-        for name in objects:
-            mine = str(pathlib.Path(where, name))
-            command, found = re.subn(r'(?<=\s)' + re.escape(name) + r'(?=\s)', lambda _: mine, command)
-            if not found:
-                extra.append(mine)
-        # What a program names comes before what its archives hold.
-        command = command.replace(' -o ', ' ' + ' '.join(map(shlex.quote, extra)) + ' -o ', 1)
+        replaced = {name: str(pathlib.Path(where, name)) for name in objects}
+        for archive, members in self._archives.items():
+            if not replaced.keys().isdisjoint(members):
+                replaced[archive] = str(self._archive_with(archive, replaced, where))
+        for name, mine in replaced.items():
+            command = re.sub(r'(?<=\s)' + re.escape(name) + r'(?=\s)', lambda _, mine=mine: mine, command)
         said = _run(command, self.directory)
-        if said is None:
-            os.replace(self.directory / program, self.directory / (program + '.whole'))
-            os.replace(self.directory / (program + '.mutant'), self.directory / program)
-        return said
+        if said is not None:
+            raise RuntimeError(f'{program} does not link: {said}')
+        os.replace(self.directory / program, self.directory / (program + '.whole'))
+        os.replace(self.directory / (program + '.mutant'), self.directory / program)
+
+    def _archive_with(self, archive, replaced, where):
+        """The archive below `where`, made of the changed objects and of the others as they are."""
+        mine = pathlib.Path(where, archive).resolve()
+        if not mine.exists():
+            mine.parent.mkdir(parents=True, exist_ok=True)
+            members = [replaced.get(name, self.directory / name) for name in self._archives[archive]]
+            subprocess.run(['ar', 'qcsT', mine, *members], cwd=self.directory, check=True)
+        return mine
 
     def restore(self, program):
         whole = self.directory / (program + '.whole')
         if whole.exists():
             os.replace(whole, self.directory / program)
+
+    def restore_all(self):
+        """Also what a killed run has left."""
+        for whole in self.directory.glob('*/*.whole'):
+            os.replace(whole, whole.with_suffix(''))
 
 
 def _ninja(directory, *arguments):

@@ -1,6 +1,7 @@
 """Draws mutants: the same seed and the same sources give the same ones in the same order."""
+import collections
+import hashlib
 import pathlib
-import random
 from typing import NamedTuple
 
 from mutants import places_of
@@ -35,15 +36,22 @@ def sources_of(tree, folders):
 
 
 def draw(tree, folders, seed):
-    """Yields every mutant once: each place with one of its changes, in an order drawn from `seed`."""
-    places = []
+    """Yields every mutant once: each place with one of its changes, in an order drawn from `seed`.
+
+    The draw of a place depends on its own line only, so an edit elsewhere leaves the others where they were.
+    """
+    drawn = []
     for file in sources_of(tree, folders):
         source = pathlib.Path(tree, file).read_text(encoding='utf-8')
-        places += [(file, source, place) for place in places_of(source)]
-    chance = random.Random(seed)
-    chance.shuffle(places)
-    for file, source, place in places:
-        yield _mutant(file, source, place.kind, chance.choice(place.changes))
+        seen = collections.Counter()
+        for place in places_of(source):
+            first = _mutant(file, source, place.kind, place.changes[0])
+            name = (seed, file, place.kind, first.before, first.column)
+            seen[name] += 1
+            digest = hashlib.sha256(repr((name, seen[name])).encode()).digest()
+            change = place.changes[digest[0] % len(place.changes)]
+            drawn.append((digest, _mutant(file, source, place.kind, change)))
+    return (mutant for _, mutant in sorted(drawn))
 
 
 def _mutant(file, source, kind, change):

@@ -16,20 +16,20 @@ class Ledger:
         if self._path.exists():
             for text in self._path.read_text(encoding='utf-8').splitlines():
                 row = json.loads(text)
-                self._rows[Mutant(*row['mutant'])] = row
+                self._rows[_key(Mutant(*row['mutant']))] = row
 
     def verdict(self, mutant):
-        return self._rows.get(mutant, {}).get('verdict')
+        return self._rows.get(_key(mutant), {}).get('verdict')
 
     def add(self, mutant, verdict, by, seconds):
         row = {'mutant': list(mutant), 'verdict': verdict, 'by': by, 'seconds': round(seconds, 1)}
-        self._rows[mutant] = row
+        self._rows[_key(mutant)] = row
         self._path.parent.mkdir(parents=True, exist_ok=True)
         with open(self._path, 'a', encoding='utf-8') as file:
             file.write(json.dumps(row) + '\n')
 
     def survivors(self):
-        return [mutant for mutant, row in self._rows.items() if row['verdict'] == SURVIVED]
+        return [Mutant(*row['mutant']) for row in self._rows.values() if row['verdict'] == SURVIVED]
 
     def tried(self):
         """How many mutants have a verdict; what did not compile was none."""
@@ -41,3 +41,8 @@ class Ledger:
     def out_of_time(self):
         """How many of the caught ones were caught by a time limit."""
         return sum(row['verdict'] == CAUGHT and 'time limit' in row['by'] for row in self._rows.values())
+
+
+def _key(mutant):
+    """What stays when lines come or go elsewhere."""
+    return mutant._replace(line=0)

@@ -10,6 +10,7 @@ are kept in WORKSHOP; a run that was stopped goes on. --again asks about the sur
 --fresh takes a new copy of sources and build.
 """
 import argparse
+import json
 import pathlib
 import shutil
 import sys
@@ -34,6 +35,16 @@ class Trial:
         self._objects = arguments.workshop / 'objects'
         self._counts = arguments.counts
         self._reach = reach
+        self._undo = arguments.workshop / 'undo'
+        self._restore_source()
+        self._build.restore_all()
+
+    def _restore_source(self):
+        """Takes the change back; also one that a killed run has left."""
+        if self._undo.exists():
+            path, original = json.loads(self._undo.read_text(encoding='utf-8'))
+            pathlib.Path(path).write_text(original, encoding='utf-8')
+            self._undo.unlink()
 
     def judge(self, mutant):
         """Gives (verdict, by whom)."""
@@ -43,30 +54,30 @@ class Trial:
         if text is None:
             return ledger.NOT_A_MUTANT, 'the line is no longer there'
         asked = suite.asked_about(mutant.file, mutant.line, self._reach.lines, list(self._reach.lines))
+        self._undo.write_text(json.dumps([str(path), original]), encoding='utf-8')
         path.write_text(text, encoding='utf-8')
         try:
-            return self._ask_all(asked, self._build.objects_with(path))
+            return self._ask_all(mutant.file, asked, self._build.objects_with(path))
         finally:
-            path.write_text(original, encoding='utf-8')
+            self._restore_source()
             shutil.rmtree(self._objects, ignore_errors=True)
             workshop.forget_counts(self._counts)
 
-    def _ask_all(self, asked, objects):
+    def _ask_all(self, file, asked, objects):
         compiled, linked = set(), []
         try:
             # Most changes concern one object: when that does not compile, nothing else has to be looked at.
             if len(objects) == 1 and not self._compile(objects, compiled):
                 return ledger.NOT_A_MUTANT, 'does not compile'
             for program in asked:
-                missing = self._link(program, objects, compiled, linked)
-                if missing is not None:
-                    return ledger.NOT_A_MUTANT, missing
+                if not self._link(program, objects, compiled, linked):
+                    return ledger.NOT_A_MUTANT, 'does not compile'
                 slow = self._reach.slow_tests_of(program)
                 quick_seconds = max(0.0, self._reach.seconds.get(program, 10.0) - sum(slow.values()))
                 found = self._ask(program, linked, quick_seconds, '-' + ':'.join(slow) if slow else '')
                 if found is not None:
                     return ledger.CAUGHT, found
-            for program in asked:
+            for program in suite.own(asked, file):
                 slow = self._reach.slow_tests_of(program)
                 found = self._ask(program, linked, sum(slow.values()), ':'.join(slow)) if slow else None
                 if found is not None:
@@ -77,17 +88,16 @@ class Trial:
                 self._build.restore(part)
 
     def _link(self, program, objects, compiled, linked):
-        """Links the program and those that it starts with the change. Gives None, or what is in the way."""
+        """Links the program and those that it starts with the change; False when that does not compile."""
         for part in self._reach.parts_of(program):
             mine = [] if part in linked else self._build.objects_of(part, objects)
             if not mine:
                 continue
             if not self._compile([name for name in mine if name not in compiled], compiled):
-                return 'does not compile'
-            if self._build.link(part, mine, self._objects) is not None:
-                return 'does not link'
+                return False
+            self._build.link(part, mine, self._objects)
             linked.append(part)
-        return None
+        return True
 
     def _ask(self, program, linked, usual_seconds, tests):
         if not any(part in linked for part in self._reach.parts_of(program)):

@@ -54,7 +54,7 @@ void acquireOrUnwind(Scheduler& scheduler, MutexState& mutex) {
   while (mutex.locked) {
     if (mutex.holder == scheduler.running().id) panic("a lock was taken twice by the same thread");
     scheduler.block(WaitKind::kLock, &mutex.waiters, kNever, mutex.holder);
-    scheduler.throwAtLockIfUnwinding();
+    scheduler.throwIfUnwinding();
   }
   acquire(scheduler, mutex);
 }

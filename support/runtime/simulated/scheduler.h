@@ -62,8 +62,8 @@ class Scheduler {
   /// Called where an exception may leave: throws Abandoned while left-over fibers are unwound,
   /// except in a destructor that already runs because of an exception.
   void throwIfUnwinding() const;
-  /// The same for locks, after a few that are let through: destructors take locks, and one that was
-  /// under way when the schedule ended must not be left by an exception.
+  /// The same for locks that are free, after a few that are let through: destructors take locks,
+  /// and one that was under way when the schedule ended must not be left by an exception.
   void throwAtLockIfUnwinding() const;
   /// Gives the running fiber up as it stands. Its stack is never touched again.
   [[noreturn]] void giveUpRunning();

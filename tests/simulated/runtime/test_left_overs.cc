@@ -104,6 +104,28 @@ TEST(StuckReport, EvenALoopThatSwallowsEveryExceptionIsLeftBehind) {
   EXPECT_THAT(report.blocked, Contains("main#0: could not be unwound"));
 }
 
+TEST(StuckReport, ACutAfterAFewStepsLeavesTimeToClearEverythingAway) {
+  rt::ScheduleOptions options;
+  options.max_steps = 20;
+  int alive = 0;
+  const auto report = rt::runSchedule(options, [&alive] {
+    struct Busy {
+      ~Busy() {
+        for (int i = 0; i < 1'000; ++i) const std::scoped_lock lock(mutex);
+        --alive;
+      }
+      int& alive;
+      rt::Mutex mutex;
+    };
+    Busy busy{alive, {}};
+    ++alive;
+    for (;;) const std::scoped_lock lock(busy.mutex);
+  });
+  EXPECT_EQ(report.end, rt::ScheduleEnd::kStuck);
+  EXPECT_THAT(report.blocked, ElementsAre("main#0: can run"));
+  EXPECT_EQ(alive, 0);
+}
+
 TEST(LeftOvers, AreRunUntilTheyWaitAndThenUnwound) {
   int alive = 0;
   bool slept = false;

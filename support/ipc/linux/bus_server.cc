@@ -111,6 +111,7 @@ void BusServer::State::close() {
   acceptors.clear();
   for (const auto& [id, connection] : connections) connection->close();
   connections.clear();
+  context->turns.clear();
   open = 0;
 }
 

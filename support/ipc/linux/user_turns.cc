@@ -37,6 +37,11 @@ std::size_t UserTurns::waiting(uid_t uid) const {
   return found == users_.end() ? 0 : found->second.waiting.size();
 }
 
+void UserTurns::clear() {
+  // A call that goes may end another one's turn while it does.
+  const auto gone = std::exchange(users_, {});
+}
+
 void UserTurns::startNext(uid_t uid) {
   User& user = users_[uid];
   while (!user.turn_is_taken && !user.waiting.empty()) {

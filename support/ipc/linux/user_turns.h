@@ -37,6 +37,8 @@ class UserTurns {
   /// The call that has the turn is answered, or will never be.
   void end(uid_t uid);
   [[nodiscard]] std::size_t waiting(uid_t uid) const;
+  /// Forgets the calls that wait. They may hold what holds this object.
+  void clear();
 
  private:
   struct User {

@@ -3,7 +3,10 @@
 
 #include <gtest/gtest.h>
 
+#include <memory>
+#include <mutex>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "tests/linux/ipc/ipc_world.h"
@@ -105,10 +108,11 @@ const InterfaceDescription& interfaceWithTurns() {
 /// Keeps what it is asked until it is told to answer the oldest.
 class HoldingServer {
  public:
-  explicit HoldingServer(UserTurnLimits limits = {}) {
+  /// `token` lives as long as the server's handlers.
+  explicit HoldingServer(UserTurnLimits limits = {}, std::shared_ptr<int> token = nullptr) {
     ServerOptions options;
     options.limits.turns = limits;
-    server_ = std::make_unique<BusServer>(loop, global, interface(), options);
+    server_ = std::make_unique<BusServer>(loop, global, interface(std::move(token)), options);
     std::string why;
     server_->serveListening(bindListeningSocket(path(), 0600, why));
   }
@@ -129,11 +133,11 @@ class HoldingServer {
   }
 
  private:
-  ServedInterface interface() {
+  ServedInterface interface(std::shared_ptr<int> token) {
     ServedMethod hold;
     hold.name = "hold";
     hold.turn_per_user = true;
-    hold.serve = [this](const Arguments&, Responder responder) {
+    hold.serve = [this, token = std::move(token)](const Arguments&, Responder responder) {
       const std::scoped_lock lock(mutex_);
       held_.push_back(std::move(responder));
     };
@@ -171,6 +175,20 @@ TEST(UserTurns, CallsOfOneUserOnTwoConnectionsAreServedOneAfterTheOther) {
   EXPECT_TRUE(eventually([&] { return server.held() == 1; }));
   server.letGo(false);
   EXPECT_TRUE(eventually([&] { return server.held() == 1; }));
+}
+
+TEST(UserTurns, CallsThatWaitAreGoneWithTheServer) {
+  auto token = std::make_shared<int>(0);
+  const std::weak_ptr<int> kept = token;
+  {
+    HoldingServer server({}, std::exchange(token, nullptr));
+    BareClient client(server.path());
+    sendHold(client);
+    sendHold(client);
+    EXPECT_NE(client.errorOf(client.newCall("nothing", "com.quorvel.TurnsTest")), "");
+    EXPECT_TRUE(eventually([&] { return server.held() == 1; }));
+  }
+  EXPECT_TRUE(kept.expired());
 }
 
 TEST(UserTurns, ACallBeyondWhatAUserMayHaveWaitingIsAnsweredWithAnError) {

@@ -115,7 +115,7 @@ struct UsageCase {
 
 TEST_F(CommandTest, AWrongCommandLineExitsWithTwoAndSaysWhatIsWrong) {
   const UsageCase cases[] = {
-      {"", "A command is required: purge, query, state, volumes or cancel"},
+      {"", "A command is required: purge, query, state, volumes, cancel or check-service"},
       {"eat", "eat"},
       {"purge", "VOLUME"},
       {"purge /data", "AMOUNT"},

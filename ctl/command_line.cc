@@ -188,8 +188,7 @@ void addCheckService(CLI::App& app, const SharedOptions& options, Command& chose
       "Run a service through what the daemon asks of it\n"
       "Says in words what is wrong. Needs no daemon: this tool stands in for it, starts COMMAND "
       "and asks it to give up all the data that it can give up on the volume. The exit status is 7 "
-      "when a check failed. Write -- before the command, as in:\n"
-      "  check-service --volume /data -- my-cache --verbose",
+      "when a check failed. Write -- before COMMAND.",
       options, chosen, [](const Options& o) { return runCheckService(o.common, o.check); });
   CheckServiceOptions& wanted = options->check;
   check.add_option("COMMAND", wanted.command,

@@ -68,7 +68,8 @@ std::string lineOf(const CheckResult& result, const Style& style) {
 }
 
 std::string summaryOf(const CheckReport& report) {
-  return fmt::format("{} checks: {} ok, {} failed, {} not applicable", report.results.size(),
+  const std::size_t all = report.results.size();
+  return fmt::format("{} check{}: {} ok, {} failed, {} not applicable", all, all == 1 ? "" : "s",
                      report.count(Outcome::kOk), report.count(Outcome::kFailed),
                      report.count(Outcome::kNotApplicable));
 }

@@ -14,6 +14,8 @@ constexpr const char* kNothingLeft =
     "The service has nothing to give at urgency 4. Fill its cache and check again.";
 constexpr std::uint64_t kCancelNs = 2 * kSecondNs;
 constexpr std::uint64_t kTooQuickNs = kSecondNs;
+constexpr std::uint64_t kLongestWaitNs = 60 * kSecondNs;
+constexpr std::uint64_t kQuietNs = kSecondNs;
 constexpr std::uint64_t kHeadStartNs = 50 * kMillisecondNs;
 constexpr std::uint64_t kPeriodicWaitNs = 15 * kSecondNs;
 constexpr int kPeriodicUrgency = 3;
@@ -91,6 +93,20 @@ Finding checkPurgeLimit(Bench& bench) {
   return notApplicable("The purge for a share told nothing (see purge-share).");
 }
 
+/// A purge that a service does not end is waited for as long as it frees something, because what it
+/// frees must not be taken for the work of a later request.
+void awaitQuiet(const Bench& bench, ServiceLine::CallNumber purge) {
+  std::uint64_t free_bytes = bench.space.freeBytes();
+  std::uint64_t quiet_since = rt::ticks();
+  within(kLongestWaitNs, [&] {
+    const std::uint64_t now = bench.space.freeBytes();
+    if (now != free_bytes) quiet_since = rt::ticks();
+    free_bytes = now;
+    return bench.subject.line().waitFor(purge, 0).settled() ||
+           elapsedNs(quiet_since, rt::ticks()) > kQuietNs;
+  });
+}
+
 Finding checkCancel(Bench& bench) {
   auto& subject = bench.subject;
   const std::uint64_t offered = amountIn(query(bench, kHighestUrgency));
@@ -105,6 +121,7 @@ Finding checkCancel(Bench& bench) {
   within(kHeadStartNs, [&] { return bench.space.freeBytes() > before.free_bytes; });
   const std::uint64_t cancelled_at = rt::ticks();
   const auto cancelling = subject.line().call("serviceCancelPurge", {});
+  awaitQuiet(bench, running);
   const Asked purged = subject.answerTo(running);
   const Asked cancelled = subject.answerTo(cancelling);
   const auto answered_at = subject.line().waitFor(running, 0).answered_ticks;

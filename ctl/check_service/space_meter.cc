@@ -30,6 +30,12 @@ std::int64_t difference(std::uint64_t later, std::uint64_t earlier) {
   return static_cast<std::int64_t>(later - earlier);
 }
 
+/// Below the directory, where there is one.
+std::string shortName(const std::string& path, const std::string& directory) {
+  const std::string beginning = directory.ends_with('/') ? directory : directory + "/";
+  return path.starts_with(beginning) ? path.substr(beginning.size()) : path;
+}
+
 void writeOut(const std::string& path) {
   const int fd = open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   if (fd < 0) return;
@@ -67,6 +73,7 @@ SpaceChange SpaceMeter::since(const SpaceReading& before, std::uint64_t expected
   SpaceChange change{.gained_bytes = gained(), .vanished = {}};
   if (before.files && data_) {
     change.vanished = vanishedBetween(*before.files, dataFilesBelow(*data_));
+    for (std::string& path : change.vanished->paths) path = shortName(path, *data_);
   }
   return change;
 }

@@ -111,6 +111,7 @@ std::string Subject::reach(std::uint64_t timeout_ns) {
   }
   if (const auto end = processEnd()) return "its process " + *end + " before it was reached";
   if (options_.command.empty()) return "it did not take a connection within " + seconds(timeout_ns);
+  if (check_in_) return fmt::format("within {} it did not check in again", seconds(timeout_ns));
   return fmt::format(
       "within {} it neither checked in nor took a connection at the socket that was handed over to "
       "it. A service that checks in finds the daemon's socket in SPACEKEEP_SOCKET (the library "

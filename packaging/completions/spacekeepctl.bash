@@ -16,6 +16,9 @@ _spacekeepctl_options() {
     purge) printf '%s\n' --urgency --timeout --token --wait-all ;;
     query) printf '%s\n' --itemized --urgency ;;
     'state set') printf '%s\n' --type --force ;;
+    check-service)
+      printf '%s\n' --volume --endpoint --data --in-use --patience --yes --no-purge
+      ;;
     'state list' | volumes) printf '%s\n' --names ;;
     '') printf '%s\n' --version ;;
   esac
@@ -27,11 +30,14 @@ _spacekeepctl_option_value() {
   case $1 in
     --urgency) _spacekeepctl_matches "$2" <<<$'1\n2\n3\n4' ;;
     --type) _spacekeepctl_matches "$2" <<<$'string\nnumber\nbool\nsize\njson' ;;
-    --socket)
+    --socket | --endpoint | --data | --in-use)
       compopt -o filenames 2>/dev/null
       mapfile -t COMPREPLY < <(compgen -f -- "$2")
       ;;
-    --timeout | --token) COMPREPLY=() ;;
+    --volume)
+      _spacekeepctl_matches "$2" < <("$tool" volumes --names 2>/dev/null)
+      ;;
+    --timeout | --token | --patience) COMPREPLY=() ;;
     *) return 1 ;;
   esac
 }
@@ -52,7 +58,15 @@ _spacekeepctl() {
   _spacekeepctl_option_value "$previous" "$current" && return
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${COMP_WORDS[i]} in
-      --socket | --urgency | --timeout | --token | --type)
+      --)
+        # What follows is the service's own command line.
+        [[ ${words[0]} == check-service ]] || continue
+        ((COMP_CWORD == i + 1)) && mapfile -t COMPREPLY < <(compgen -c -f -- "$current")
+        compopt -o default 2>/dev/null
+        return
+        ;;
+      --socket | --urgency | --timeout | --token | --type | --volume | --endpoint | --data | \
+        --in-use | --patience)
         local option=${COMP_WORDS[i]}
         [[ ${COMP_WORDS[i + 1]} == = ]] && ((i++))
         ((i++))
@@ -69,7 +83,7 @@ _spacekeepctl() {
     return
   fi
   case "${#words[@]} $command" in
-    '0 ') _spacekeepctl_matches "$current" <<<$'purge\nquery\nstate\nvolumes\ncancel' ;;
+    '0 ') _spacekeepctl_matches "$current" <<<$'purge\nquery\nstate\nvolumes\ncancel\ncheck-service' ;;
     '1 purge' | '1 query')
       _spacekeepctl_matches "$current" < <("$tool" "${socket[@]}" volumes --names 2>/dev/null)
       ;;

@@ -69,14 +69,15 @@ class Completion : public ToolTest {
         << "zpty -w -n z $'" << typed << "\\t'\n"
         << "zpty -r z out \"*" << completed << "*\" && exit 0\n"
         << "print -r -- \"${(V)out}\"; exit 1\n";
-    const Finished run = runShell("timeout 60 zsh -f " + scriptFile(), errFile());
+    const Finished run = runShell("timeout 200 zsh -f " + scriptFile(), errFile());
     return run.exit_code == 0 ? ""
                               : "exit " + std::to_string(run.exit_code) + ": " + run.out + run.err;
   }
 };
 
 TEST_F(Completion, BashOffersCommands) {
-  EXPECT_THAT(inBash("\"\""), ElementsAre("purge", "query", "state", "volumes", "cancel"));
+  EXPECT_THAT(inBash("\"\""),
+              ElementsAre("purge", "query", "state", "volumes", "cancel", "check-service"));
   EXPECT_THAT(inBash("q"), ElementsAre("query"));
   EXPECT_THAT(inBash("--json q"), ElementsAre("query"));
   EXPECT_THAT(inBash("state \"\""), ElementsAre("get", "set", "unset", "list"));
@@ -91,6 +92,7 @@ TEST_F(Completion, BashOffersTheOptionsOfTheCommand) {
   EXPECT_THAT(inBash("state set --f"), ElementsAre("--force"));
   EXPECT_THAT(inBash("state get --f"), IsEmpty());
   EXPECT_THAT(inBash("volumes --n"), ElementsAre("--names"));
+  EXPECT_THAT(inBash("check-service --in-use /tmp --n"), ElementsAre("--no-purge"));
 }
 
 TEST_F(Completion, BashOffersValuesOfOptions) {
@@ -129,10 +131,18 @@ TEST_F(Completion, BashKnowsTheKeysThatMeanSomethingWithoutADaemon) {
   EXPECT_THAT(inBash("state set SPACEKEEP_LOW_SPACE_BYTES \"\""), IsEmpty());
 }
 
+TEST_F(Completion, BashOffersFilesAndVolumesForACheckAndProgramsForItsCommand) {
+  EXPECT_THAT(inBash("check-service --data /etc/passw"), IsSupersetOf({"/etc/passwd"}));
+  EXPECT_EQ(inBash("check-service --volume \"\""), linesOf(ctl("volumes --names").out));
+  EXPECT_THAT(inBash("check-service --volume / -- mkto"), IsEmpty());
+  EXPECT_THAT(inBash("check-service --volume / -- mktem"), IsSupersetOf({"mktemp"}));
+  EXPECT_THAT(inBash("check-service --volume / -- mktemp --so"), IsEmpty());
+}
+
 /// Every option that bash offers is one that the tool knows for that command.
 TEST_F(Completion, EveryOptionThatIsOfferedStandsInTheHelp) {
-  for (const std::string command :
-       {"purge", "query", "state set", "state list", "state get", "volumes", "cancel"}) {
+  for (const std::string command : {"purge", "query", "state set", "state list", "state get",
+                                    "volumes", "cancel", "check-service"}) {
     const std::string help = ctl(command + " --help").out;
     for (const auto& option : inBash(command + " --")) {
       EXPECT_NE(help.find(option), std::string::npos) << command << " " << option;
@@ -144,6 +154,7 @@ TEST_F(Completion, ZshCompletesCommandsOptionsAndKeys) {
   serveState();
   EXPECT_EQ(inZsh("spacekeepctl q", "spacekeepctl query "), "");
   EXPECT_EQ(inZsh("spacekeepctl query --it", "--itemized"), "");
+  EXPECT_EQ(inZsh("spacekeepctl check-service --no", "--no-purge"), "");
   EXPECT_EQ(inZsh("spacekeepctl state set SPACEKEEP_C", "SPACEKEEP_CACHE_ENABLED "), "");
   EXPECT_EQ(inZsh("spacekeepctl state set SPACEKEEP_FINISH_EARLY t", "SPACEKEEP_FINISH_EARLY true"),
             "");

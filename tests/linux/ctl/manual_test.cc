@@ -5,6 +5,7 @@
 #include <regex>
 #include <string>
 
+#include "ctl/check_service/checks.h"
 #include "ctl/complaint.h"
 #include "ctl/known_keys.h"
 #include "tests/linux/ctl/tool_test.h"
@@ -12,11 +13,13 @@
 namespace spacekeep::ctl {
 namespace {
 
+using testing::ContainsRegex;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-constexpr const char* kCommands[] = {"purge",       "query",      "state get", "state set",
-                                     "state unset", "state list", "volumes",   "cancel"};
+constexpr const char* kCommands[] = {"purge",     "query",       "state get",
+                                     "state set", "state unset", "state list",
+                                     "volumes",   "cancel",      "check-service"};
 
 class Manual : public ToolTest {
  protected:
@@ -58,8 +61,16 @@ TEST_F(Manual, TellsOfEveryKeyAndEveryExitStatus) {
   EXPECT_THAT(page, HasSubstr(kWholeStateKey));
   ASSERT_THAT(page, HasSubstr("\nEXIT STATUS\n"));
   const std::string table = page.substr(page.find("\nEXIT STATUS\n"));
-  for (int code = 0; code <= static_cast<int>(ExitCode::kNoValue); ++code) {
+  for (int code = 0; code <= static_cast<int>(ExitCode::kChecksFailed); ++code) {
     EXPECT_THAT(table, HasSubstr("\n     " + std::to_string(code) + " ")) << table;
+  }
+}
+
+TEST_F(Manual, TellsWhatEveryCheckOfAServiceIsAbout) {
+  const std::string page = text();
+  ASSERT_THAT(page, HasSubstr("Checks\n"));
+  for (const auto& check : allChecks()) {
+    EXPECT_THAT(page, ContainsRegex(std::string(check.name) + " +" + check.meaning));
   }
 }
 

@@ -1,6 +1,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <spacekeep/service.h>
+#include <stdlib.h>
 
 #include <atomic>
 #include <memory>
@@ -59,6 +60,24 @@ class CheckInTest : public testing::Test {
   std::shared_ptr<TestService> service_ = std::make_shared<TestService>();
   FakeDaemon daemon_{directory_.daemonSocket()};
 };
+
+TEST_F(CheckInTest, TheEnvironmentNamesTheDaemonOfAProgramThatNamesNone) {
+  daemon_.on("clientCheckin", daemon_.registering(registered_));
+  const auto running = daemon_.run();
+  ASSERT_EQ(setenv("SPACEKEEP_SOCKET", directory_.daemonSocket().c_str(), 1), 0);
+  CheckInOptions unnamed = options();
+  unnamed.socket_path = kDefaultSocketPath;
+  const ServiceHost host = checkIn(unnamed);
+  EXPECT_TRUE(reaches(HostState::kServing));
+}
+
+TEST_F(CheckInTest, ASocketThatTheProgramNamesWinsOverTheEnvironment) {
+  daemon_.on("clientCheckin", daemon_.registering(registered_));
+  const auto running = daemon_.run();
+  ASSERT_EQ(setenv("SPACEKEEP_SOCKET", "/no/such/daemon", 1), 0);
+  const ServiceHost host = checkIn(options());
+  EXPECT_TRUE(reaches(HostState::kServing));
+}
 
 TEST_F(CheckInTest, TheServiceAnswersThePingThatComesBeforeTheAnswerAndServesAfterwards) {
   daemon_.on("clientCheckin", daemon_.registering(registered_));

@@ -17,7 +17,7 @@ namespace spacekeep::ipc {
 namespace {
 
 /// Takes over `fd` in every case: a bus that has it closes it.
-sd_bus* startServer(int fd) {
+sd_bus* startServer(int fd, BusDescriptors descriptors) {
   sd_bus* bus = nullptr;
   if (sd_bus_new(&bus) < 0) {
     ::close(fd);
@@ -26,8 +26,9 @@ sd_bus* startServer(int fd) {
   // Nobody ever sees it.
   constexpr sd_id128_t kId{
       {'S', 'p', 'a', 'c', 'e', 'k', 'e', 'e', 'p', ' ', 's', 'e', 'r', 'v', 'e', 'r'}};
+  const int takes_descriptors = descriptors == BusDescriptors::kTaken ? 1 : 0;
   const bool prepared =
-      sd_bus_set_bus_client(bus, 0) >= 0 && sd_bus_negotiate_fds(bus, 1) >= 0 &&
+      sd_bus_set_bus_client(bus, 0) >= 0 && sd_bus_negotiate_fds(bus, takes_descriptors) >= 0 &&
       sd_bus_set_server(bus, 1, kId) >= 0 && sd_bus_set_method_call_timeout(bus, UINT64_MAX) >= 0 &&
       sd_bus_set_exit_on_disconnect(bus, 0) >= 0 && sd_bus_set_fd(bus, fd, fd) >= 0;
   if (!prepared) {
@@ -67,12 +68,12 @@ bool passHandshake(sd_bus* bus, int other_end) {
 
 }  // namespace
 
-sd_bus* makeAuthenticatedBus(int socket) {
+sd_bus* makeAuthenticatedBus(int socket, BusDescriptors descriptors) {
   const SocketPair pair = makeSocketPair();
   if (pair.first == nullptr) return nullptr;
   const int fd = ::fcntl(pair.first->fd(), F_DUPFD_CLOEXEC, 3);
   if (fd < 0) return nullptr;
-  sd_bus* bus = startServer(fd);
+  sd_bus* bus = startServer(fd, descriptors);
   if (bus == nullptr) return nullptr;
   if (passHandshake(bus, pair.second->fd()) && ::dup3(socket, fd, O_CLOEXEC) >= 0) return bus;
   sd_bus_close_unref(bus);

@@ -15,6 +15,7 @@
 #include <utility>
 
 #include "support/ipc/linux/authenticated_bus.h"
+#include "support/ipc/linux/descriptor_message.h"
 
 namespace spacekeep::ipc {
 
@@ -45,7 +46,8 @@ BusLink::BusLink(IpcLoop& loop, Owner& owner, Authentication::Role role, const L
 
 BusLink::~BusLink() { close(); }
 
-void BusLink::start(int fd, uid_t peer_uid) {
+void BusLink::start(int fd, uid_t peer_uid, bool sends_descriptors) {
+  sends_descriptors_ = sends_descriptors;
   fd_ = ::fcntl(fd, F_DUPFD_CLOEXEC, 3);
   if (fd_ < 0) {
     end(LinkEnd::kRefused, "this process has no descriptor left");
@@ -131,7 +133,8 @@ bool BusLink::open() {
   io_ = sd_event_source_unref(io_);
   timer_ = sd_event_source_disable_unref(timer_);
   authentication_.reset();
-  bus_ = makeAuthenticatedBus(fd_);
+  bus_ = makeAuthenticatedBus(
+      fd_, sends_descriptors_ ? BusDescriptors::kTaken : BusDescriptors::kClosed);
   socket_.reset();
   if (bus_ == nullptr) return false;
   fd_ = sd_bus_get_fd(bus_);
@@ -172,6 +175,8 @@ bool BusLink::processOnce() {
     switch (lookAhead()) {
       case Ahead::kRefused:
         return false;
+      case Ahead::kDescriptors:
+        return readWithDescriptors();
       case Ahead::kMessage:
         size_is_known = true;
         in_message_ = true;
@@ -206,7 +211,11 @@ bool BusLink::processOnce() {
 
 BusLink::Ahead BusLink::lookAhead() {
   std::array<unsigned char, kHeaderBytes> header{};
-  const ssize_t seen = ::recv(fd_, header.data(), header.size(), MSG_PEEK | MSG_DONTWAIT);
+  iovec part{.iov_base = header.data(), .iov_len = header.size()};
+  msghdr message{};
+  message.msg_iov = &part;
+  message.msg_iovlen = 1;
+  const ssize_t seen = ::recvmsg(fd_, &message, MSG_PEEK | MSG_DONTWAIT);
   if (seen == 0 || (seen < 0 && errno != EAGAIN && errno != EINTR)) {
     end(LinkEnd::kPeerLeft, "the peer has left");
     return Ahead::kRefused;
@@ -215,7 +224,39 @@ BusLink::Ahead BusLink::lookAhead() {
   // A header of which a part has arrived is left in the socket.
   header_is_incomplete_ = static_cast<std::size_t>(seen) < header.size();
   if (header_is_incomplete_) return Ahead::kIncomplete;
-  return judgeHeader(header.data()) ? Ahead::kMessage : Ahead::kRefused;
+  if (!judgeHeader(header.data())) return Ahead::kRefused;
+  // Without room for them the kernel says that there are descriptors, and leaves them where they
+  // are.
+  const bool brings_descriptors = (message.msg_flags & MSG_CTRUNC) != 0;
+  return brings_descriptors && !sends_descriptors_ ? judgeDescriptors() : Ahead::kMessage;
+}
+
+BusLink::Ahead BusLink::judgeDescriptors() {
+  const std::string problem = role_ == Authentication::Role::kServer
+                                  ? descriptorMessageProblem(fd_, message_size_)
+                                  : "it sent a descriptor with an answer";
+  if (problem.empty()) return Ahead::kDescriptors;
+  end(LinkEnd::kRefused, problem);
+  return Ahead::kRefused;
+}
+
+/// By a bus for this one message: the connection's own takes no descriptors. Answers whether there
+/// may be more to do.
+bool BusLink::readWithDescriptors() {
+  sd_bus* reader = makeAuthenticatedBus(fd_, BusDescriptors::kTaken);
+  if (reader == nullptr || sd_bus_add_filter(reader, nullptr, &BusLink::onMessage, this) < 0) {
+    sd_bus_close_unref(reader);
+    end(LinkEnd::kRefused, "this process has no descriptor left");
+    return false;
+  }
+  in_message_ = true;
+  constexpr int kMoreThanEnoughSteps = 8;
+  for (int steps = 0; in_message_ && !ended_ && steps < kMoreThanEnoughSteps; ++steps) {
+    if (sd_bus_process(reader, nullptr) < 0) break;
+  }
+  sd_bus_close_unref(reader);
+  if (in_message_) end(LinkEnd::kRefused, "it sent a broken message");
+  return !ended_;
 }
 
 /// The fixed part of a header: byte order, type, flags, version, length of the body, serial, length

@@ -53,7 +53,8 @@ class BusLink {
 
   /// Begins to authenticate over a duplicate of `fd`. Failures of any kind are told by linkEnded,
   /// also within this call.
-  void start(int fd, uid_t peer_uid);
+  /// Only a client that says so can send descriptors. One that does trusts its server.
+  void start(int fd, uid_t peer_uid, bool sends_descriptors = false);
   [[nodiscard]] bool ready() const { return bus_ != nullptr; }
   [[nodiscard]] bool ended() const { return ended_; }
   /// Within linkMessage: the size of the message, or the most that it can be.
@@ -77,9 +78,11 @@ class BusLink {
   bool open();
   void process();
   bool processOnce();
-  enum class Ahead { kNothing, kIncomplete, kMessage, kRefused };
+  enum class Ahead { kNothing, kIncomplete, kMessage, kDescriptors, kRefused };
   Ahead lookAhead();
   bool judgeHeader(const unsigned char* header);
+  Ahead judgeDescriptors();
+  bool readWithDescriptors();
   bool messageWasDropped(std::size_t available);
   void updateEvents();
   void setPriority(bool waits_behind_others);
@@ -99,6 +102,7 @@ class BusLink {
   int fd_ = -1;
   std::uint32_t events_ = 0;
   bool waits_behind_others_ = false;
+  bool sends_descriptors_ = false;
   bool processing_ = false;
   bool ended_ = false;
   bool peer_hung_up_ = false;

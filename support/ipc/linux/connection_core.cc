@@ -132,7 +132,18 @@ void ConnectionCore::start(std::deque<Call> held) {
   }
   const int fd = descriptor == nullptr ? -1 : descriptor->fd();
   peer_.remember(fd);
-  link_.start(fd, 0);
+  link_.start(fd, 0, sendsDescriptors());
+}
+
+bool ConnectionCore::sendsDescriptors() {
+  const std::scoped_lock lock(mutex_);
+  if (interface_ == nullptr) return false;
+  for (const MethodDescription& method : interface_->methods) {
+    for (const ArgumentDescription& argument : method.in) {
+      if (argument.kind == ArgumentKind::kDescriptor) return true;
+    }
+  }
+  return false;
 }
 
 void ConnectionCore::transmit(Call call) {

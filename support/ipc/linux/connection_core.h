@@ -58,6 +58,7 @@ class ConnectionCore final : public BusLink::Owner,
   void post(Call call);
   void fail(Call call, Error error);
   void forgetOne();
+  [[nodiscard]] bool sendsDescriptors();
 
   // IPC thread.
   void start(std::deque<Call> held);

@@ -25,6 +25,7 @@ std::unique_ptr<QueueProbe> probeOfShortQueues() {
 }
 
 int run() {
+  limitHeapArenas();
   static LogHandle log_handle;
   setUpLogging(log_handle, LinuxPaths().log_level_file);
   raiseDescriptorLimit();

@@ -1,5 +1,6 @@
 #include "support/linux/process_limits.h"
 
+#include <malloc.h>
 #include <sys/resource.h>
 
 namespace spacekeep {
@@ -10,5 +11,7 @@ void raiseDescriptorLimit() {
   files.rlim_cur = files.rlim_max;
   static_cast<void>(setrlimit(RLIMIT_NOFILE, &files));
 }
+
+void limitHeapArenas() { static_cast<void>(mallopt(M_ARENA_MAX, kHeapArenas)); }
 
 }  // namespace spacekeep

@@ -14,7 +14,7 @@ import pathlib
 import sys
 
 from counts import FOLDERS, details_of, merge, summary_of
-from test_programs import programs_of, run_counted
+from test_programs import collect, programs_of, run_counted
 
 TARGET_LINES_PERCENT = 95.0
 TARGET_BRANCHES_PERCENT = 85.0
@@ -51,15 +51,17 @@ def run_all(programs, build, counts):
     """Runs the programs; those on the deterministic runtime start nothing, so two of them at a time."""
     counts.mkdir(mode=0o1777, exist_ok=True)
     counts.chmod(0o1777)
-    for leftover in counts.glob('*.profraw'):
+    for leftover in counts.rglob('*.profraw'):
         leftover.unlink()
     apart = [program for program in programs if 'test_linux_' in program]
     failed, took = [], {}
 
     def run(program):
-        # Programs that start no others leave the shared folder alone.
-        shared = counts if program in apart else build / 'coverage' / 'nothing'
-        status, seconds = run_counted(program, build, shared, build / 'coverage' / pathlib.Path(program).name)
+        kept = build / 'coverage' / pathlib.Path(program).name
+        status, seconds = run_counted(program, build, counts, kept)
+        collect(counts / kept.name, kept, 'own')
+        if program in apart:
+            collect(counts, kept, 'started')
         print(f'{program:48s} {seconds:7.1f} s  {"passed" if status == 0 else f"FAILED ({status})"}', flush=True)
         took[program] = round(seconds, 1)
         if status != 0:

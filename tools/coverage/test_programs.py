@@ -26,20 +26,27 @@ def programs_of(build):
     return [str(path.relative_to(build)) for path in ordered + [simulation] if path.exists()]
 
 
-def run_counted(program, build, shared_counts, kept):
+def run_counted(program, build, counts, kept):
     """Runs one program; its counts and those of the processes it starts end up in the folder `kept`.
 
-    Processes that lose the environment (a daemon in a sandbox) count in `shared_counts`, the folder
-    that is compiled into them, so programs that start such are not to run side by side.
+    They count below `counts`, the folder that a daemon in a sandbox sees as well. Processes that lose the
+    environment count in `counts` itself, so programs that start such are not to run side by side.
     Gives (exit status, seconds).
     """
     shutil.rmtree(kept, ignore_errors=True)
     kept.mkdir(parents=True)
+    own = counts / kept.name
+    own.mkdir(mode=0o1777, exist_ok=True)
+    own.chmod(0o1777)
     began = time.monotonic()
     with open(kept / 'log', 'wb') as log:
-        environment = dict(os.environ, LLVM_PROFILE_FILE=f'{kept}/%m%c.profraw')
+        environment = dict(os.environ, LLVM_PROFILE_FILE=f'{own}/%m%c.profraw')
         status = subprocess.run(command_of(program, build), stdout=log, stderr=subprocess.STDOUT, cwd=build / 'tests',
                                 env=environment, check=False).returncode
-    for number, path in enumerate(sorted(shared_counts.glob('*.profraw'))):
-        shutil.move(path, kept / f'shared-{number}.profraw')
     return status, time.monotonic() - began
+
+
+def collect(folder, kept, name):
+    """Moves the counts out of memory into the folder of the program."""
+    for number, path in enumerate(sorted(folder.glob('*.profraw'))):
+        shutil.move(path, kept / f'{name}-{number}.profraw')

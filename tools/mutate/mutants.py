@@ -27,7 +27,8 @@ _BIT = {'&': ('|',), '|': ('&',), '^': ('&',), '<<': ('>>',), '|=': ('&=',), '&=
 _BINARY = [('relational', _RELATIONAL), ('arithmetic', _ARITHMETIC), ('logical', _LOGICAL), ('bit', _BIT)]
 _NO_CALL = {'return', 'if', 'for', 'while', 'switch', 'do', 'else', 'case', 'delete', 'throw', 'using', 'static_assert',
             'namespace', 'template', 'typedef', 'friend', 'auto', 'const', 'constexpr', 'static', 'struct', 'class', 'enum',
-            'public', 'private', 'protected', 'explicit', 'virtual', 'new', 'break', 'continue', 'goto', 'operator'}
+            'try', 'catch', 'public', 'private', 'protected', 'explicit', 'virtual', 'new', 'break', 'continue', 'goto', 'operator'}
+_AFTER_BRACES = (';', ',', '.', '->', ')', '(', '?', ':', '+', '-', '==', '!=', '<', '>', '&&', '||')
 _NUMBER = re.compile(r"(0[xX][0-9a-fA-F']+|[0-9][0-9']*)([uUlLzZ]*)$")
 _FRACTION = re.compile(r"([0-9][0-9']*\.[0-9']*(?:[eE][-+]?[0-9]+)?|[0-9][0-9']*[eE][-+]?[0-9]+)([fF]?)$")
 
@@ -141,8 +142,8 @@ def _statement_end(tokens, index):
         text = tokens[at].text
         if text in ('(', '[', '{'):
             after = closing(tokens, at)
-            if after is None:
-                return None
+            if after is None or (text == '{' and _text(tokens, after + 1) not in _AFTER_BRACES):
+                return None  # The body of a function or of a block, not a value in braces.
             at = after
         elif text in (')', ']', '}'):
             return None
@@ -192,9 +193,22 @@ def _is_declaration(tokens, start, end):
     return False
 
 
+def _enclosing(tokens, index):
+    """The bracket that is open at `index`; names between square ones are captures, which have no order."""
+    depth = 0
+    for at in range(index - 1, -1, -1):
+        if tokens[at].text in (')', ']', '}'):
+            depth += 1
+        elif tokens[at].text in ('(', '[', '{'):
+            if depth == 0:
+                return tokens[at].text
+            depth -= 1
+    return ''
+
+
 def _arguments(source, tokens, index, token):
     """Neighbouring arguments that look alike: two names, or two numbers."""
-    if token.text != ',' or index < 2:
+    if token.text != ',' or index < 2 or _enclosing(tokens, index) != '(':
         return []
     left, right = tokens[index - 1], _text(tokens, index + 1) and tokens[index + 1]
     alone = _text(tokens, index - 2) in ('(', ',') and _text(tokens, index + 2) in (')', ',')

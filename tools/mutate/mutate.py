@@ -57,13 +57,13 @@ class Trial:
         self._undo.write_text(json.dumps([str(path), original]), encoding='utf-8')
         path.write_text(text, encoding='utf-8')
         try:
-            return self._ask_all(mutant.file, asked, self._build.objects_with(path))
+            return self._ask_all(asked, self._build.objects_with(path))
         finally:
             self._restore_source()
             shutil.rmtree(self._objects, ignore_errors=True)
             workshop.forget_counts(self._counts)
 
-    def _ask_all(self, file, asked, objects):
+    def _ask_all(self, asked, objects):
         compiled, linked = set(), []
         try:
             # Most changes concern one object: when that does not compile, nothing else has to be looked at.
@@ -77,7 +77,7 @@ class Trial:
                 found = self._ask(program, linked, quick_seconds, '-' + ':'.join(slow) if slow else '')
                 if found is not None:
                     return ledger.CAUGHT, found
-            for program in suite.own(asked, file):
+            for program in asked:
                 slow = self._reach.slow_tests_of(program)
                 found = self._ask(program, linked, sum(slow.values()), ':'.join(slow)) if slow else None
                 if found is not None:

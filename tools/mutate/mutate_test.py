@@ -65,13 +65,14 @@ class Places(unittest.TestCase):
         self.assertIn(('dropped return', '{ ; }'), all_changes('{ return; }'))
 
     def test_declarations_stay(self):
-        for source in ('{ Type name(a); }', '{ std::vector<int> x = y(); }', '{ const auto& x = y(); }', '{ return f(); }'):
+        for source in ('{ Type name(a); }', '{ std::vector<int> x = y(); }', '{ const auto& x = y(); }', '{ return f(); }',
+                       '} A::A(int b) : b_(b) {} void f() { return 1; }', '} catch (...) { return 1; } return a;'):
             kinds = {kind for kind, _ in all_changes(source)}
             self.assertFalse({'dropped call', 'dropped assignment'} & kinds, source)
 
     def test_neighbouring_arguments_that_look_alike_are_swapped(self):
         self.assertIn(('swapped arguments', 'f(b, a);'), all_changes('f(a, b);'))
-        for source in ('f(a, b.c);', 'f(a, 1);', 'void f(int a, int b);'):
+        for source in ('f(a, b.c);', 'f(a, 1);', 'f([a, b] { g(); });', 'void f(int a, int b);'):
             self.assertNotIn('swapped arguments', {kind for kind, _ in all_changes(source)}, source)
 
     def test_static_assertions_stay(self):

@@ -31,7 +31,7 @@ class Reach:
         return [part for part in STARTED if (self._build / part).exists()] + [program]
 
     def slow_tests_of(self, program):
-        """{test: seconds} of a program: asked, if it is of the own room, when all quick ones said nothing."""
+        """{test: seconds} of a program: asked when the quick ones of all programs have said nothing."""
         log = self._build / 'coverage' / pathlib.Path(program).name / 'log'
         took = re.findall(r'^\[ +OK \] (\S+?),? .*?\((\d+) ms\)$', log.read_text(errors='replace'), re.MULTILINE)
         return {name: int(ms) / 1000 for name, ms in took if int(ms) >= SLOW_MS}

@@ -31,11 +31,6 @@ def rank(program, room):
     return (0 if name.endswith('_' + room) else 1, kind, name)
 
 
-def own(programs, file):
-    """Those of the file's own room."""
-    return [program for program in programs if pathlib.Path(program).name.endswith('_' + room_of(file))]
-
-
 def is_exact(program):
     """True where the same program gives the same answer each time."""
     name = pathlib.Path(program).name

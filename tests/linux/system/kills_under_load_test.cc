@@ -26,6 +26,7 @@ namespace {
 constexpr int kEverydayKills = 40;
 constexpr int kEverydaySideBySide = 4;
 constexpr std::uint64_t kMs = 1'000'000;
+constexpr std::uint64_t kKillsPerProgress = 200;
 /// A daemon starts in some 20 ms on a quiet machine; these are many at once on a busy one.
 constexpr std::uint64_t kSlowestFirstAnswerMs = 10'000;
 
@@ -73,12 +74,19 @@ class Lives {
       }
       if (!world_.killDaemon()) endedByItself();
       ++figures_.kills;
+      if (figures_.kills % kKillsPerProgress == 0) showProgress();
       world_.renewOneService();
     }
     return figures_;
   }
 
  private:
+  void showProgress() const {
+    std::fprintf(stderr, "%llu kills here, %llu answered writes, %llu stuck\n",
+                 static_cast<unsigned long long>(figures_.kills),
+                 static_cast<unsigned long long>(world_.answeredWrites()),
+                 static_cast<unsigned long long>(figures_.stuck));
+  }
   void lookAtTheRestart() {
     const std::uint64_t start_ms = monotonicMs();
     if (!world_.waitForFirstAnswer()) return isStuck("no answer to a read of the state");

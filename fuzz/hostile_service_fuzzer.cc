@@ -167,22 +167,32 @@ struct Manner {
   bool invalidates;     ///< the daemon ends the connection itself
 };
 
-std::string streamOf(std::string_view text) {
+constexpr std::string_view kHandshake =
+    "DATA\r\nOK 0123456789abcdef0123456789abcdef\r\nAGREE_UNIX_FD\r\n";
+
+/// One message after another; those whose kind says so bring a descriptor.
+bool sendRecords(int fd, fuzz::PieceReader input) {
+  while (!input.usedUp()) {
+    const bool brings_one = (fuzz::PieceReader(input).byte() & 8) != 0;
+    const std::string message = recordedMessage(input);
+    if (!fuzz::sendAll(fd, message, std::vector<int>(brings_one ? 1 : 0, fd))) return false;
+  }
+  return true;
+}
+
+/// False when not all of it fits into the socket.
+bool sendInput(int fd, std::string_view text) {
   fuzz::PieceReader input(text);
   const unsigned help = Manner(input.byte()).help;
-  if (help == 0) return std::string(input.rest());
-  std::string stream = "DATA\r\nOK 0123456789abcdef0123456789abcdef\r\nAGREE_UNIX_FD\r\n";
-  if (help == 1) return stream += input.rest();
-  while (!input.usedUp()) stream += recordedMessage(input);
-  return stream;
+  if (help > 0 && !fuzz::sendAll(fd, kHandshake)) return false;
+  return help == 2 ? sendRecords(fd, input) : fuzz::sendAll(fd, input.rest());
 }
 
 void examine(std::string_view input) {
   Daemon& daemon = Daemon::instance();
   const SocketPair pair = makeSocketPair();
   require(pair.first != nullptr, "the daemon keeps no descriptor of a service that has gone");
-  // A descriptor rides along with the first byte, for messages that say so.
-  if (!fuzz::sendAll(pair.second->fd(), streamOf(input), {pair.second->fd()})) return;
+  if (!sendInput(pair.second->fd(), input)) return;
   ::shutdown(pair.second->fd(), SHUT_WR);
   const auto course = std::make_shared<Course>();
   const auto connection = connectionFromDescriptor(daemon.loop, daemon.global, pair.first, kLimits);

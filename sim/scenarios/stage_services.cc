@@ -64,8 +64,8 @@ void StageServices::perform(const ServiceAction& action) {
       return;
     case ServiceAction::Kind::kIntrudes: {
       const auto stranger = world_.client("stranger");
-      (void)world_.call(stranger, "clientCheckin",
-                        {plan.id, world_.endpointOf(service), action.info});
+      called_(world_.call(stranger, "clientCheckin",
+                          {plan.id, world_.endpointOf(service), action.info}));
       return;
     }
   }
@@ -76,6 +76,7 @@ void StageServices::checkIn(const std::string& id, const Dictionary& info) {
   const std::shared_ptr<SimulatedService>& service = services_.at(id);
   if (!service->alive()) return;
   const auto call = world_.checkIn(service, info);
+  called_(call);
   if (!pings_may_be_silent_) (void)call->wait();
 }
 

@@ -8,6 +8,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <utility>
 
 #include "sim/scenarios/system_scenario.h"
 #include "sim/world/world.h"
@@ -17,8 +18,10 @@ namespace spacekeep::sim {
 
 class StageServices {
  public:
-  StageServices(World& world, bool pings_may_be_silent)
-      : world_(world), pings_may_be_silent_(pings_may_be_silent) {}
+  /// `called` is told of each check-in.
+  StageServices(World& world, bool pings_may_be_silent,
+                std::function<void(const std::shared_ptr<ClientCall>&)> called)
+      : world_(world), pings_may_be_silent_(pings_may_be_silent), called_(std::move(called)) {}
 
   /// `owns` is what is left of its data.
   void add(const SystemService& plan, const std::map<std::string, OwnedBytes>& owns);
@@ -38,6 +41,7 @@ class StageServices {
 
   World& world_;
   const bool pings_may_be_silent_;
+  const std::function<void(const std::shared_ptr<ClientCall>&)> called_;
   std::map<std::string, SystemService> plans_;
   std::map<std::string, std::shared_ptr<SimulatedService>> services_;
   std::map<std::string, std::shared_ptr<SerialQueue>> orders_;

@@ -32,7 +32,8 @@ SystemStage::SystemStage(SystemRun& run, unsigned number, LifeOfDaemon& life, La
       life_(life),
       lasting_(lasting),
       world_(optionsFor(run.plan, lasting)),
-      services_(world_, run.plan.faults.contains(Fault::kSilentPing)) {
+      services_(world_, run.plan.faults.contains(Fault::kSilentPing),
+                [this](const auto& call) { keepCall(call); }) {
   world_.trace().add(LifeBegan{number_, rt::wallClockNs()});
   setUpDisk();
   setUpVolumes();
@@ -154,8 +155,11 @@ void SystemStage::act(const CallAction& action) {
   } else {
     arguments = {action.info};
   }
-  const auto call =
-      world_.call(world_.client(action.client, action.rights), action.member, std::move(arguments));
+  keepCall(world_.call(world_.client(action.client, action.rights), action.member,
+                       std::move(arguments)));
+}
+
+void SystemStage::keepCall(const std::shared_ptr<ClientCall>& call) {
   const std::scoped_lock lock(mutex_);
   calls_.push_back(call);
 }

@@ -38,6 +38,8 @@ class SystemStage {
   void takeDown();
   void noteDown();
 
+  /// It is waited for in the end.
+  void keepCall(const std::shared_ptr<ClientCall>& call);
   void perform(const PlannedAction& action);
   void act(const CallAction& action);
   void act(const SpaceAction& action);

@@ -1,4 +1,5 @@
 #include "sim/world/in_memory_preferences.h"
+#include "support/queues/concurrent_queue.h"
 #include "support/runtime/locks.h"
 
 #include <utility>
@@ -12,8 +13,11 @@ Dictionary dictionaryOf(const InMemoryDisk::Contents& contents) {
   return all;
 }
 
+// As a write to a real disk does, it tells the pool that its thread is busy for nobody.
 void sleepIfAny(std::uint64_t duration_ns) {
-  if (duration_ns != 0) rt::sleepNs(duration_ns);
+  if (duration_ns == 0) return;
+  const BlockingRegion writing;
+  rt::sleepNs(duration_ns);
 }
 
 }  // namespace

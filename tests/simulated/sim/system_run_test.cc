@@ -198,6 +198,18 @@ TEST(SystemRun, ASilentPingHoldsEverybodyAndIsReportedAsThat) {
   EXPECT_EQ(callsOf(run, "clientPurge").at(0).state, ClientCall::State::kOpen);
 }
 
+// Seed 500491: nobody but the silent service's own check-in was left waiting.
+TEST(SystemRun, ASilentPingIsReportedAlsoWhenNobodyElseWaits) {
+  SystemPlan plan = smallPlan();
+  plan.faults = {Fault::kSilentPing};
+  SystemService silent;
+  silent.id = "silent";
+  silent.check_in_info = {{"PURGE", true}};
+  silent.behaviour.ping.answer = Answer::kNever;
+  plan.services = {silent};
+  EXPECT_EQ(playSystem(plan, 3).end, SystemEnd::kSilentPing);
+}
+
 TEST(SystemRun, TheSameSilenceIsADeadlockWhereItWasNotPlanned) {
   SystemPlan plan = smallPlan();
   SystemService silent;

@@ -18,6 +18,7 @@ constexpr std::array kInvariants = {
     Invariant{"every urgency up to the limit runs", checkUrgencies},
     Invariant{"waits are exact", checkWaitsAreExact},
     Invariant{"only a reply ends a wait early", checkOnlySignalsEndWaits},
+    Invariant{"the last reply of a purge that waits signals it", checkTheLastReplySignals},
     Invariant{"a share is an equal part of what is missing", checkSharesAreEqualParts},
     Invariant{"shares are computed one after another on their queue", checkSharesOneAfterAnother},
     Invariant{"every service is offered its first share before any its second",

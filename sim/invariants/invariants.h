@@ -52,6 +52,7 @@ void checkCancelsFollowShortfalls(const PurgeStory& story, Findings& findings);
 void checkUrgencies(const PurgeStory& story, Findings& findings);
 void checkWaitsAreExact(const PurgeStory& story, Findings& findings);
 void checkOnlySignalsEndWaits(const PurgeStory& story, Findings& findings);
+void checkTheLastReplySignals(const PurgeStory& story, Findings& findings);
 
 // Shares.
 void checkSharesAreEqualParts(const PurgeStory& story, Findings& findings);

@@ -1,6 +1,7 @@
 #include "sim/invariants/purge_story.h"
 
 #include <algorithm>
+#include <string_view>
 
 namespace spacekeep::sim {
 namespace {
@@ -67,8 +68,7 @@ int PurgeStory::inFlightBefore(std::size_t operation, const std::string& service
   return count;
 }
 
-bool PurgeStory::wasIdle(std::size_t operation, std::size_t first, std::size_t last,
-                         bool asked_only) const {
+std::map<std::size_t, int> PurgeStory::flightChanges(std::size_t operation, bool asked_only) const {
   std::map<std::size_t, int> changes;
   for (const ShareTask& task : tasks) {
     const bool counts = task.operation == operation && task.added && task.share &&
@@ -81,15 +81,43 @@ bool PurgeStory::wasIdle(std::size_t operation, std::size_t first, std::size_t l
   for (const Failure& failure : failures) {
     if (failure.operation == operation) --changes[failure.removing_at];
   }
+  return changes;
+}
+
+bool PurgeStory::wasIdle(std::size_t operation, std::size_t first, std::size_t last,
+                         bool asked_only) const {
   int count = 0;
   bool idle = true;
-  for (const auto& [at, change] : changes) {
+  for (const auto& [at, change] : flightChanges(operation, asked_only)) {
     if (at > last) break;
     if (at > first && idle) return true;
     count += change;
     idle = count <= 0;
   }
   return idle;
+}
+
+bool PurgeStory::staysIdle(std::size_t operation, std::size_t first, std::size_t last) const {
+  int count = 0;
+  for (const auto& [at, change] : flightChanges(operation, false)) {
+    if (at > last) break;
+    if (at > first && count > 0) return false;
+    count += change;
+  }
+  return count <= 0;
+}
+
+std::pair<int, int> PurgeStory::inFlightBetween(std::size_t operation, std::size_t first,
+                                                std::size_t last) const {
+  int count = 0;
+  std::optional<std::pair<int, int>> range;
+  for (const auto& [at, change] : flightChanges(operation, false)) {
+    if (at > last) break;
+    if (at > first && !range) range = {count, count};
+    count += change;
+    if (range) range = {std::min(range->first, count), std::max(range->second, count)};
+  }
+  return range.value_or(std::pair{count, count});
 }
 
 bool PurgeStory::mayFinishEarly(const Operation& operation) const {
@@ -99,12 +127,18 @@ bool PurgeStory::mayFinishEarly(const Operation& operation) const {
   return run.may_finish_early_by_default;
 }
 
+// Services get the request back, with what the purge has written into its outcome by then.
 bool isRequestOf(const Operation& operation, const Dictionary& request) {
-  for (const char* key : {"SPACEKEEP_TOKEN", "SPACEKEEP_VOLUME"}) {
-    const Value* own = operation.request.find(key);
+  static const std::set<std::string_view> kWritten = {
+      "SPACEKEEP_AMOUNT", "SPACEKEEP_AMOUNT_REPORTED", "SPACEKEEP_ELAPSED_TIME",
+      "SPACEKEEP_FREESPACE_BEGIN", "SPACEKEEP_FREESPACE_END"};
+  for (const auto& [key, value] : operation.request) {
     const Value* other = request.find(key);
-    if ((own == nullptr) != (other == nullptr)) return false;
-    if (own != nullptr && *own != *other) return false;
+    if (!kWritten.contains(key) && (other == nullptr || *other != value)) return false;
+  }
+  for (const auto& [key, value] : request) {
+    const bool is_written = kWritten.contains(key) || key.ends_with("_OPERATION_INFO");
+    if (!is_written && !operation.request.contains(key)) return false;
   }
   return unsignedAt(request, "SPACEKEEP_FREESPACE_BEGIN") == operation.free_at_begin;
 }
@@ -120,6 +154,15 @@ PurgeView viewOf(const PurgeRun& run) {
   }
   view.asked_twice = run.asked_twice;
   return view;
+}
+
+// One write may be under way at the beginning of the span, and one at its end.
+std::uint64_t PurgeStory::writingNs(std::size_t first, std::size_t last) const {
+  std::uint64_t writes = 2;
+  for (std::size_t at = first; at <= last && at < run.events.size(); ++at) {
+    if (std::holds_alternative<DiskWritten>(run.events[at].body)) ++writes;
+  }
+  return writes * run.disk_write_ns;
 }
 
 std::string PurgeStory::name(const Operation& operation) const {

@@ -11,6 +11,7 @@
 #include <set>
 #include <span>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "sim/scenarios/purge_run.h"
@@ -31,6 +32,8 @@ struct PurgeView {
   bool cut = false;  ///< the process was killed, or stands still: what was begun may lack its end
   /// In a life of the whole daemon: requests that do not say it may end as soon as they can.
   bool may_finish_early_by_default = false;
+  /// A write to the disk takes that long, and may keep the thread busy that a purge needs next.
+  std::uint64_t disk_write_ns = 0;
 };
 
 [[nodiscard]] PurgeView viewOf(const PurgeRun& run);
@@ -142,9 +145,21 @@ struct PurgeStory {
   /// with a share of 0 has nothing to answer; `asked_only` leaves those out.
   [[nodiscard]] bool wasIdle(std::size_t operation, std::size_t first, std::size_t last,
                              bool asked_only) const;
+  /// Whether nobody was in flight at any moment from just after `first` to `last`.
+  [[nodiscard]] bool staysIdle(std::size_t operation, std::size_t first, std::size_t last) const;
+  /// The fewest and the most in flight from `first` to `last`.
+  [[nodiscard]] std::pair<int, int> inFlightBetween(std::size_t operation, std::size_t first,
+                                                    std::size_t last) const;
+  /// How long writes to the disk may hold up a purge in that span.
+  [[nodiscard]] std::uint64_t writingNs(std::size_t first, std::size_t last) const;
   [[nodiscard]] std::string name(const Operation& operation) const;
   /// Asked for by the request, or by the client state for requests that say nothing.
   [[nodiscard]] bool mayFinishEarly(const Operation& operation) const;
+
+ private:
+  /// By how many the in-flight set grows or shrinks, by position.
+  [[nodiscard]] std::map<std::size_t, int> flightChanges(std::size_t operation,
+                                                         bool asked_only) const;
 };
 
 /// Whether the operation named what it is about as `request` does: token, volume and free space.

@@ -145,11 +145,20 @@ class Reader {
     task.last_at = at;
   }
 
+  [[nodiscard]] bool isNextStepOf(std::size_t index, const std::string& service) const {
+    if (index == kNowhere) return false;
+    const ShareTask& task = story_.tasks[index];
+    return task.service == service && task.share && task.adding_at == kNowhere;
+  }
+
   void inFlight(std::size_t at, ThreadState& state, const LogLine& line) {
     const std::string service = textField(line, 2);
     if (textField(line, 1) == "adding") {
-      if (state.task == kNowhere || story_.tasks[state.task].service != service) {
-        story_.oddities.push_back("an addition outside of a share computation: " + service);
+      if (!isNextStepOf(state.task, service)) {
+        // Queries and periodic passes add services to sets of their own.
+        if (story_.run.scenario != nullptr) {
+          story_.oddities.push_back("an addition outside of a share computation: " + service);
+        }
         return;
       }
       ShareTask& task = story_.tasks[state.task];
@@ -238,8 +247,23 @@ class Reader {
     }
   }
 
+  // An answer without a dictionary does not say which call it is for: it is for the last one that the
+  // service has answered.
+  [[nodiscard]] std::uint64_t callOfUnnamed(const Reply& reply) const {
+    std::uint64_t call = 0;
+    for (std::size_t at = 0; at < reply.booked_at; ++at) {
+      const auto* answered = std::get_if<ServiceAnswered>(&story_.run.events[at].body);
+      if (answered == nullptr || answered->service != reply.service) continue;
+      if (answered->member == "servicePurge" && asked_.contains(answered->call)) {
+        call = answered->call;
+      }
+    }
+    return call;
+  }
+
   void attributeReplies() {
     for (Reply& reply : story_.replies) {
+      if (reply.call == 0) reply.call = callOfUnnamed(reply);
       // The process was killed before the reply was told apart from others.
       if (reply.call == 0 && story_.run.cut) continue;
       const auto asked = asked_.find(reply.call);
@@ -314,6 +338,11 @@ class Reader {
     return count;
   }
 
+  [[nodiscard]] bool anyIsBlurred() const {
+    return std::any_of(story_.operations.begin(), story_.operations.end(),
+                       [](const Operation& operation) { return operation.blurred; });
+  }
+
   void attributeFailures() {
     for (Failure& failure : story_.failures) {
       if (failure.removing_at == kNowhere) continue;
@@ -324,6 +353,7 @@ class Reader {
         }
       }
       if (possible.empty()) {
+        if (anyIsBlurred()) continue;
         story_.oddities.push_back("a failure of " + failure.service + ", which was not in flight");
         continue;
       }

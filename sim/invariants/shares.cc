@@ -141,6 +141,49 @@ std::size_t firstWake(const PurgeStory& story, std::size_t index) {
   return first;
 }
 
+/// Replies that fell short between two positions: those that surely and those that possibly did.
+std::pair<std::uint64_t, std::uint64_t> shortRepliesWithin(const PurgeStory& story,
+                                                           std::size_t operation,
+                                                           std::size_t first_possible,
+                                                           std::size_t first_sure,
+                                                           const ShareTask& task) {
+  std::uint64_t surely = 0;
+  std::uint64_t possibly = 0;
+  for (const Reply& reply : story.replies) {
+    if (reply.operation != operation || metItsShare(reply)) continue;
+    if (reply.booked_at > first_sure && reply.completion_at < task.at) ++surely;
+    if (reply.completion_at > first_possible && reply.booked_at < task.share->at) ++possibly;
+  }
+  return {surely, possibly};
+}
+
+// From the second urgency on the divisor starts as the number of services that are not in flight at
+// the end of the wait before.
+void checkLaterDivisors(const PurgeStory& story, std::size_t index, std::size_t pass_index,
+                        Findings& findings) {
+  const Operation& operation = story.operations[index];
+  const Pass& pass = operation.passes[pass_index];
+  const Pass& before = operation.passes[pass_index - 1];
+  const std::size_t waited_at =
+      before.timed_out_at == kNowhere ? before.waiting_at : before.timed_out_at;
+  const std::size_t end = std::min(pass.timed_out_at, pass.stats_at);
+  const auto [fewest, most] = story.inFlightBetween(index, waited_at, before.stats_at);
+  const auto services = static_cast<std::int64_t>(operation.services.size());
+  for (const ShareTask* task : tasksOf(story, index)) {
+    if (!task->share || task->at < pass.asked_at || task->share->at > end) continue;
+    const auto [surely, possibly] =
+        shortRepliesWithin(story, index, waited_at, before.stats_at, *task);
+    const std::int64_t least = services - most - static_cast<std::int64_t>(possibly);
+    const std::int64_t largest = services - fewest - static_cast<std::int64_t>(surely);
+    const auto divisor = static_cast<std::int64_t>(task->share->divisor);
+    if (least <= 0 || (divisor >= least && divisor <= largest)) continue;
+    findings.push_back("the divisor of " + task->service + " was " + std::to_string(divisor) +
+                       " at urgency " + std::to_string(pass.urgency) + ", with " +
+                       std::to_string(least) + " to " + std::to_string(largest) +
+                       " services that can still give");
+  }
+}
+
 }  // namespace
 
 void checkSharesAreEqualParts(const PurgeStory& story, Findings& findings) {
@@ -239,6 +282,15 @@ void checkDivisor(const PurgeStory& story, Findings& findings) {
                        " with " + std::to_string(services) + " services, of which " +
                        std::to_string(surely) + " to " + std::to_string(possibly) +
                        " had fallen short");
+  }
+  for (std::size_t index = 0; index < story.operations.size(); ++index) {
+    const Operation& operation = story.operations[index];
+    if (operation.blurred || operation.end_at == kNowhere) continue;
+    for (std::size_t pass = 1; pass < operation.passes.size(); ++pass) {
+      if (operation.passes[pass].asked_at != kNowhere) {
+        checkLaterDivisors(story, index, pass, findings);
+      }
+    }
   }
 }
 

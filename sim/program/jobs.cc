@@ -5,6 +5,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
@@ -16,7 +17,8 @@
 namespace spacekeep::sim {
 namespace {
 
-constexpr std::uint64_t kMostLinesPrinted = 50;
+constexpr std::uint64_t kMostStoriesPrinted = 50;
+constexpr char kLineBreak = '\x1f';
 
 /// A child process and what it has said so far.
 struct Job {
@@ -44,10 +46,16 @@ void writeLine(int output, std::string line) {
   }
 }
 
+// A story has several lines; it goes through the pipe as one, so that those of two processes do not
+// mix.
+std::string onOneLine(std::string story) {
+  std::replace(story.begin(), story.end(), '\n', kLineBreak);
+  return story;
+}
+
 [[noreturn]] void work(const Options& options, unsigned index, int output) {
-  const Played played =
-      playSeeds(options.first + index, options.first + options.seeds, options.jobs,
-                [&](const std::string& line) { writeLine(output, line); });
+  const Played played = playSeeds(
+      options, index, [&](const std::string& story) { writeLine(output, onOneLine(story)); });
   writeLine(output, "= " + std::to_string(played.runs) + " " + std::to_string(played.failed) + " " +
                         std::to_string(played.repeated) + " " + std::to_string(played.steps) + " " +
                         std::to_string(played.virtual_seconds));
@@ -67,7 +75,7 @@ Job startJob(const Options& options, unsigned index) {
   return {process, ends[0], {}};
 }
 
-/// Adds up the summary line of a job, prints any other line.
+/// Adds up the summary line of a job, prints any other line, which is a story.
 void takeLine(const std::string& line, Played& total, std::uint64_t& printed) {
   unsigned long long runs = 0;
   unsigned long long failed = 0;
@@ -81,8 +89,10 @@ void takeLine(const std::string& line, Played& total, std::uint64_t& printed) {
     total.repeated += repeated;
     total.steps += steps;
     total.virtual_seconds += seconds;
-  } else if (printed++ < kMostLinesPrinted) {
-    std::printf("%s\n", line.c_str());
+  } else if (printed++ < kMostStoriesPrinted) {
+    std::string story = line;
+    std::replace(story.begin(), story.end(), kLineBreak, '\n');
+    std::printf("%s\n", story.c_str());
     std::fflush(stdout);
   }
 }
@@ -146,6 +156,11 @@ int playInProcesses(const Options& options) {
   readAll(jobs, total);
   const unsigned lost = reap(jobs);
   const double seconds = secondsNow() - start;
+  if (options.stop_at_first && total.failed != 0) {
+    // The other processes go on to their own first failure: which seed it is must not depend on
+    // who is faster.
+    std::printf("stopped at the first failure of each process\n");
+  }
   std::printf(
       "%llu schedules, %llu failed, %llu played twice; %llu steps, %llu virtual s; %.1f s, "
       "%.0f schedules/s on %u processes\n",
@@ -153,7 +168,8 @@ int playInProcesses(const Options& options) {
       static_cast<unsigned long long>(total.repeated), static_cast<unsigned long long>(total.steps),
       static_cast<unsigned long long>(total.virtual_seconds), seconds,
       static_cast<double>(total.runs) / seconds, options.jobs);
-  return total.failed == 0 && lost == 0 && total.runs == options.seeds ? 0 : 1;
+  const bool all_played = total.runs == options.seeds;
+  return total.failed == 0 && lost == 0 && all_played ? 0 : 1;
 }
 
 }  // namespace spacekeep::sim

@@ -18,6 +18,6 @@ int main(int count, char** arguments) {
     std::fputs(sim::kHelp, stdout);
     return 0;
   }
-  if (options.replay) return sim::replaySeed(*options.replay) ? 0 : 1;
+  if (options.replay) return sim::replaySeed(options) ? 0 : 1;
   return sim::playInProcesses(options);
 }

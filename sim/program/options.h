@@ -3,6 +3,7 @@
 // The command line of spacekeep-sim.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -11,11 +12,19 @@
 
 namespace spacekeep::sim {
 
+enum class Scenario {
+  kSystem,  ///< the whole daemon
+  kPurge,   ///< purges alone
+};
+
 struct Options {
+  Scenario scenario = Scenario::kSystem;
   std::uint64_t seeds = 1000;
   std::uint64_t first = 1;
   unsigned jobs = 2;
+  bool stop_at_first = false;
   std::optional<std::uint64_t> replay;
+  std::vector<std::size_t> without;  ///< elements of the replayed plan to leave out, ascending
   bool help = false;
 };
 
@@ -31,10 +40,15 @@ struct OptionError {
 
 inline constexpr const char* kHelp =
     "spacekeep-sim [--seeds N] [--first S] [--jobs J]   play seeds S to S + N - 1 (1000 from 1)\n"
-    "spacekeep-sim --replay SEED                        play one seed and print what happened\n"
+    "spacekeep-sim --replay SEED [--without LIST]       play one seed and tell what happened\n"
+    "  --scenario system|purge   the whole daemon (as it is without this), or purges alone\n"
+    "  --stop                    end at the first failure\n"
+    "  --without 0,3,7           leave out these elements of the plan, as a failure tells\n"
     "\n"
-    "Each seed stands for one scenario and one schedule. The status is 0 when every invariant "
-    "held\n"
-    "in every run, 1 when one did not, 2 for a wrong command line.\n";
+    "Each seed stands for one plan and one schedule. Every hundredth seed is played twice, and "
+    "both\n"
+    "runs must be the same. A failing plan is made smaller before it is shown. The status is 0 "
+    "when\n"
+    "every invariant held in every run, 1 when one did not, 2 for a wrong command line.\n";
 
 }  // namespace spacekeep::sim

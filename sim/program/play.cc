@@ -1,8 +1,9 @@
 #include "sim/program/play.h"
 
+#include <algorithm>
 #include <cstdio>
 
-#include "sim/invariants/invariants.h"
+#include "sim/program/one_run.h"
 #include "sim/scenarios/purge_run.h"
 
 namespace spacekeep::sim {
@@ -10,22 +11,66 @@ namespace {
 
 // So many runs for each that is played a second time, to see that a seed means one run only.
 constexpr std::uint64_t kRepeatEvery = 100;
+// Making a plan smaller takes a run for each attempt; the first few failures tell the most.
+constexpr unsigned kMaxShrinkRuns = 300;
+constexpr std::uint64_t kMostShrunk = 3;
 
-std::string firstProblem(const PurgeRun& run) {
-  const auto violations = judge(run);
-  if (violations.empty()) return {};
-  const std::string more =
-      violations.size() == 1 ? "" : " (and " + std::to_string(violations.size() - 1) + " more)";
-  return violations.front().invariant + ": " + violations.front().text + more;
+constexpr const char* kNotTheSame = "a seed means one run";
+
+std::string listOf(const std::vector<std::size_t>& numbers) {
+  std::string list;
+  for (const std::size_t number : numbers) {
+    list += (list.empty() ? "" : ",") + std::to_string(number);
+  }
+  return list;
 }
 
-std::string differenceOnRepeat(std::uint64_t seed, const PurgeRun& run) {
-  const PurgeRun again = runPurgeScenario(seed);
-  if (again.report.trace_hash == run.report.trace_hash &&
-      again.events.size() == run.events.size()) {
-    return {};
+std::string replayLine(const Options& options, std::uint64_t seed,
+                       const std::vector<std::size_t>& without) {
+  std::string line = "./dev sim --replay " + std::to_string(seed);
+  if (options.scenario == Scenario::kPurge) line += " --scenario purge";
+  if (!without.empty()) line += " --without " + listOf(without);
+  return line;
+}
+
+/// By the name of the invariant that is violated first.
+std::vector<std::size_t> shrunkPlan(const Options& options, std::uint64_t seed,
+                                    const std::string& invariant) {
+  const std::size_t elements = elementsOf(options.scenario, seed);
+  const auto fails = [&](const Kept& kept) {
+    const Verdict verdict = playOnce(options.scenario, seed, complementOf(kept, elements));
+    return std::any_of(verdict.violations.begin(), verdict.violations.end(),
+                       [&](const Violation& one) { return one.invariant == invariant; });
+  };
+  return complementOf(shrink(elements, fails, kMaxShrinkRuns).kept, elements);
+}
+
+const Violation& violationOf(const Verdict& verdict, const std::string& invariant) {
+  const auto same = std::find_if(verdict.violations.begin(), verdict.violations.end(),
+                                 [&](const Violation& one) { return one.invariant == invariant; });
+  return same == verdict.violations.end() ? verdict.violations.front() : *same;
+}
+
+std::string storyOf(const Options& options, std::uint64_t seed, const Verdict& verdict,
+                    bool shrinks) {
+  const Violation& first = verdict.violations.front();
+  std::string story = "FAILED seed " + std::to_string(seed) + ": " + first.invariant + ": " +
+                      first.text + "\n  " + replayLine(options, seed, {});
+  if (!shrinks || first.invariant == kNotTheSame) return story;
+  const auto without = shrunkPlan(options, seed, first.invariant);
+  if (without.empty()) return story;
+  const Verdict smaller = playOnce(options.scenario, seed, without);
+  story += "\nmade smaller:\n" + planText(options.scenario, seed, without);
+  if (!smaller.violations.empty()) {
+    story += first.invariant + ": " + violationOf(smaller, first.invariant).text + "\n";
   }
-  return "a seed means one run: the second run of this seed went another way";
+  return story + "  " + replayLine(options, seed, without);
+}
+
+void compareWithSecondRun(const Options& options, std::uint64_t seed, Verdict& verdict) {
+  const Verdict again = playOnce(options.scenario, seed);
+  if (again.hash == verdict.hash && again.events == verdict.events) return;
+  verdict.violations.push_back({kNotTheSame, "the second run of this seed went another way"});
 }
 
 const char* strategyName(const rt::ScheduleOptions& options) {
@@ -34,43 +79,43 @@ const char* strategyName(const rt::ScheduleOptions& options) {
 
 }  // namespace
 
-Played playSeeds(std::uint64_t first, std::uint64_t end, std::uint64_t stride,
-                 const std::function<void(const std::string& line)>& tell) {
+Played playSeeds(const Options& options, unsigned index,
+                 const std::function<void(const std::string& story)>& tell) {
   Played played;
-  for (std::uint64_t seed = first; seed < end; seed += stride) {
-    const PurgeRun run = runPurgeScenario(seed);
+  const std::uint64_t end = options.first + options.seeds;
+  for (std::uint64_t seed = options.first + index; seed < end; seed += options.jobs) {
+    Verdict verdict = playOnce(options.scenario, seed);
     ++played.runs;
-    played.steps += run.report.steps;
-    played.virtual_seconds += run.report.virtual_ns / 1'000'000'000;
-    std::string problem = firstProblem(run);
-    if (problem.empty() && seed % kRepeatEvery == 0) {
+    played.steps += verdict.steps;
+    played.virtual_seconds += verdict.virtual_ns / 1'000'000'000;
+    if (verdict.violations.empty() && seed % kRepeatEvery == 0) {
       ++played.repeated;
-      problem = differenceOnRepeat(seed, run);
+      compareWithSecondRun(options, seed, verdict);
     }
-    if (problem.empty()) continue;
+    if (verdict.violations.empty()) continue;
     ++played.failed;
-    tell("FAILED seed " + std::to_string(seed) + ", replay with --replay " + std::to_string(seed) +
-         ": " + problem);
+    const bool shrinks = !options.stop_at_first && played.failed <= kMostShrunk;
+    tell(storyOf(options, seed, verdict, shrinks));
+    if (options.stop_at_first) break;
   }
   return played;
 }
 
-bool replaySeed(std::uint64_t seed) {
-  const PurgeRun run = runPurgeScenario(seed);
-  const rt::ScheduleOptions options = scheduleFor(seed);
+bool replaySeed(const Options& options) {
+  const std::uint64_t seed = *options.replay;
   std::printf("seed %llu, %s schedule\n%s\n", static_cast<unsigned long long>(seed),
-              strategyName(options), textOf(run.scenario).c_str());
-  for (const Event& event : run.events) std::printf("%s\n", textOfEvent(event).c_str());
+              strategyName(scheduleFor(seed)),
+              planText(options.scenario, seed, options.without).c_str());
+  const Verdict verdict = tellRun(options.scenario, seed, options.without);
   std::printf("\n%llu steps, %.3f virtual seconds, trace hash %016llx\n",
-              static_cast<unsigned long long>(run.report.steps),
-              static_cast<double>(run.report.virtual_ns) / 1e9,
-              static_cast<unsigned long long>(run.report.trace_hash));
-  const auto violations = judge(run);
-  for (const Violation& violation : violations) {
+              static_cast<unsigned long long>(verdict.steps),
+              static_cast<double>(verdict.virtual_ns) / 1e9,
+              static_cast<unsigned long long>(verdict.hash));
+  for (const Violation& violation : verdict.violations) {
     std::printf("VIOLATED %s: %s\n", violation.invariant.c_str(), violation.text.c_str());
   }
-  if (violations.empty()) std::printf("all invariants hold\n");
-  return violations.empty();
+  if (verdict.violations.empty()) std::printf("all invariants hold\n");
+  return verdict.violations.empty();
 }
 
 }  // namespace spacekeep::sim

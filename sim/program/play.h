@@ -7,6 +7,8 @@
 #include <functional>
 #include <string>
 
+#include "sim/program/options.h"
+
 namespace spacekeep::sim {
 
 struct Played {
@@ -17,11 +19,12 @@ struct Played {
   std::uint64_t virtual_seconds = 0;
 };
 
-/// Plays first, first + stride, ... below `end`. `tell` gets one line for each failed seed.
-Played playSeeds(std::uint64_t first, std::uint64_t end, std::uint64_t stride,
-                 const std::function<void(const std::string& line)>& tell);
+/// Plays the seeds of the options that are `index` modulo their number of jobs. `tell` gets the
+/// story of each failed seed, of several lines.
+Played playSeeds(const Options& options, unsigned index,
+                 const std::function<void(const std::string& story)>& tell);
 
-/// Plays one seed and prints scenario, events and verdict. Answers whether all invariants held.
-bool replaySeed(std::uint64_t seed);
+/// Plays one seed and prints plan, events and verdict. Answers whether all invariants held.
+bool replaySeed(const Options& options);
 
 }  // namespace spacekeep::sim

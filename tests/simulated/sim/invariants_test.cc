@@ -130,6 +130,17 @@ const Fault kWaits[] = {
                           [](const LogLine& one) { return textField(one, 1) == "removing"; }),
                    signalLine());
      }},
+    {"the last reply of a purge that waits signals it", "a signal after the end of the purge",
+     [](PurgeRun& run) {
+       const std::size_t end = lineAt(run, formats::kResult);
+       const Event result = run.events[end];
+       drop(run, end);
+       const std::size_t removal = lineAt(run, formats::kInFlight, 0, [](const LogLine& one) {
+         return textField(one, 1) == "removing";
+       });
+       insertAfter(run, removal, signalLine());
+       run.events.insert(run.events.begin() + static_cast<std::ptrdiff_t>(removal), result);
+     }},
 };
 
 // Shares.

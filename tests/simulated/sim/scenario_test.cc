@@ -55,8 +55,14 @@ TEST(PurgeRun, ASeedMeansOneRun) {
 
 TEST(PurgeRun, EveryInvariantHoldsInTheFirstSeeds) {
   std::vector<std::string> failures;
+  const Options options{.scenario = Scenario::kPurge,
+                        .seeds = 300,
+                        .first = 1,
+                        .jobs = 1,
+                        .replay = {},
+                        .without = {}};
   const Played played =
-      playSeeds(1, 301, 1, [&](const std::string& line) { failures.push_back(line); });
+      playSeeds(options, 0, [&](const std::string& story) { failures.push_back(story); });
   EXPECT_EQ(played.runs, 300U);
   EXPECT_EQ(played.repeated, 3U);
   EXPECT_TRUE(failures.empty()) << failures.front();
@@ -67,7 +73,27 @@ TEST(Options, DefaultsAreAThousandSeedsOnTwoProcesses) {
   EXPECT_EQ(options.seeds, 1000U);
   EXPECT_EQ(options.first, 1U);
   EXPECT_EQ(options.jobs, 2U);
+  EXPECT_EQ(options.scenario, Scenario::kSystem);
+  EXPECT_FALSE(options.stop_at_first);
   EXPECT_FALSE(options.replay);
+}
+
+TEST(Options, ElementsToLeaveOutAreAListOfNumbersInAnyOrder) {
+  const auto options = std::get<Options>(parseOptions({"--replay", "7", "--without", "9,0,12,9"}));
+  EXPECT_EQ(options.without, (std::vector<std::size_t>{0, 9, 12}));
+}
+
+TEST(Options, ElementsCanOnlyBeLeftOutOfAReplay) {
+  const auto parsed = parseOptions({"--without", "1"});
+  const auto* error = std::get_if<OptionError>(&parsed);
+  ASSERT_NE(error, nullptr);
+  EXPECT_EQ(error->text, "--without goes with --replay: see --help");
+}
+
+TEST(Options, TheScenarioIsOneOfTwo) {
+  EXPECT_EQ(std::get<Options>(parseOptions({"--scenario", "purge"})).scenario, Scenario::kPurge);
+  EXPECT_EQ(std::get<Options>(parseOptions({"--scenario", "system"})).scenario, Scenario::kSystem);
+  EXPECT_TRUE(std::get<Options>(parseOptions({"--stop"})).stop_at_first);
 }
 
 TEST(Options, AreReadInAnyOrder) {
@@ -87,6 +113,8 @@ TEST(Options, WhatCannotBeUsedIsNamed) {
                                              {"--jobs", "0"},
                                              {"--jobs", "65"},
                                              {"--speed", "1"},
+                                             {"--scenario", "everything"},
+                                             {"--without", "1,x"},
                                              {"--replay", "3x"}}) {
     const auto parsed = parseOptions(wrong);
     const auto* error = std::get_if<OptionError>(&parsed);

@@ -3,8 +3,10 @@
 #include <spacekeep/client.h>
 #include <spacekeep/service.h>
 
+#include <algorithm>
 #include <atomic>
 #include <fstream>
+#include <functional>
 #include <memory>
 #include <regex>
 #include <string>
@@ -67,6 +69,26 @@ Footprint footprintOf(pid_t pid) {
   return footprint;
 }
 
+/// The most that the process has had until `done`, or for two minutes.
+Footprint peakUntil(pid_t pid, const std::function<bool()>& done) {
+  Footprint peak;
+  for (int i = 0; i < 12000 && !done(); ++i) {
+    const Footprint now = footprintOf(pid);
+    peak.threads = std::max(peak.threads, now.threads);
+    peak.resident_kib = std::max(peak.resident_kib, now.resident_kib);
+    rt::sleepNs(10'000'000);
+  }
+  return peak;
+}
+
+void connectAll(const std::string& socket_path, std::vector<sdk::Client>& clients) {
+  for (int i = 0; i < kConnections; ++i) {
+    auto client = sdk::Client::connect({.socket_path = socket_path, .on_disconnect = {}});
+    ASSERT_TRUE(client) << client.error().text;
+    clients.push_back(std::move(*client));
+  }
+}
+
 TEST(Flood, TwoThousandPurgesFromTwoHundredConnectionsAreAllAnsweredInBoundedSpace) {
   Sandbox sandbox;
   sandbox.addVolume("tmp", "tmpfs", 64);
@@ -81,11 +103,7 @@ TEST(Flood, TwoThousandPurgesFromTwoHundredConnectionsAreAllAnsweredInBoundedSpa
   ASSERT_TRUE(sandbox.waitForText("/tmp/daemon.log", "ping got pong"));
 
   std::vector<sdk::Client> clients;
-  for (int i = 0; i < kConnections; ++i) {
-    auto client = sdk::Client::connect({.socket_path = sandbox.socketPath(), .on_disconnect = {}});
-    ASSERT_TRUE(client) << client.error().text;
-    clients.push_back(std::move(*client));
-  }
+  ASSERT_NO_FATAL_FAILURE(connectAll(sandbox.socketPath(), clients));
   // One purge that waits out its urgencies holds the purge queue while the others arrive.
   std::atomic<int> answered{0};
   std::atomic<int> reached{0};
@@ -116,14 +134,8 @@ TEST(Flood, TwoThousandPurgesFromTwoHundredConnectionsAreAllAnsweredInBoundedSpa
   for (int i = 0; i < kPurgesEach; ++i) {
     for (sdk::Client& client : clients) client.purgeAsync(one, book);
   }
-  Footprint peak;
   const int expected = kConnections * kPurgesEach + 1;
-  for (int i = 0; i < 12000 && answered < expected; ++i) {
-    const Footprint now = footprintOf(daemon.pid());
-    peak.threads = std::max(peak.threads, now.threads);
-    peak.resident_kib = std::max(peak.resident_kib, now.resident_kib);
-    rt::sleepNs(10'000'000);
-  }
+  const Footprint peak = peakUntil(daemon.pid(), [&] { return answered >= expected; });
   EXPECT_EQ(answered, expected);
   EXPECT_EQ(reached, expected - 1) << shortfalls.get();
   EXPECT_LE(peak.threads, 100);

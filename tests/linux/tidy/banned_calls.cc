@@ -16,7 +16,7 @@ LineRule calls(std::string name, Where where, std::vector<std::string> words, st
 std::vector<LineRule> ofTheCLibrary() {
   LineRule unbounded = calls("UnboundedCopies", Where::kAllCode,
                              {"strcpy", "strcat", "stpcpy", "strncpy", "strncat", "sprintf",
-                              "vsprintf", "gets", "strtok", "alloca"},
+                              "vsprintf", "strtok", "alloca"},
                              "std::string and fmt::format");
   unbounded.planted = {"strcpy(a, b);", "  std::strncpy(a, b, 3);", "return ::sprintf(a, b);"};
   unbounded.harmless = {"text.gets(3);", "a->strcpy(b);",          "own::strcpy(b);",

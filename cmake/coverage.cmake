@@ -3,7 +3,8 @@
 # the programs, so a daemon that a test starts with an empty environment and a root of its own counts
 # too: /dev is the one directory that such a root has in common with the machine. The counts live in a
 # shared mapping of a file there (%c, which needs the relocation), so those of a killed process stay;
-# %m: one file per program, for all its processes.
+# %m: one file per program, for all its processes. Counted atomically: a line's count may be the
+# difference of two, which a lost one would turn into none.
 set(SPACEKEEP_COVERAGE "" CACHE PATH "Where programs keep their counts of executed code")
 if(SPACEKEEP_COVERAGE)
   set(list ${CMAKE_BINARY_DIR}/counted_sources.list)
@@ -13,7 +14,7 @@ if(SPACEKEEP_COVERAGE)
   endforeach()
   file(CONFIGURE OUTPUT ${list} CONTENT "${text}" @ONLY)
   set(counts "-fprofile-instr-generate=${SPACEKEEP_COVERAGE}/%m%c.profraw")
-  add_compile_options(${counts} -fcoverage-mapping -fprofile-list=${list}
+  add_compile_options(${counts} -fcoverage-mapping -fprofile-list=${list} -fprofile-update=atomic
                       "SHELL:-mllvm -runtime-counter-relocation")
   string(APPEND CMAKE_EXE_LINKER_FLAGS " -fprofile-instr-generate")
 endif()

@@ -53,7 +53,8 @@ class Trial:
         text = drawing.mutated(original, mutant)
         if text is None:
             return ledger.NOT_A_MUTANT, 'the line is no longer there'
-        asked = suite.asked_about(mutant.file, mutant.line, self._reach.lines, list(self._reach.lines))
+        asked = suite.asked_about(mutant.file, mutant.line, self._reach.lines,
+                                  [program for program in self._reach.lines if self._reach.is_sound(program)])
         self._undo.write_text(json.dumps([str(path), original]), encoding='utf-8')
         path.write_text(text, encoding='utf-8')
         try:
@@ -74,7 +75,7 @@ class Trial:
                     return ledger.NOT_A_MUTANT, 'does not compile'
                 slow = self._reach.slow_tests_of(program)
                 quick_seconds = max(0.0, self._reach.seconds.get(program, 10.0) - sum(slow.values()))
-                found = self._ask(program, linked, quick_seconds, '-' + ':'.join(slow) if slow else '')
+                found = self._ask(program, linked, quick_seconds, self._all_but([*slow, *self._reach.failed_tests_of(program)]))
                 if found is not None:
                     return ledger.CAUGHT, found
             for program in asked:
@@ -98,6 +99,10 @@ class Trial:
             self._build.link(part, mine, self._objects)
             linked.append(part)
         return True
+
+    @staticmethod
+    def _all_but(tests):
+        return '-' + ':'.join(tests) if tests else ''
 
     def _ask(self, program, linked, usual_seconds, tests):
         if not any(part in linked for part in self._reach.parts_of(program)):

@@ -9,6 +9,7 @@ sys.path.insert(0, str(pathlib.Path(__file__).resolve().parent))
 import building  # noqa: E402
 import drawing  # noqa: E402
 import ledger  # noqa: E402
+import reaching  # noqa: E402
 import suite  # noqa: E402
 from cpp_tokens import tokens_of  # noqa: E402
 from mutants import places_of  # noqa: E402
@@ -136,6 +137,28 @@ class Asking(unittest.TestCase):
         reach = {program: {'purge/a.cc': ({1}, set())} for program in self.PROGRAMS}
         reach['tests/test_both_threads_purge'] = {'purge/a.cc': ({1}, {1})}
         self.assertEqual(suite.asked_about('purge/a.cc', 1, reach, self.PROGRAMS), ['tests/test_both_threads_purge'])
+
+
+class WithoutAMutant(unittest.TestCase):
+    def log_says(self, text):
+        folder = tempfile.TemporaryDirectory()
+        self.addCleanup(folder.cleanup)
+        kept = pathlib.Path(folder.name, 'coverage', 'test_x')
+        kept.mkdir(parents=True)
+        (kept / 'log').write_text(text, encoding='utf-8')
+        reach = reaching.Reach.__new__(reaching.Reach)
+        reach._build = pathlib.Path(folder.name)
+        return reach
+
+    def test_a_test_that_failed_then_catches_nothing(self):
+        reach = self.log_says('[ RUN      ] A.B\n[  FAILED  ] A.B (7 ms)\n[ RUN      ] A.C\n[       OK ] A.C (3500 ms)\n'
+                              '[==========] 2 tests\n[  FAILED  ] 1 test, listed below:\n[  FAILED  ] A.B\n')
+        self.assertTrue(reach.is_sound('tests/test_x'))
+        self.assertEqual(reach.failed_tests_of('tests/test_x'), ['A.B'])
+        self.assertEqual(reach.slow_tests_of('tests/test_x'), {'A.C': 3.5})
+
+    def test_a_program_that_did_not_end_is_not_asked(self):
+        self.assertFalse(self.log_says('[==========] Running 2 tests\n[ RUN      ] A.B\n').is_sound('tests/test_x'))
 
 
 TOY_LIBRARY = '''int least(int a, int b);

@@ -30,11 +30,22 @@ class Reach:
             return [program]
         return [part for part in STARTED if (self._build / part).exists()] + [program]
 
+    def is_sound(self, program):
+        """False for a program that did not come to its end in the coverage run: it would catch everything."""
+        return pathlib.Path(program).name == 'spacekeep-sim' or '[==========] ' in self._log_of(program).split('[ RUN ')[-1]
+
+    def failed_tests_of(self, program):
+        """Tests that failed without a mutant and so say nothing."""
+        return sorted(set(re.findall(r'^\[  FAILED  \] ([^\s,]+\.[^\s,]+)', self._log_of(program), re.MULTILINE)))
+
     def slow_tests_of(self, program):
         """{test: seconds} of a program: asked when the quick ones of all programs have said nothing."""
-        log = self._build / 'coverage' / pathlib.Path(program).name / 'log'
-        took = re.findall(r'^\[ +OK \] (\S+?),? .*?\((\d+) ms\)$', log.read_text(errors='replace'), re.MULTILINE)
+        took = re.findall(r'^\[ +OK \] (\S+?),? .*?\((\d+) ms\)$', self._log_of(program), re.MULTILINE)
         return {name: int(ms) / 1000 for name, ms in took if int(ms) >= SLOW_MS}
+
+    def _log_of(self, program):
+        log = self._build / 'coverage' / pathlib.Path(program).name / 'log'
+        return log.read_text(errors='replace') if log.exists() else ''
 
     def _lines_of(self, program, source):
         folder = self._build / 'coverage' / pathlib.Path(program).name

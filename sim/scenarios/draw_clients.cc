@@ -56,7 +56,8 @@ void drawOddVolume(Draw& draw, Dictionary& info) {
 
 // Shares stay large enough for a purge to be over after some dozens of requests.
 std::uint64_t drawAmount(Draw& draw) {
-  const bool space_moves = draw.on(Fault::kForeignWrites) || draw.on(Fault::kLateSpace);
+  const bool space_moves =
+      draw.on(Fault::kForeignWrites) || draw.on(Fault::kLateSpace) || draw.on(Fault::kRegrownData);
   if (!space_moves && draw.random.percent(15)) {
     return draw.random.below(draw.plan.services.size() + 2);  // around one byte for each
   }

@@ -233,6 +233,12 @@ TEST(SystemRun, ASeedMeansOneRun) {
   }
 }
 
+// Data that had grown took space while a purge needed 5 bytes, so all of 100 MB was asked for in
+// pieces of 5.
+TEST(SystemRun, Seed207795DoesNotGoRoundInCircles) {
+  EXPECT_EQ(playSystem(deriveSystemScenario(207'795), 207'795).end, SystemEnd::kFinished);
+}
+
 /// What has happened, counted over many runs from their traces alone.
 class Counts {
  public:

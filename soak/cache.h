@@ -32,7 +32,7 @@ class Cache : public spacekeep::sdk::Service {
 
   /// One more file, when the volume has room for it.
   void grow();
-  static void allowCrashes() { crashes_allowed_ = true; }
+  static void allowCrashes(bool allowed) { crashes_allowed_ = allowed; }
 
  private:
   void beSlow(const spacekeep::sdk::Job& job) const;

@@ -18,6 +18,7 @@
 #include <memory>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "soak/cache.h"
@@ -80,7 +81,7 @@ class Services {
     for (std::size_t i = 0;; ++i) {
       caches_[i % caches_.size()]->grow();
       // A process that ended before the daemon had its pong would hold up the registry for good.
-      if (serving_ == caches_.size()) soak::Cache::allowCrashes();
+      soak::Cache::allowCrashes(serving_ == caches_.size());
       next += std::chrono::duration_cast<std::chrono::steady_clock::duration>(pause);
       std::this_thread::sleep_until(next);
     }
@@ -93,11 +94,12 @@ class Services {
 
   sdk::Result<sdk::ServiceHost> checkIn(std::size_t number) {
     sdk::CheckInOptions options;
-    options.on_status = [this](const sdk::HostStatus& status) {
-      if (status.state == sdk::HostState::kServing && ++serving_ == caches_.size()) {
-        fmt::print("all serving\n");
-        std::fflush(stdout);
-      }
+    options.on_status = [this, serves = false](const sdk::HostStatus& status) mutable {
+      const bool served = std::exchange(serves, status.state == sdk::HostState::kServing);
+      if (served && !serves) --serving_;
+      if (served || !serves || ++serving_ != caches_.size()) return;
+      fmt::print("all serving\n");
+      std::fflush(stdout);
     };
     return sdk::ServiceHost::checkIn(idOf(number), caches_[number], options);
   }

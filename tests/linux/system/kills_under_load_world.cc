@@ -179,14 +179,17 @@ bool LoadedWorld::book(const sdk::Reply& reply, std::atomic<std::uint64_t>& answ
 /// A service that checks in and leaves, for as long as the world stands.
 void LoadedWorld::comeAndGo() {
   const auto service = std::make_shared<ShelfService>(sandbox_.volume("tmp") + "/comes-and-goes");
-  while (!stopping_) {
+  for (std::uint64_t number = 0; !stopping_; ++number) {
     std::atomic<bool> serving{false};
     sdk::CheckInOptions options;
     options.socket_path = sandbox_.socketPath();
     options.on_status = [&serving](const sdk::HostStatus& status) {
       if (status.state == sdk::HostState::kServing) serving = true;
     };
-    auto host = sdk::ServiceHost::checkIn("comes-and-goes", service, options);
+    // A name of its own each time: under one that is still registered it would be told that it serves
+    // before it was pinged.
+    auto host =
+        sdk::ServiceHost::checkIn("comes-and-goes-" + std::to_string(number), service, options);
     // Who leaves before the daemon has its pong holds up the registry for good, as the daemon's ping
     // has no time limit; the library answers for two seconds, which a busy machine may not keep.
     while (!serving && !stopping_) rt::sleepNs(2 * kMs);

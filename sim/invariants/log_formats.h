@@ -29,6 +29,7 @@ inline constexpr std::string_view kDonation =
     "viable_purging_services[%llu])";
 inline constexpr std::string_view kPurged = "%s %@ service purged: %llu";
 inline constexpr std::string_view kCompletion = "%s %@ calling completion with: %@";
+inline constexpr std::string_view kDonated = "%s %@ donated %lld of %lld";
 inline constexpr std::string_view kSignalling =
     "%s All services accounted for, signalling the semaphore.";
 inline constexpr std::string_view kTook = "%s %@ took %f seconds, purged: %@";

@@ -156,6 +156,17 @@ PurgeView viewOf(const PurgeRun& run) {
   return view;
 }
 
+// Offers take no time beside that of a disk that keeps a thread busy.
+bool PurgeStory::namedAllServices(const Operation& operation) const {
+  if (operation.end_at == kNowhere) return false;
+  if (!run.cut) return true;
+  const auto asking = std::find_if(operation.passes.begin(), operation.passes.end(),
+                                   [](const Pass& pass) { return pass.asked_at != kNowhere; });
+  if (asking == operation.passes.end()) return true;
+  const std::size_t last = run.events.size() - 1;
+  return timeAt(last) > timeAt(asking->asked_at) + writingNs(asking->asked_at, last);
+}
+
 // One write may be under way at the beginning of the span, and one at its end.
 std::uint64_t PurgeStory::writingNs(std::size_t first, std::size_t last) const {
   std::uint64_t writes = 2;

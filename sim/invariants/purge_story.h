@@ -65,7 +65,8 @@ struct Reply {
   unsigned thread = 0;
   std::string service;
   std::uint64_t amount = 0;
-  std::uint64_t call = 0;  ///< 0 until the answer names it
+  std::uint64_t call = 0;                          ///< 0 until the answer names it
+  std::optional<std::uint64_t> logged_donation{};  ///< "donated ... of ..."
   std::uint64_t donation = 0;
   std::int32_t urgency = 0;
   std::size_t completion_at = kNowhere;
@@ -150,6 +151,9 @@ struct PurgeStory {
   /// The fewest and the most in flight from `first` to `last`.
   [[nodiscard]] std::pair<int, int> inFlightBetween(std::size_t operation, std::size_t first,
                                                     std::size_t last) const;
+  /// Whether each of its services was offered a share by the end of the run: a purge may end while
+  /// its offers are still being computed, and the process be killed before they are.
+  [[nodiscard]] bool namedAllServices(const Operation& operation) const;
   /// How long writes to the disk may hold up a purge in that span.
   [[nodiscard]] std::uint64_t writingNs(std::size_t first, std::size_t last) const;
   [[nodiscard]] std::string name(const Operation& operation) const;

@@ -1,6 +1,7 @@
 // From events to a story. Each thread's lines read like the code that wrote them: what a line is
 // about is told by the lines before it on the same thread.
 #include <algorithm>
+#include <set>
 #include <utility>
 
 #include "sim/invariants/log_formats.h"
@@ -54,6 +55,7 @@ class Reader {
     attributeReplies();
     attributeTasks();
     attributeFailures();
+    forgetUntoldRefusals();
   }
 
  private:
@@ -194,6 +196,8 @@ class Reader {
       Reply& reply = story_.replies[state.reply];
       reply.completion_at = at;
       reply.call = unsignedAt(dictionaryField(line, 2), kCallKey).value_or(0);
+    } else if (line.format == formats::kDonated && state.reply != kNowhere) {
+      story_.replies[state.reply].logged_donation = numberField(line, 3);
     } else if (line.format == formats::kSignalling) {
       if (state.reply == kNowhere) {
         story_.oddities.push_back("a signal outside of the booking of a reply");
@@ -247,23 +251,52 @@ class Reader {
     }
   }
 
-  // An answer without a dictionary does not say which call it is for: it is for the last one that the
-  // service has answered.
-  [[nodiscard]] std::uint64_t callOfUnnamed(const Reply& reply) const {
+  // An answer without a dictionary does not say which call it is for, and two of them that arrive in
+  // the same moment may be booked in either order. The booking names the share, which tells apart
+  // what two purges asked for. Answers of earlier moments that nobody booked were lost with their
+  // connection, so the latest moment comes first.
+  [[nodiscard]] std::uint64_t callOfUnnamed(const Reply& reply,
+                                            const std::set<std::uint64_t>& booked) const {
     std::uint64_t call = 0;
+    std::uint64_t answered_ns = 0;
     for (std::size_t at = 0; at < reply.booked_at; ++at) {
       const auto* answered = std::get_if<ServiceAnswered>(&story_.run.events[at].body);
       if (answered == nullptr || answered->service != reply.service) continue;
-      if (answered->member == "servicePurge" && asked_.contains(answered->call)) {
-        call = answered->call;
-      }
+      const auto asked = asked_.find(answered->call);
+      if (asked == asked_.end() || booked.contains(answered->call)) continue;
+      if (asked->second.amount != *reply.logged_donation) continue;
+      if (call != 0 && story_.timeAt(at) == answered_ns) continue;
+      call = answered->call;
+      answered_ns = story_.timeAt(at);
     }
     return call;
   }
 
-  void attributeReplies() {
+  // An addition that changes nothing says so in its next line. Where the process was killed between
+  // the two, that of a service which is in flight already has not been refused yet.
+  void forgetUntoldRefusals() {
+    if (!story_.run.cut) return;
+    for (ShareTask& task : story_.tasks) {
+      if (!task.added || task.adding_at != threads_[task.thread].last_at) continue;
+      if (story_.inFlightBefore(task.operation, task.service, task.adding_at) == 0) continue;
+      task.added = false;
+      task.adding_at = kNowhere;
+    }
+  }
+
+  void nameUnnamedReplies() {
+    std::set<std::uint64_t> booked;
+    for (const Reply& reply : story_.replies) booked.insert(reply.call);
     for (Reply& reply : story_.replies) {
-      if (reply.call == 0) reply.call = callOfUnnamed(reply);
+      if (reply.call != 0 || !reply.logged_donation) continue;
+      reply.call = callOfUnnamed(reply, booked);
+      booked.insert(reply.call);
+    }
+  }
+
+  void attributeReplies() {
+    nameUnnamedReplies();
+    for (Reply& reply : story_.replies) {
       // The process was killed before the reply was told apart from others.
       if (reply.call == 0 && story_.run.cut) continue;
       const auto asked = asked_.find(reply.call);

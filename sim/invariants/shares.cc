@@ -141,6 +141,22 @@ std::size_t firstWake(const PurgeStory& story, std::size_t index) {
   return first;
 }
 
+/// From here on the purge may set its divisor for the urgency that follows the pass: it wakes before
+/// it tells of it. A signal counts from the end of the pass before on, since the semaphore is there
+/// a moment before the urgency says that it begins.
+std::size_t earliestWake(const PurgeStory& story, std::size_t index, std::size_t pass_index) {
+  const Operation& operation = story.operations[index];
+  const Pass& pass = operation.passes[pass_index];
+  const std::size_t since = operation.passes[pass_index - 1].stats_at;
+  std::size_t earliest = std::min(pass.timed_out_at, pass.stats_at);
+  for (const Reply& reply : story.replies) {
+    if (reply.operation != index || reply.signals == 0 || reply.signalled_at < since) continue;
+    earliest = std::min(earliest, reply.signalled_at);
+  }
+  if (story.mayFinishEarly(operation) && story.hadReached(operation, since, earliest)) return since;
+  return earliest;
+}
+
 /// Replies that fell short between two positions: those that surely and those that possibly did.
 std::pair<std::uint64_t, std::uint64_t> shortRepliesWithin(const PurgeStory& story,
                                                            std::size_t operation,
@@ -166,7 +182,7 @@ void checkLaterDivisors(const PurgeStory& story, std::size_t index, std::size_t 
   const Pass& before = operation.passes[pass_index - 1];
   const std::size_t waited_at =
       before.timed_out_at == kNowhere ? before.waiting_at : before.timed_out_at;
-  const std::size_t end = std::min(pass.timed_out_at, pass.stats_at);
+  const std::size_t end = earliestWake(story, index, pass_index);
   const auto [fewest, most] = story.inFlightBetween(index, waited_at, before.stats_at);
   const auto services = static_cast<std::int64_t>(operation.services.size());
   for (const ShareTask* task : tasksOf(story, index)) {
@@ -264,7 +280,7 @@ void checkDivisor(const PurgeStory& story, Findings& findings) {
     if (!task.share || task.operation == kNowhere) continue;
     const Operation& operation = story.operations[task.operation];
     // Of a purge that was cut short not every service has been seen.
-    if (operation.end_at == kNowhere) continue;
+    if (!story.namedAllServices(operation)) continue;
     if (operation.blurred || task.share->at > firstWake(story, task.operation)) continue;
     std::uint64_t surely = 0;
     std::uint64_t possibly = 0;
@@ -285,7 +301,7 @@ void checkDivisor(const PurgeStory& story, Findings& findings) {
   }
   for (std::size_t index = 0; index < story.operations.size(); ++index) {
     const Operation& operation = story.operations[index];
-    if (operation.blurred || operation.end_at == kNowhere) continue;
+    if (operation.blurred || !story.namedAllServices(operation)) continue;
     for (std::size_t pass = 1; pass < operation.passes.size(); ++pass) {
       if (operation.passes[pass].asked_at != kNowhere) {
         checkLaterDivisors(story, index, pass, findings);

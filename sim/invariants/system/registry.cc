@@ -8,8 +8,8 @@
 namespace spacekeep::sim {
 namespace {
 
-bool hasAskedServices(const Operation& operation) {
-  return operation.end_at != kNowhere && !operation.blurred &&
+bool hasAskedServices(const PurgeStory& story, const Operation& operation) {
+  return story.namedAllServices(operation) && !operation.blurred &&
          std::any_of(operation.passes.begin(), operation.passes.end(),
                      [](const Pass& pass) { return pass.asked_at != kNowhere; });
 }
@@ -39,7 +39,7 @@ void checkSnapshotOf(const SystemStory& story, const Life& life, const RegistryM
     findings.push_back(life.purges->name(operation) + " works on a snapshot with " + service +
                        ", which came only after " + nameOf(call));
   }
-  if (!hasAskedServices(operation)) return;
+  if (!hasAskedServices(*life.purges, operation)) return;
   for (const std::string& service : registry.surelyPurging(call.asked_at)) {
     if (operation.services.contains(service)) continue;
     findings.push_back(life.purges->name(operation) + " left out " + service);

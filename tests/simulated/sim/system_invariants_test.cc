@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <functional>
 #include <set>
+#include <string>
 
 #include "sim/invariants/system/system_invariants.h"
 #include "sim/program/one_run.h"
@@ -279,6 +280,32 @@ TEST(SystemInvariants, HoldInTheFirstSeeds) {
     }
   }
 }
+
+// What these seeds show is right, and was once taken for wrong.
+struct Misread {
+  std::uint64_t seed;
+  const char* what;
+};
+
+class OnceMisread : public ::testing::TestWithParam<Misread> {};
+
+TEST_P(OnceMisread, IsJudgedRight) {
+  const Verdict verdict = playOnce(Scenario::kSystem, GetParam().seed);
+  for (const Violation& violation : verdict.violations) {
+    ADD_FAILURE() << violation.invariant << ": " << violation.text;
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Seeds, OnceMisread,
+    ::testing::Values(Misread{3758, "AShareAfterTheSignalAndBeforeTheLineOfTheNewDivisor"},
+                      Misread{6251, "KilledBetweenTheRecordOfAnAmountAndItsLine"},
+                      Misread{18831, "TwoAnswersWithoutDictionaryInOneMoment"},
+                      Misread{38863, "KilledBeforeALateOfferOfAPurgeThatHadEnded"},
+                      Misread{56104, "KilledBetweenAnAdditionAndItsRefusal"},
+                      Misread{67344, "ARecordThatCouldNotBeDeletedWhileTheDiskFailed"},
+                      Misread{116327, "TwoPurgesOfLowSpaceThatCannotBeToldApart"}),
+    [](const ::testing::TestParamInfo<Misread>& one) { return std::string(one.param.what); });
 
 TEST(OneRun, LeavingOutElementsLeavesThemOutOfThePlan) {
   const std::size_t elements = elementsOf(Scenario::kSystem, 3);

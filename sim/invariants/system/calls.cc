@@ -3,7 +3,6 @@
 
 #include "sim/invariants/log_formats.h"
 #include "sim/invariants/system/system_invariants.h"
-#include "sim/world/simulated_service.h"
 #include "support/values/text.h"
 
 namespace spacekeep::sim {
@@ -48,10 +47,15 @@ bool isRefused(const SystemStory& story, const Call& call) {
   return !call.holds(right) || !story.isKnownVolume(call.info);
 }
 
-bool isReplyToAService(const Life& life, const Dictionary& answer) {
-  const auto number = unsignedAt(answer, kCallKey);
-  return number && std::any_of(life.purges->replies.begin(), life.purges->replies.end(),
-                               [&](const Reply& reply) { return reply.call == *number; });
+/// Whether the purge was told that by a service, before the client was.
+bool isReplyToPurge(const Life& life, std::size_t operation, const Call& call) {
+  const PurgeStory& story = *life.purges;
+  return std::any_of(story.replies.begin(), story.replies.end(), [&](const Reply& reply) {
+    if (reply.completion_at >= call.answeredAt()) return false;
+    if (reply.operation != operation && !story.operations[operation].blurred) return false;
+    const auto* line = life.as<LogLine>(reply.completion_at);
+    return line != nullptr && formats::dictionaryField(*line, 2) == *call.answer;
+  });
 }
 
 // Whatever a service answers after the outcome, and before the request is let go of, replaces it.
@@ -61,10 +65,11 @@ std::string problemWithPurge(const Life& life, const Call& call) {
     const Dictionary refusal = {{"SPACEKEEP_ERROR", "Parameter error, no Amount key in info dict"}};
     return *call.answer == refusal ? "" : " has no amount and got " + textOf(*call.answer);
   }
-  for (const Operation& operation : life.purges->operations) {
+  for (std::size_t i = 0; i < life.purges->operations.size(); ++i) {
+    const Operation& operation = life.purges->operations[i];
     if (operation.request != *call.info || operation.begin_at < call.asked_at) continue;
     if (operation.end_at < call.answeredAt() && operation.outcome == *call.answer) return "";
-    if (isReplyToAService(life, *call.answer)) return "";
+    if (isReplyToPurge(life, i, call)) return "";
   }
   return " got what no purge of it told: " + textOf(*call.answer);
 }

@@ -304,7 +304,8 @@ INSTANTIATE_TEST_SUITE_P(
                       Misread{38863, "KilledBeforeALateOfferOfAPurgeThatHadEnded"},
                       Misread{56104, "KilledBetweenAnAdditionAndItsRefusal"},
                       Misread{67344, "ARecordThatCouldNotBeDeletedWhileTheDiskFailed"},
-                      Misread{116327, "TwoPurgesOfLowSpaceThatCannotBeToldApart"}),
+                      Misread{116327, "TwoPurgesOfLowSpaceThatCannotBeToldApart"},
+                      Misread{148319, "ALateAnswerWithoutDictionaryInPlaceOfTheOutcome"}),
     [](const ::testing::TestParamInfo<Misread>& one) { return std::string(one.param.what); });
 
 TEST(OneRun, LeavingOutElementsLeavesThemOutOfThePlan) {

@@ -70,10 +70,18 @@ std::string joined(const std::vector<std::string>& texts) {
   return all;
 }
 
-bool hasOpenPing(const SystemStory& story) {
-  return !story.lives.empty() &&
-         std::any_of(story.lives.back().pings.begin(), story.lives.back().pings.end(),
+bool hasOpenPing(const Life& life) {
+  return std::any_of(life.pings.begin(), life.pings.end(),
                      [](const PingWait& wait) { return wait.to == kNowhere; });
+}
+
+/// Whether each life that stood still did so on a ping. A daemon that does is killed like any other,
+/// and the next one may find all services willing.
+bool stoodStillOnPings(const SystemStory& story) {
+  return std::all_of(story.lives.begin(), story.lives.end(), [](const Life& life) {
+    return life.facts->end == SystemEnd::kFinished ||
+           (life.facts->end == SystemEnd::kSilentPing && hasOpenPing(life));
+  });
 }
 
 /// The one deadlock that there may be is the described one: a service that is silent to its ping.
@@ -81,7 +89,7 @@ std::vector<Violation> judgeEnd(const SystemStory& story) {
   const SystemRun& run = story.run;
   const bool finished = run.end == SystemEnd::kFinished && run.blocked.empty();
   const bool silent_ping = run.end == SystemEnd::kSilentPing &&
-                           run.plan.faults.contains(Fault::kSilentPing) && hasOpenPing(story);
+                           run.plan.faults.contains(Fault::kSilentPing) && stoodStillOnPings(story);
   if (finished || silent_ping) return {};
   return {{"the run ends, or stands still on a silent ping",
            std::string(wordFor(run.end)) + ": " + joined(run.blocked)}};

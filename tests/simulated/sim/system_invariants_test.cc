@@ -305,7 +305,8 @@ INSTANTIATE_TEST_SUITE_P(
                       Misread{56104, "KilledBetweenAnAdditionAndItsRefusal"},
                       Misread{67344, "ARecordThatCouldNotBeDeletedWhileTheDiskFailed"},
                       Misread{116327, "TwoPurgesOfLowSpaceThatCannotBeToldApart"},
-                      Misread{148319, "ALateAnswerWithoutDictionaryInPlaceOfTheOutcome"}),
+                      Misread{148319, "ALateAnswerWithoutDictionaryInPlaceOfTheOutcome"},
+                      Misread{169372, "ASilentPingInALifeThatIsNotTheLast"}),
     [](const ::testing::TestParamInfo<Misread>& one) { return std::string(one.param.what); });
 
 TEST(OneRun, LeavingOutElementsLeavesThemOutOfThePlan) {

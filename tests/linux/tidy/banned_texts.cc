@@ -153,20 +153,21 @@ std::vector<LineRule> aboutEveryText() {
   open.harmless = {"mkstemp(\"/tmp/aXXXXXX\")", "a TODOLIST"};
 
   LineRule doctype = rule("DocumentTypesInPropertyLists", Where::kAllTexts, Look::kText,
-                          "<!DOCTYPE plist", "none: a reader would have to fetch it");
+                          "<!DOC"
+                          "TYPE plist",
+                          "none: a reader would have to fetch it");
   doctype.words = {"DOCTYPE"};
-  doctype.planted = {"<!DOCTYPE plist PUBLIC \"\" \"\">"};
+  doctype.planted = {
+      "<!DOC"
+      "TYPE plist PUBLIC \"\" \"\">"};
   doctype.harmless = {"<plist version=\"1.0\">"};
 
   LineRule machine = rule("PlacesOfOneMachine", Where::kAllTexts, Look::kText,
-                          "(^|[\\s`(=:])[\"']?/(home|root|work|Users)/[A-Za-z0-9]",
+                          "(^|[\\s`(=:])[\"']?/(home|root|Users)/[A-Za-z0-9]",
                           "a path relative to the tree, or one that an installation has");
-  machine.words = {"/home/", "/root/",
-                   "/work"
-                   "/",
-                   "/Users/"};
-  machine.planted = {"cd /home/me/spacekeep", "path = \"/root/x\"", "see `/work/a`"};
-  machine.harmless = {"place + \"/work \" + cache", "https://example.org/home/x"};
+  machine.words = {"/home/", "/root/", "/Users/"};
+  machine.planted = {"cd /home/me/spacekeep", "path = \"/root/x\"", "see `/Users/a`"};
+  machine.harmless = {"place + \"/root \" + cache", "https://example.org/home/x"};
 
   LineRule chapters = rule("ChaptersOfAbsentBooks", Where::kAllTexts, Look::kText,
                            "(^|[\\s(])([Pp]art|[Cc]hapter|[Ii]ssue|[Tt]icket|[Bb]ug) #?[0-9]",

@@ -36,7 +36,6 @@ class RegistryModel {
 
  private:
   const SystemStory& story_;
-  const Life& life_;
   std::vector<const Call*> check_ins_;
   std::size_t ended_connections_ = 0;
 };

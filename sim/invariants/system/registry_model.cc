@@ -20,8 +20,7 @@ bool wants(const Value* names, const std::string& notification) {
 
 }  // namespace
 
-RegistryModel::RegistryModel(const SystemStory& story, const Life& life)
-    : story_(story) {
+RegistryModel::RegistryModel(const SystemStory& story, const Life& life) : story_(story) {
   for (const Call& call : life.calls) {
     if (call.member != "clientCheckin" || story.declared.contains(call.text)) continue;
     if (call.holds("SERVICE_ENTITLEMENT")) check_ins_.push_back(&call);

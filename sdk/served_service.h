@@ -33,6 +33,8 @@ class ServedService : public std::enable_shared_from_this<ServedService> {
     std::uint64_t last_call_ticks = 0;  ///< when something was last asked for or answered
   };
   [[nodiscard]] Activity activity() const;
+  /// Something began that is likely to bring a call, or did.
+  void noteCall();
   /// Until no job runs or waits. No connection may be left that could bring another one.
   void waitUntilIdle();
 
@@ -51,7 +53,6 @@ class ServedService : public std::enable_shared_from_this<ServedService> {
   void enqueue(Kind kind, ipc::Responder responder, Work work);
   void run(const Work& work, const Cancellation& cancellation, ipc::Responder responder);
   void cancelPurges();
-  void noteCall();
 
   struct Pending {
     Kind kind;

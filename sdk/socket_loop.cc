@@ -26,10 +26,17 @@ bool isListeningUnixStream(int fd) {
          hasSocketOption(fd, SO_ACCEPTCONN, 1);
 }
 
-std::function<bool(ipc::PeerConnection&, std::string&)> admission(std::optional<uid_t> allowed) {
-  return [allowed, own = geteuid()](ipc::PeerConnection& peer, std::string& why) {
+/// Who is let in counts as activity: its first call may not have been read yet when the time of
+/// idleness is over.
+std::function<bool(ipc::PeerConnection&, std::string&)> admission(
+    std::optional<uid_t> allowed, std::shared_ptr<ServedService> served) {
+  return [allowed, served = std::move(served), own = geteuid()](ipc::PeerConnection& peer,
+                                                                std::string& why) {
     const uid_t uid = peer.identity().uid();
-    if (mayCall(uid, own, allowed)) return true;
+    if (mayCall(uid, own, allowed)) {
+      served->noteCall();
+      return true;
+    }
     why = fmt::format("uid {} may not call this service", uid);
     return false;
   };
@@ -68,7 +75,7 @@ SocketLoop::SocketLoop(ipc::SharedDescriptor listening, SocketOptions options, E
 void SocketLoop::run() {
   ipc::ServerOptions options;
   options.limits.connections = 16;
-  options.admit = admission(options_.allowed_uid);
+  options.admit = admission(options_.allowed_uid, served_);
   ipc::BusServer server(engine_.loop, engine_.queue, served_->interface(), std::move(options));
   server.serveListening(listening_);
   control_->report(HostState::kServing);

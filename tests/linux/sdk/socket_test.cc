@@ -6,15 +6,18 @@
 #include <spawn.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstring>
 #include <memory>
 #include <string>
+#include <thread>
 
 #include "sdk/socket_loop.h"
 #include "tests/linux/sdk/fake_daemon.h"
@@ -112,6 +115,52 @@ TEST_F(SocketTest, StopsByItselfWhenNothingIsAskedButNotWhileAPurgeRuns) {
   host->waitUntilStopped();
   EXPECT_EQ(host->status().state, HostState::kStopped);
   connection->invalidate();
+}
+
+/// A connection of which the other side has answered the first words; -1 when there is none.
+int admittedConnection(const std::string& path) {
+  sockaddr_un address = {};
+  address.sun_family = AF_UNIX;
+  std::memcpy(address.sun_path, path.c_str(), path.size());
+  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  // A host that has just ended leaves the connection in the backlog.
+  const timeval patience{.tv_sec = 1, .tv_usec = 0};
+  setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
+  const char begin_of_authentication[] = "\0AUTH EXTERNAL\r\n";
+  char byte = 0;
+  if (connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 &&
+      send(fd, begin_of_authentication, sizeof begin_of_authentication - 1, MSG_NOSIGNAL) > 0 &&
+      recv(fd, &byte, 1, 0) == 1) {
+    return fd;
+  }
+  close(fd);
+  return -1;
+}
+
+TEST_F(SocketTest, AConnectionThatHasNotAskedYetKeepsTheHostForAFullIdleTime) {
+  using Clock = std::chrono::steady_clock;
+  constexpr milliseconds kIdle(300);
+  const auto listening = listen();
+  // Counts only when the host's first idle time was not over yet; the machine may hold this up.
+  for (int attempt = 0; attempt < 100; ++attempt) {
+    SocketOptions options;
+    options.listening_fd = dup(listening->fd());
+    options.stop_when_idle = kIdle;
+    const auto started = Clock::now();
+    auto host = ServiceHost::serveSocket(std::make_shared<TestService>(), options);
+    ASSERT_TRUE(host) << host.error().text;
+    std::this_thread::sleep_for(kIdle / 2);
+    const auto connecting = Clock::now();
+    const int fd = admittedConnection(directory_.serviceSocket());
+    const bool counts = fd >= 0 && Clock::now() - started < kIdle;
+    host->waitUntilStopped();
+    const auto lived_on = Clock::now() - connecting;
+    if (fd >= 0) close(fd);
+    if (!counts) continue;
+    EXPECT_GE(lived_on, kIdle);
+    return;
+  }
+  FAIL() << "the machine held up every attempt";
 }
 
 TEST_F(SocketTest, WhatIsNoListeningUnixSocketIsAnErrorThatNamesTheDescriptor) {

@@ -75,9 +75,9 @@ void addGivenUntold(const PurgeStory& story, std::vector<Given>& given) {
     }
     const auto* answered = std::get_if<ServiceAnswered>(&event.body);
     if (answered == nullptr || told.contains(answered->call)) continue;
-    const auto operation = story.operation_of_call.find(answered->call);
-    if (operation == story.operation_of_call.end()) continue;
-    given.push_back({operation->second, urgency_of_call[answered->call], answered->service,
+    const std::size_t operation = story.operationOfCall(answered->call);
+    if (operation == kNowhere) continue;
+    given.push_back({operation, urgency_of_call[answered->call], answered->service,
                      answered->amount.value_or(0)});
   }
 }
@@ -124,7 +124,7 @@ void checkReportedSum(const PurgeStory& story, Findings& findings) {
   }
   for (std::size_t index = 0; index < story.operations.size(); ++index) {
     const Operation& operation = story.operations[index];
-    if (operation.end_at == kNowhere || operation.blurred) continue;
+    if (operation.end_at == kNowhere) continue;
     std::uint64_t surely = 0;
     std::uint64_t possibly = 0;
     for (const Reply& reply : story.replies) {
@@ -204,7 +204,7 @@ void checkReportingServices(const PurgeStory& story, Findings& findings) {
   const std::vector<Given> given = allGiven(story);
   for (std::size_t index = 0; index < story.operations.size(); ++index) {
     const Operation& operation = story.operations[index];
-    if (operation.end_at == kNowhere || operation.blurred) continue;
+    if (operation.end_at == kNowhere) continue;
     for (const Pass& pass : operation.passes) {
       const std::string key =
           "SPACEKEEP_URGENCY_" + std::to_string(pass.urgency) + "_OPERATION_INFO";

@@ -28,24 +28,20 @@ std::map<std::string, std::int64_t> openCalls(const PurgeStory& story) {
 
 void checkNeverAskedTwiceAtOnce(const PurgeStory& story, Findings& findings) {
   std::map<Request, std::int64_t> open;
-  const auto operationOf = [&](std::uint64_t call) {
-    const auto found = story.operation_of_call.find(call);
-    return found == story.operation_of_call.end() ? kNowhere : found->second;
-  };
   for (const Event& event : story.run.events) {
     if (const auto* asked = std::get_if<ServiceAsked>(&event.body)) {
       if (asked->member != "servicePurge") continue;
-      const std::size_t operation = operationOf(asked->call);
-      const bool is_clear = operation != kNowhere && !story.operations[operation].blurred;
-      if (++open[{asked->service, operation}] > 1 && is_clear) {
+      const std::size_t operation = story.operationOfCall(asked->call);
+      if (++open[{asked->service, operation}] > 1) {
         findings.push_back(asked->service + " was asked again before it had answered");
       }
     } else if (const auto* answered = std::get_if<ServiceAnswered>(&event.body)) {
       if (answered->member == "servicePurge") {
-        --open[{answered->service, operationOf(answered->call)}];
+        --open[{answered->service, story.operationOfCall(answered->call)}];
       }
     } else if (const auto* failed = std::get_if<ServiceCallFailed>(&event.body)) {
-      if (failed->member == "servicePurge") --open[{failed->service, operationOf(failed->call)}];
+      if (failed->member == "servicePurge")
+        --open[{failed->service, story.operationOfCall(failed->call)}];
     }
   }
   for (const auto& [service, times] : story.run.asked_twice) {
@@ -58,7 +54,6 @@ void checkInFlightSet(const PurgeStory& story, Findings& findings) {
   for (const ShareTask& task : story.tasks) {
     if (task.operation == kNowhere || task.adding_at == kNowhere) continue;
     const Operation& operation = story.operations[task.operation];
-    if (operation.blurred) continue;
     const int before = story.inFlightBefore(task.operation, task.service, task.adding_at);
     if ((before == 0) == task.added) continue;
     findings.push_back(story.name(operation) + (task.added ? " added " : " refused ") +
@@ -101,7 +96,6 @@ void checkEveryRequestEndsOnce(const PurgeStory& story, Findings& findings) {
 void checkMetSharesAreOfferedAnother(const PurgeStory& story, Findings& findings) {
   for (std::size_t index = 0; index < story.operations.size(); ++index) {
     const Operation& operation = story.operations[index];
-    if (operation.blurred) continue;
     const auto asked = std::count_if(operation.passes.begin(), operation.passes.end(),
                                      [](const Pass& pass) { return pass.asked_at != kNowhere; });
     for (const std::string& service : operation.services) {

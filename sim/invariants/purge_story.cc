@@ -12,6 +12,12 @@ const std::string* volumeOf(const Operation& operation) {
 
 }  // namespace
 
+std::size_t PurgeStory::operationOfCall(std::uint64_t number) const {
+  const auto found = std::find_if(calls.begin(), calls.end(),
+                                  [&](const PurgeCall& call) { return call.number == number; });
+  return found == calls.end() ? kNowhere : found->operation;
+}
+
 std::vector<std::uint64_t> PurgeStory::freeBetween(const std::string& volume, std::size_t first,
                                                    std::size_t last) const {
   std::vector<std::uint64_t> values = {0};

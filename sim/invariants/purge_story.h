@@ -56,7 +56,9 @@ struct ShareTask {
   std::optional<Share> share;
   std::size_t adding_at = kNowhere;
   bool added = false;
-  std::size_t operation = kNowhere;  ///< kNowhere: cannot be told
+  unsigned queue = 0;      ///< on which it is computed
+  unsigned set_queue = 0;  ///< that of the in-flight set, if it got so far
+  std::size_t operation = kNowhere;
 };
 
 /// One booked reply.
@@ -74,8 +76,9 @@ struct Reply {
   unsigned removals = 0;
   unsigned signals = 0;
   std::size_t signalled_at = kNowhere;
-  std::size_t done_at = kNowhere;  ///< "took ... seconds"
-  std::size_t operation = kNowhere;
+  std::size_t done_at = kNowhere;    ///< "took ... seconds"
+  unsigned set_queue = 0;            ///< that of the in-flight set it left
+  std::size_t operation = kNowhere;  ///< kNowhere: cut off before it was told
 };
 
 /// A failed connection, as a purge noted it.
@@ -83,6 +86,22 @@ struct Failure {
   std::size_t at = 0;
   std::string service;  ///< empty until its removal names it
   std::size_t removing_at = kNowhere;
+  unsigned set_queue = 0;
+  std::size_t operation = kNowhere;
+};
+
+/// One purge call that reached a service.
+struct PurgeCall {
+  std::uint64_t number = 0;
+  std::string service;
+  std::uint64_t amount = 0;
+  std::int32_t urgency = 0;
+  std::size_t asked_at = 0;
+  std::size_t ended_at = kNowhere;
+  bool failed = false;
+  /// Whose request it looks like. Purges of the low-space handling name nothing but volume and free
+  /// space, so there may be several.
+  std::vector<std::size_t> alike;
   std::size_t operation = kNowhere;
 };
 
@@ -112,9 +131,6 @@ struct Operation {
   std::uint64_t free_at_begin = 0;  ///< what the volume showed
   std::vector<Pass> passes;
   std::set<std::string> services;  ///< those that were offered a share
-  /// Lines of another purge could not be told from this one's: only what needs no attribution
-  /// holds.
-  bool blurred = false;
 };
 
 struct PurgeStory {
@@ -126,10 +142,12 @@ struct PurgeStory {
   std::vector<ShareTask> tasks;
   std::vector<Reply> replies;
   std::vector<Failure> failures;
-  std::map<std::uint64_t, std::size_t> operation_of_call;  ///< of purge calls of services
+  std::vector<PurgeCall> calls;
   std::vector<std::string> oddities;  ///< lines that stand where they cannot be
 
   [[nodiscard]] std::uint64_t timeAt(std::size_t at) const { return run.events[at].at_ns; }
+  /// Of a purge call of a service; kNowhere when that number is none.
+  [[nodiscard]] std::size_t operationOfCall(std::uint64_t number) const;
   /// Every value that the volume's free space had from `first` to `last`.
   [[nodiscard]] std::vector<std::uint64_t> freeBetween(const std::string& volume, std::size_t first,
                                                        std::size_t last) const;

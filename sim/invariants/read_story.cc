@@ -4,6 +4,7 @@
 #include <set>
 #include <utility>
 
+#include "sim/invariants/attribute.h"
 #include "sim/invariants/log_formats.h"
 #include "sim/invariants/purge_story.h"
 #include "sim/world/simulated_service.h"
@@ -27,13 +28,6 @@ struct ThreadState {
   bool elsewhere = false;       ///< at work for something that is no purge
 };
 
-struct AskedCall {
-  std::string service;
-  std::size_t operation = kNowhere;
-  std::uint64_t amount = 0;
-  std::int32_t urgency = 0;
-};
-
 class Reader {
  public:
   explicit Reader(PurgeStory& story) : story_(story) {}
@@ -42,9 +36,13 @@ class Reader {
     for (std::size_t at = 0; at < story_.run.events.size(); ++at) {
       const Event& event = story_.run.events[at];
       if (const auto* line = std::get_if<LogLine>(&event.body)) {
-        readLine(at, event.thread, *line);
+        readLine(at, event, *line);
       } else if (const auto* asked = std::get_if<ServiceAsked>(&event.body)) {
         if (asked->member == "servicePurge") readRequest(at, *asked);
+      } else if (const auto* answered = std::get_if<ServiceAnswered>(&event.body)) {
+        readEnd(at, answered->call, false);
+      } else if (const auto* failed = std::get_if<ServiceCallFailed>(&event.body)) {
+        readEnd(at, failed->call, true);
       } else if (const auto* look = std::get_if<FreeSpaceLooked>(&event.body)) {
         threads_[event.thread].last_look = look->free;
       } else if (const auto* sent = std::get_if<StatisticSent>(&event.body)) {
@@ -52,14 +50,13 @@ class Reader {
       }
       threads_[event.thread].last_at = at;
     }
-    attributeReplies();
-    attributeTasks();
-    attributeFailures();
+    attribute(story_);
     forgetUntoldRefusals();
   }
 
  private:
-  void readLine(std::size_t at, unsigned thread, const LogLine& line) {
+  void readLine(std::size_t at, const Event& event, const LogLine& line) {
+    const unsigned thread = event.thread;
     ThreadState& state = threads_[thread];
     if (isOfNoPurge(line)) {
       state.elsewhere = true;
@@ -72,12 +69,16 @@ class Reader {
       begin(at, thread, line);
     } else if (line.format == formats::kQueuing) {
       state.task = story_.tasks.size();
-      story_.tasks.push_back(
-          {.at = at, .last_at = at, .thread = thread, .service = textField(line, 1), .share = {}});
+      story_.tasks.push_back({.at = at,
+                              .last_at = at,
+                              .thread = thread,
+                              .service = textField(line, 1),
+                              .share = {},
+                              .queue = event.queue});
     } else if (line.format == formats::kDonation) {
       donation(at, state, line);
     } else if (line.format == formats::kInFlight && textField(line, 0) == "updateInFlight") {
-      inFlight(at, state, line);
+      inFlight(at, event.queue, state, line);
     } else if (line.format == formats::kAlreadyIn && state.task != kNowhere) {
       story_.tasks[state.task].added = false;
       story_.tasks[state.task].last_at = at;
@@ -114,26 +115,28 @@ class Reader {
     story_.operations.push_back(std::move(operation));
   }
 
-  // Purges of the low-space handling name nothing but volume and free space. Two of them that do not
-  // differ in that run one after the other.
   void readRequest(std::size_t at, const ServiceAsked& asked) {
-    AskedCall call = {asked.service, kNowhere, asked.amount.value_or(0), asked.urgency};
+    PurgeCall call = {.number = asked.call,
+                      .service = asked.service,
+                      .amount = asked.amount.value_or(0),
+                      .urgency = asked.urgency,
+                      .asked_at = at,
+                      .alike = {}};
     for (std::size_t i = 0; i < story_.operations.size(); ++i) {
-      Operation& operation = story_.operations[i];
-      if (!isRequestOf(operation, asked.info)) continue;
-      if (call.operation != kNowhere) {
-        Operation& earlier = story_.operations[call.operation];
-        const bool may_be_its =
-            earlier.end_at == kNowhere || story_.timeAt(earlier.end_at) == story_.timeAt(at);
-        if (may_be_its) earlier.blurred = operation.blurred = true;
-      }
-      call.operation = i;
+      if (isRequestOf(story_.operations[i], asked.info)) call.alike.push_back(i);
     }
-    if (call.operation == kNowhere) {
+    if (call.alike.empty()) {
       story_.oddities.push_back(asked.service + " was asked by no purge that runs");
     }
-    story_.operation_of_call[asked.call] = call.operation;
-    asked_[asked.call] = call;
+    story_.calls.push_back(std::move(call));
+  }
+
+  void readEnd(std::size_t at, std::uint64_t number, bool failed) {
+    for (PurgeCall& call : story_.calls) {
+      if (call.number != number) continue;
+      call.ended_at = at;
+      call.failed = failed;
+    }
   }
 
   void donation(std::size_t at, const ThreadState& state, const LogLine& line) {
@@ -153,7 +156,7 @@ class Reader {
     return task.service == service && task.share && task.adding_at == kNowhere;
   }
 
-  void inFlight(std::size_t at, ThreadState& state, const LogLine& line) {
+  void inFlight(std::size_t at, unsigned queue, ThreadState& state, const LogLine& line) {
     const std::string service = textField(line, 2);
     if (textField(line, 1) == "adding") {
       if (!isNextStepOf(state.task, service)) {
@@ -166,15 +169,18 @@ class Reader {
       ShareTask& task = story_.tasks[state.task];
       task.adding_at = at;
       task.added = true;
+      task.set_queue = queue;
       task.last_at = at;
     } else if (state.reply != kNowhere) {
       Reply& reply = story_.replies[state.reply];
       reply.removing_at = at;
+      reply.set_queue = queue;
       ++reply.removals;
     } else if (state.failure != kNowhere) {
       Failure& failure = story_.failures[state.failure];
       failure.service = service;
       failure.removing_at = at;
+      failure.set_queue = queue;
       state.failure = kNowhere;
     } else {
       story_.oddities.push_back("a removal that nobody asked for: " + service);
@@ -251,27 +257,6 @@ class Reader {
     }
   }
 
-  // An answer without a dictionary does not say which call it is for, and two of them that arrive in
-  // the same moment may be booked in either order. The booking names the share, which tells apart
-  // what two purges asked for. Answers of earlier moments that nobody booked were lost with their
-  // connection, so the latest moment comes first.
-  [[nodiscard]] std::uint64_t callOfUnnamed(const Reply& reply,
-                                            const std::set<std::uint64_t>& booked) const {
-    std::uint64_t call = 0;
-    std::uint64_t answered_ns = 0;
-    for (std::size_t at = 0; at < reply.booked_at; ++at) {
-      const auto* answered = std::get_if<ServiceAnswered>(&story_.run.events[at].body);
-      if (answered == nullptr || answered->service != reply.service) continue;
-      const auto asked = asked_.find(answered->call);
-      if (asked == asked_.end() || booked.contains(answered->call)) continue;
-      if (asked->second.amount != *reply.logged_donation) continue;
-      if (call != 0 && story_.timeAt(at) == answered_ns) continue;
-      call = answered->call;
-      answered_ns = story_.timeAt(at);
-    }
-    return call;
-  }
-
   // An addition that changes nothing says so in its next line. Where the process was killed between
   // the two, that of a service which is in flight already has not been refused yet.
   void forgetUntoldRefusals() {
@@ -284,121 +269,8 @@ class Reader {
     }
   }
 
-  void nameUnnamedReplies() {
-    std::set<std::uint64_t> booked;
-    for (const Reply& reply : story_.replies) booked.insert(reply.call);
-    for (Reply& reply : story_.replies) {
-      if (reply.call != 0 || !reply.logged_donation) continue;
-      reply.call = callOfUnnamed(reply, booked);
-      booked.insert(reply.call);
-    }
-  }
-
-  void attributeReplies() {
-    nameUnnamedReplies();
-    for (Reply& reply : story_.replies) {
-      // The process was killed before the reply was told apart from others.
-      if (reply.call == 0 && story_.run.cut) continue;
-      const auto asked = asked_.find(reply.call);
-      if (asked == asked_.end() || asked->second.service != reply.service) {
-        story_.oddities.push_back("a reply of " + reply.service + " to nothing that was asked");
-        continue;
-      }
-      reply.donation = asked->second.amount;
-      reply.urgency = asked->second.urgency;
-      reply.operation = asked->second.operation;
-    }
-  }
-
-  // A donation names the bytes needed, which no two purges of clients share. Else a computation
-  // belongs to the running purge, unless a purge that has ended may still have one to come.
-  void attributeTasks() {
-    for (ShareTask& task : story_.tasks) {
-      if (!task.share) continue;
-      std::vector<std::size_t> possible;
-      for (std::size_t i = 0; i < story_.operations.size(); ++i) {
-        if (story_.operations[i].needed == task.share->needed) possible.push_back(i);
-      }
-      if (possible.size() == 1) give(task, possible.front());
-    }
-    for (ShareTask& task : story_.tasks) {
-      if (task.operation == kNowhere) attributeUnnamed(task);
-    }
-  }
-
-  void give(ShareTask& task, std::size_t operation) {
-    task.operation = operation;
-    story_.operations[operation].services.insert(task.service);
-  }
-
-  void attributeUnnamed(ShareTask& task) {
-    std::vector<std::size_t> possible;
-    for (std::size_t i = 0; i < story_.operations.size(); ++i) {
-      const Operation& operation = story_.operations[i];
-      if (operation.begin_at > task.at) continue;
-      if (task.share && task.share->needed != operation.needed) continue;
-      if (operation.end_at > task.at || outstandingTasks(i, task) > 0) possible.push_back(i);
-    }
-    if (possible.empty()) {
-      for (std::size_t i = 0; i < story_.operations.size(); ++i) {
-        if (story_.operations[i].begin_at < task.at) possible.push_back(i);
-      }
-    }
-    if (possible.size() == 1) return give(task, possible.front());
-    for (const std::size_t i : possible) story_.operations[i].blurred = true;
-  }
-
-  // Each asked urgency queues one computation for each service, each met share one more. In the
-  // very instant of its end a purge may have computations left even for services it has not named
-  // yet; time does not move on before they have run.
-  [[nodiscard]] std::int64_t outstandingTasks(std::size_t operation, const ShareTask& next) const {
-    const Operation& ended = story_.operations[operation];
-    const bool same_instant = story_.timeAt(ended.end_at) == story_.timeAt(next.at);
-    const bool may_be_asked = same_instant || ended.services.contains(next.service);
-    std::int64_t count = 0;
-    for (const Pass& pass : ended.passes) {
-      if (pass.asked_at != kNowhere && may_be_asked) ++count;
-    }
-    for (const Reply& reply : story_.replies) {
-      if (reply.operation == operation && reply.service == next.service &&
-          reply.booked_at < next.at && metItsShare(reply)) {
-        ++count;
-      }
-    }
-    for (const ShareTask& task : story_.tasks) {
-      if (task.operation == operation && task.service == next.service && task.at < next.at) --count;
-    }
-    return count;
-  }
-
-  [[nodiscard]] bool anyIsBlurred() const {
-    return std::any_of(story_.operations.begin(), story_.operations.end(),
-                       [](const Operation& operation) { return operation.blurred; });
-  }
-
-  void attributeFailures() {
-    for (Failure& failure : story_.failures) {
-      if (failure.removing_at == kNowhere) continue;
-      std::vector<std::size_t> possible;
-      for (std::size_t i = 0; i < story_.operations.size(); ++i) {
-        if (story_.inFlightBefore(i, failure.service, failure.removing_at) > 0) {
-          possible.push_back(i);
-        }
-      }
-      if (possible.empty()) {
-        if (anyIsBlurred()) continue;
-        story_.oddities.push_back("a failure of " + failure.service + ", which was not in flight");
-        continue;
-      }
-      failure.operation = possible.front();
-      if (possible.size() == 1) continue;
-      for (const std::size_t i : possible) story_.operations[i].blurred = true;
-    }
-  }
-
   PurgeStory& story_;
   std::map<unsigned, ThreadState> threads_;
-  std::map<std::uint64_t, AskedCall> asked_;
 };
 
 }  // namespace

@@ -249,7 +249,6 @@ void checkSharesOneAfterAnother(const PurgeStory& story, Findings& findings) {
 void checkFirstSharesComeFirst(const PurgeStory& story, Findings& findings) {
   for (std::size_t index = 0; index < story.operations.size(); ++index) {
     const Operation& operation = story.operations[index];
-    if (operation.blurred) continue;
     for (std::size_t pass = 0; pass < operation.passes.size(); ++pass) {
       if (operation.passes[pass].asked_at != kNowhere) checkOrder(story, index, pass, findings);
     }
@@ -281,7 +280,7 @@ void checkDivisor(const PurgeStory& story, Findings& findings) {
     const Operation& operation = story.operations[task.operation];
     // Of a purge that was cut short not every service has been seen.
     if (!story.namedAllServices(operation)) continue;
-    if (operation.blurred || task.share->at > firstWake(story, task.operation)) continue;
+    if (task.share->at > firstWake(story, task.operation)) continue;
     std::uint64_t surely = 0;
     std::uint64_t possibly = 0;
     for (const Reply& reply : story.replies) {
@@ -301,7 +300,7 @@ void checkDivisor(const PurgeStory& story, Findings& findings) {
   }
   for (std::size_t index = 0; index < story.operations.size(); ++index) {
     const Operation& operation = story.operations[index];
-    if (operation.blurred || !story.namedAllServices(operation)) continue;
+    if (!story.namedAllServices(operation)) continue;
     for (std::size_t pass = 1; pass < operation.passes.size(); ++pass) {
       if (operation.passes[pass].asked_at != kNowhere) {
         checkLaterDivisors(story, index, pass, findings);

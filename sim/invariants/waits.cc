@@ -29,7 +29,7 @@ bool mayHaveFinished(const PurgeStory& story, const Operation& operation, std::s
                      std::size_t last) {
   if (!story.mayFinishEarly(operation) || !story.hadReached(operation, first, last)) return false;
   const auto index = static_cast<std::size_t>(&operation - story.operations.data());
-  return operation.blurred || story.wasIdle(index, first, last, true);
+  return story.wasIdle(index, first, last, true);
 }
 
 bool isComplete(const Operation& operation) {
@@ -129,7 +129,6 @@ void checkOnlySignalsEndWaits(const PurgeStory& story, Findings& findings) {
   }
   for (const Reply& reply : story.replies) {
     if (reply.signals > 0 && reply.operation != kNowhere &&
-        !story.operations[reply.operation].blurred &&
         !story.wasIdle(reply.operation, reply.removing_at, reply.signalled_at, false)) {
       findings.push_back("a reply of " + reply.service +
                          " signalled while services were still in flight");
@@ -145,7 +144,7 @@ void checkTheLastReplySignals(const PurgeStory& story, Findings& findings) {
   for (const Reply& reply : story.replies) {
     if (reply.operation == kNowhere || reply.done_at == kNowhere) continue;
     const Operation& operation = story.operations[reply.operation];
-    if (operation.blurred || operation.passes.empty()) continue;
+    if (operation.passes.empty()) continue;
     const bool is_last = story.staysIdle(reply.operation, reply.removing_at, reply.done_at);
     const bool is_during = reply.removing_at > operation.passes.front().begin_at &&
                            reply.done_at < operation.measured_at;

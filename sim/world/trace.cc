@@ -116,7 +116,14 @@ void Trace::add(EventBody body) {
   const std::scoped_lock lock(mutex_);
   const unsigned number =
       threads_.emplace(thread, static_cast<unsigned>(threads_.size())).first->second;
-  events_.push_back({nowNs(), number, std::move(body)});
+  events_.push_back({nowNs(), number, std::move(body), queueNumber()});
+}
+
+unsigned Trace::queueNumber() {
+  const SerialQueue* queue = SerialQueue::current();
+  if (queue == nullptr) return 0;
+  const auto next = static_cast<unsigned>(queues_.size()) + 1;
+  return queues_.emplace(queue->weak_from_this(), next).first->second;
 }
 
 std::vector<Event> Trace::events() const {

@@ -6,12 +6,14 @@
 
 #include <cstdint>
 #include <map>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <variant>
 #include <vector>
 
+#include "support/queues/serial_queue.h"
 #include "support/runtime/runtime.h"
 #include "support/values/value.h"
 
@@ -164,6 +166,9 @@ struct Event {
   std::uint64_t at_ns = 0;  ///< since the trace was made
   unsigned thread = 0;      ///< which thread it happened on; a number is reused after its thread
   EventBody body;
+  /// In a task of which serial queue, the innermost one, counted as they come up; 0: in none. A
+  /// number is not used again, so it tells apart what looks alike.
+  unsigned queue = 0;
 };
 
 /// Where a trace goes on that was begun by an earlier one, and when it takes nothing any more.
@@ -194,6 +199,8 @@ class Trace {
   [[nodiscard]] bool hasLine(std::string_view filled_text) const;
 
  private:
+  [[nodiscard]] unsigned queueNumber();  // with mutex_ held
+
   const std::uint64_t start_ticks_;
   const std::uint64_t start_ns_;
   bool (*const is_over_)();
@@ -201,6 +208,8 @@ class Trace {
   // Protected by mutex_.
   std::vector<Event> events_;
   std::map<const void*, unsigned> threads_;
+  // Kept as references that hold nothing, so that no other queue can come to stand in its place.
+  std::map<std::weak_ptr<const SerialQueue>, unsigned, std::owner_less<>> queues_;
   std::uint64_t last_call_;
 };
 

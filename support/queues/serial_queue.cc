@@ -23,6 +23,11 @@ class SerialQueue::Frame {
     return frame != nullptr;
   }
 
+  static const SerialQueue* queue() {
+    const Frame* frame = innermost();
+    return frame == nullptr ? nullptr : frame->queue_;
+  }
+
  private:
   static Frame* innermost() {
     return static_cast<Frame*>(rt::threadSlot(rt::ThreadSlot::kCurrentQueue));
@@ -116,6 +121,8 @@ void SerialQueue::resume() {
 }
 
 bool SerialQueue::isCurrent() const { return Frame::isOn(*this); }
+
+const SerialQueue* SerialQueue::current() { return Frame::queue(); }
 
 void SerialQueue::assertCurrent(const char* where) const {
   if (isCurrent()) return;

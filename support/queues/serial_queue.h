@@ -38,6 +38,10 @@ class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
   /// True in a task of this queue, also deep inside a sync() on another queue made from it.
   [[nodiscard]] bool isCurrent() const;
 
+  /// The queue in whose task the calling thread is, the innermost one; null outside of all. It
+  /// lives at least until that task ends.
+  [[nodiscard]] static const SerialQueue* current();
+
   /// Panics with the queue's label and `where` unless isCurrent(). For objects that live on a
   /// queue.
   void assertCurrent(const char* where) const;

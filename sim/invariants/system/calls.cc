@@ -52,7 +52,7 @@ bool isReplyToPurge(const Life& life, std::size_t operation, const Call& call) {
   const PurgeStory& story = *life.purges;
   return std::any_of(story.replies.begin(), story.replies.end(), [&](const Reply& reply) {
     if (reply.completion_at >= call.answeredAt()) return false;
-    if (reply.operation != operation && !story.operations[operation].blurred) return false;
+    if (reply.operation != kNowhere && reply.operation != operation) return false;
     const auto* line = life.as<LogLine>(reply.completion_at);
     return line != nullptr && formats::dictionaryField(*line, 2) == *call.answer;
   });

@@ -9,7 +9,7 @@ namespace spacekeep::sim {
 namespace {
 
 bool hasAskedServices(const PurgeStory& story, const Operation& operation) {
-  return story.namedAllServices(operation) && !operation.blurred &&
+  return story.namedAllServices(operation) &&
          std::any_of(operation.passes.begin(), operation.passes.end(),
                      [](const Pass& pass) { return pass.asked_at != kNowhere; });
 }

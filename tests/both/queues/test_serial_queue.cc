@@ -216,6 +216,25 @@ TEST(SerialQueue, IsCurrentHoldsForEveryQueueOfANestedSync) {
   });
 }
 
+TEST(SerialQueue, TheCurrentQueueIsTheInnermostOne) {
+  inEverySchedule(50, [] {
+    ConcurrentQueue global({});
+    const auto outer = SerialQueue::create("outer", global);
+    const auto inner = SerialQueue::create("inner", global);
+    EXPECT_EQ(SerialQueue::current(), nullptr);
+    TaskGroup group;
+    group.enter();
+    outer->async([&] {
+      EXPECT_EQ(SerialQueue::current(), outer.get());
+      inner->sync([&] { EXPECT_EQ(SerialQueue::current(), inner.get()); });
+      EXPECT_EQ(SerialQueue::current(), outer.get());
+      group.leave();
+    });
+    group.wait();
+    EXPECT_EQ(SerialQueue::current(), nullptr);
+  });
+}
+
 TEST(SerialQueue, ATaskOfAnotherQueueIsNotCurrent) {
   inEverySchedule(50, [] {
     ConcurrentQueue global({});

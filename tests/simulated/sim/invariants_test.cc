@@ -43,6 +43,21 @@ std::size_t statisticAt(const PurgeRun& run, const std::string& key) {
   return eventAt<StatisticSent>(run, [&](const StatisticSent& sent) { return sent.key == key; });
 }
 
+std::size_t removalAt(const PurgeRun& run, const std::string& service) {
+  return lineAt(run, formats::kInFlight, 0, [&](const LogLine& one) {
+    return textField(one, 1) == "removing" && textField(one, 2) == service;
+  });
+}
+
+/// A further computation of a share, on the purge's own queue and on a thread of its own.
+void offerAfter(PurgeRun& run, std::size_t at) {
+  const std::size_t offer = lineAt(run, formats::kQueuing);
+  Event again = run.events[offer];
+  again.thread = 900;
+  again.at_ns = run.events[at].at_ns;
+  run.events.insert(run.events.begin() + static_cast<std::ptrdiff_t>(at) + 1, std::move(again));
+}
+
 LogLine signalLine() {
   return {5, std::string(formats::kSignalling), {LogField(std::string("queueServiceRequest"))}};
 }
@@ -74,6 +89,16 @@ const Fault kCourse[] = {
      }},
     {"every line stands where it belongs", "a signal that no reply gives",
      [](PurgeRun& run) { insertAfter(run, lineAt(run, formats::kTook), signalLine()); }},
+    {"every line stands where it belongs", "a share on no queue",
+     [](PurgeRun& run) { run.events[lineAt(run, formats::kQueuing, 1)].queue = 0; }},
+    {"every line stands where it belongs", "a share on a queue that is no purge's",
+     [](PurgeRun& run) { run.events[lineAt(run, formats::kQueuing, 1)].queue = 900; }},
+    {"every line stands where it belongs", "an addition to another in-flight set",
+     [](PurgeRun& run) { run.events[lineAt(run, formats::kInFlight, 1)].queue = 900; }},
+    {"every line stands where it belongs", "a reply that leaves another in-flight set",
+     [](PurgeRun& run) { run.events[removalAt(run, "poor")].queue = 900; }},
+    {"every line stands where it belongs", "a failure that leaves another in-flight set",
+     [](PurgeRun& run) { run.events[removalAt(run, "broken")].queue = 900; }},
     {"each client gets exactly one answer", "two answers",
      [](PurgeRun& run) { repeat(run, clientAnswerAt(run)); }},
     {"each client gets exactly one answer", "no answer",
@@ -177,8 +202,7 @@ const Fault kShares[] = {
     {"every service is offered its first share before any its second", "a second one between",
      [](PurgeRun& run) {
        const std::size_t last_of_first = lineAt(run, formats::kInFlight, 0, names("broken", 2));
-       insertAfter(run, last_of_first, line(run, lineAt(run, formats::kQueuing)));
-       run.events[last_of_first + 1].thread = 900;
+       offerAfter(run, last_of_first);
      }},
     {"every service is offered its first share before any its second", "out of order",
      [](PurgeRun& run) {
@@ -222,23 +246,11 @@ const Fault kInFlight[] = {
     {"the in-flight set follows requests and their ends", "added while in flight",
      [](PurgeRun& run) { drop(run, lineAt(run, formats::kAlreadyIn)); }},
     {"every request ends once", "a reply that does not remove",
-     [](PurgeRun& run) {
-       drop(run, lineAt(run, formats::kInFlight, 0, [](const LogLine& one) {
-              return textField(one, 1) == "removing" && textField(one, 2) == "poor";
-            }));
-     }},
+     [](PurgeRun& run) { drop(run, removalAt(run, "poor")); }},
     {"every request ends once", "a failure that does not remove",
-     [](PurgeRun& run) {
-       drop(run, lineAt(run, formats::kInFlight, 0, [](const LogLine& one) {
-              return textField(one, 1) == "removing" && textField(one, 2) == "broken";
-            }));
-     }},
+     [](PurgeRun& run) { drop(run, removalAt(run, "broken")); }},
     {"a met share is followed by another offer", "one offer too many",
-     [](PurgeRun& run) {
-       const std::size_t end = lineAt(run, formats::kResult);
-       insertAfter(run, end, line(run, lineAt(run, formats::kQueuing)));
-       run.events[end + 1].thread = 900;
-     }},
+     [](PurgeRun& run) { offerAfter(run, lineAt(run, formats::kResult)); }},
 };
 
 // Amounts and statistics.

@@ -306,7 +306,8 @@ INSTANTIATE_TEST_SUITE_P(
                       Misread{67344, "ARecordThatCouldNotBeDeletedWhileTheDiskFailed"},
                       Misread{116327, "TwoPurgesOfLowSpaceThatCannotBeToldApart"},
                       Misread{148319, "ALateAnswerWithoutDictionaryInPlaceOfTheOutcome"},
-                      Misread{169372, "ASilentPingInALifeThatIsNotTheLast"}),
+                      Misread{169372, "ASilentPingInALifeThatIsNotTheLast"},
+                      Misread{695183, "TwoAnswersWithoutDictionaryForEqualSharesInOneMoment"}),
     [](const ::testing::TestParamInfo<Misread>& one) { return std::string(one.param.what); });
 
 TEST(OneRun, LeavingOutElementsLeavesThemOutOfThePlan) {

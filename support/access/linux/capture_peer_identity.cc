@@ -7,11 +7,11 @@
 
 #include <array>
 #include <cerrno>
-#include <charconv>
 #include <string>
 #include <utility>
 
 #include "support/access/cgroup_unit.h"
+#include "support/access/fdinfo_pid.h"
 
 namespace spacekeep::access {
 namespace {
@@ -85,19 +85,10 @@ std::optional<std::string> readProcFile(const std::string& path) {
   }
 }
 
-/// The process number behind a pidfd as this /proc shows it. None once the process is gone.
+/// As this /proc shows it. None once the process is gone.
 std::optional<int> pidOf(int pidfd) {
   const auto text = readProcFile("/proc/self/fdinfo/" + std::to_string(pidfd));
-  if (!text) return std::nullopt;
-  constexpr std::string_view kField = "\nPid:";
-  const std::size_t at = text->find(kField);
-  if (at == std::string::npos) return std::nullopt;
-  const char* number = text->c_str() + at + kField.size();
-  while (*number == ' ' || *number == '\t') ++number;
-  int pid = 0;
-  const auto [end, problem] = std::from_chars(number, text->c_str() + text->size(), pid);
-  const bool is_whole = problem == std::errc() && (*end == '\n' || *end == '\0');
-  return is_whole && pid > 0 ? std::optional<int>(pid) : std::nullopt;
+  return text ? pidFromFdinfo(*text) : std::nullopt;
 }
 
 bool stillRuns(int pidfd) {
@@ -115,22 +106,33 @@ std::optional<std::string> unitOf(int pidfd) {
   return systemUnitFromCgroup(*cgroup);
 }
 
-}  // namespace
-
-std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd) {
+std::optional<ucred> readCredentials(int fd) {
   ucred credentials{};
   socklen_t bytes = sizeof(credentials);
-  if (::getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &credentials, &bytes) < 0) return nullptr;
-  if (bytes != sizeof(credentials)) return nullptr;
+  if (::getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &credentials, &bytes) < 0) return std::nullopt;
+  if (bytes != sizeof(credentials)) return std::nullopt;
   // What a socket without a peer answers.
   if (credentials.uid == static_cast<uid_t>(-1) || credentials.gid == static_cast<gid_t>(-1)) {
-    return nullptr;
+    return std::nullopt;
   }
-  PeerFacts facts{.uid = credentials.uid,
-                  .gid = credentials.gid,
+  return credentials;
+}
+
+}  // namespace
+
+std::optional<uid_t> peerUid(int fd) {
+  const auto credentials = readCredentials(fd);
+  return credentials ? std::optional(credentials->uid) : std::nullopt;
+}
+
+std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd) {
+  const auto credentials = readCredentials(fd);
+  if (!credentials) return nullptr;
+  PeerFacts facts{.uid = credentials->uid,
+                  .gid = credentials->gid,
                   .groups = readGroups(fd),
                   .label = readLabel(fd),
-                  .pid = credentials.pid,
+                  .pid = credentials->pid,
                   .pidfd = readPidfd(fd),
                   .unit = std::nullopt};
   if (facts.pidfd != nullptr) facts.unit = unitOf(facts.pidfd->fd());

@@ -3,7 +3,10 @@
 // Asks the kernel who is connected to a unix socket.
 #pragma once
 
+#include <sys/types.h>
+
 #include <memory>
+#include <optional>
 
 #include "support/access/peer_identity.h"
 
@@ -13,5 +16,8 @@ namespace spacekeep::access {
 /// SO_PEERSEC, SO_PEERPIDFD). Null when the kernel does not even tell the user: such a peer has to
 /// be refused. Whatever else is unclear is left out of the identity. Does not take over `fd`.
 [[nodiscard]] std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd);
+
+/// The user alone, for what must cost little. None as above.
+[[nodiscard]] std::optional<uid_t> peerUid(int fd);
 
 }  // namespace spacekeep::access

@@ -34,7 +34,7 @@ class ConcurrentQueue::Membership {
   void leave() {
     has_left_ = true;
     --queue_.threads_;
-    if (is_idle) --queue_.idle_;
+    if (is_idle) queue_.oneLessIdle();
     // Notified under the lock: the destructor that waits for this frees the queue right after.
     queue_.worker_ended_.notifyAll();
   }
@@ -109,7 +109,7 @@ void ConcurrentQueue::startWorker() {
     thread.detach();
   } catch (const std::system_error& error) {
     --threads_;
-    --idle_;
+    oneLessIdle();
     // With other workers alive the task is only late; alone it would never run.
     if (threads_ == 0) rt::panic((options_.name + " has no worker: " + error.what()).c_str());
     return;
@@ -124,7 +124,7 @@ void ConcurrentQueue::work(Worker& self) {
   Task task;
   while (takeTask(lock, task)) {
     membership.is_idle = false;
-    --idle_;
+    oneLessIdle();
     provideWorker();
     lock.unlock();
     runTask(options_.name, task);
@@ -143,11 +143,28 @@ bool ConcurrentQueue::takeTask(Lock& lock, Task& task) {
   const std::uint64_t deadline = rt::deadlineAfterNs(options_.idle_worker_ns);
   bool in_time = true;
   while (!mayTakeTask()) {
-    if (!in_time || (stopping_ && pending_.empty())) return false;
+    if (!in_time || (stopping_ && pending_.empty()) || isSurplus()) return false;
     in_time = work_available_.waitUntil(*lock.mutex(), deadline);
   }
   task = std::move(pending_.front());
   pending_.pop_front();
+  return true;
+}
+
+void ConcurrentQueue::oneLessIdle() {
+  --idle_;
+  least_idle_ = std::min(least_idle_, idle_);
+}
+
+/// Asked by a worker that has nothing to do. Without this the most workers that were ever needed at
+/// once would stay for good, since the one that has waited longest gets the next task.
+bool ConcurrentQueue::isSurplus() {
+  if (rt::ticks() >= window_ends_) {
+    surplus_ = std::exchange(least_idle_, idle_);
+    window_ends_ = rt::deadlineAfterNs(options_.idle_worker_ns);
+  }
+  if (surplus_ == 0) return false;
+  --surplus_;
   return true;
 }
 

@@ -4,7 +4,8 @@
 // by side on worker threads. The queue keeps `parallelism` workers runnable: while a worker waits
 // inside one of the blocking primitives of this folder it does not count, and another one is
 // started if work is pending. A task that waits for another task therefore never starves it.
-// Idle workers end after a while, so an idle process keeps no wake-ups.
+// Idle workers end after a while, so an idle process keeps no wake-ups. Under steady load those end
+// of which that long none was needed: the work goes round, so each of them has some now and then.
 #pragma once
 
 #include <cstddef>
@@ -25,7 +26,7 @@ class ConcurrentQueue {
   struct Options {
     std::string name = "global";
     std::size_t parallelism = 4;                    ///< runnable workers kept at most, at least 1
-    std::uint64_t idle_worker_ns = 10'000'000'000;  ///< a worker idle for longer ends
+    std::uint64_t idle_worker_ns = 10'000'000'000;  ///< a worker idle or not needed for longer ends
   };
   struct Counts {
     std::size_t threads;  ///< workers alive
@@ -61,6 +62,8 @@ class ConcurrentQueue {
   void work(Worker& self);
   bool takeTask(Lock& lock, Task& task);
   [[nodiscard]] bool mayTakeTask() const;
+  void oneLessIdle();
+  bool isSurplus();
 
   const Options options_;
   mutable rt::Mutex mutex_;
@@ -72,6 +75,9 @@ class ConcurrentQueue {
   std::size_t idle_ = 0;  ///< alive without a task: waiting for one or about to look for one
   std::size_t blocked_ = 0;
   std::size_t peak_threads_ = 0;
+  std::uint64_t window_ends_ = 0;  ///< ticks
+  std::size_t least_idle_ = 0;     ///< of this window
+  std::size_t surplus_ = 0;        ///< workers that were idle throughout the window before
   bool stopping_ = false;
 };
 

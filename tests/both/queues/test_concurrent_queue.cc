@@ -201,6 +201,48 @@ TEST(ConcurrentQueue, ATaskThatComesJustAsTheWorkerEndsStillRuns) {
   });
 }
 
+/// Has that many workers wait at once, for a moment.
+void blockWorkers(ConcurrentQueue& queue, int workers) {
+  CountingSemaphore release(0);
+  CountingSemaphore ended(0);
+  for (int i = 0; i < workers; ++i) {
+    queue.async([&release, &ended] {
+      release.wait();
+      ended.signal();
+    });
+  }
+  while (queue.counts().blocked != static_cast<std::size_t>(workers)) rt::sleepNs(kMillisecondNs);
+  for (int i = 0; i < workers; ++i) release.signal();
+  for (int i = 0; i < workers; ++i) ended.wait();
+}
+
+TEST(ConcurrentQueue, WorkersThatTheSteadyLoadAfterABurstDoesNotNeedEnd) {
+  constexpr std::uint64_t kIdleNs = kSecondNs / 5;
+  inEverySchedule(20, [] {
+    ConcurrentQueue queue({.name = "global", .parallelism = 4, .idle_worker_ns = kIdleNs});
+    blockWorkers(queue, 20);
+    EXPECT_GE(queue.counts().threads, 20U);
+    // Each of the twenty would have a task in less than its idle time.
+    for (std::uint64_t passed_ns = 0; passed_ns < 5 * kIdleNs; passed_ns += kIdleNs / 100) {
+      queue.async([] {});
+      rt::sleepNs(kIdleNs / 100);
+    }
+    EXPECT_LE(queue.counts().threads, 5U);
+  });
+}
+
+TEST(ConcurrentQueue, WorkersThatEachBurstNeedsStayBetweenTheBursts) {
+  constexpr std::uint64_t kIdleNs = kSecondNs / 2;
+  inEverySchedule(20, [] {
+    ConcurrentQueue queue({.name = "global", .parallelism = 4, .idle_worker_ns = kIdleNs});
+    for (int burst = 0; burst < 10; ++burst) {
+      blockWorkers(queue, 20);
+      rt::sleepNs(kIdleNs / 5);
+    }
+    EXPECT_GE(queue.counts().threads, 20U);
+  });
+}
+
 TEST(ConcurrentQueue, WhatATaskCapturedIsGoneBeforeTheQueueIs) {
   inEverySchedule(50, [] {
     std::weak_ptr<int> watched;

@@ -18,7 +18,10 @@ namespace spacekeep::ipc {
 
 namespace {
 
-constexpr int kConnectionsPerTurn = 4;  // then the open connections have their turn
+// Then the open connections have their turn. More are waiting at once only when somebody connects as
+// fast as it goes, so that a pause costs nobody else much.
+constexpr int kConnectionsPerTurn = 4;
+constexpr std::uint64_t kPauseBetweenTurnsNs = 1'000'000;
 
 bool isShortage(int error) {
   return error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
@@ -69,16 +72,17 @@ void Acceptor::acceptSome() {
     if (errno == EAGAIN) return;
     if (isShortage(errno)) {
       logProblem("%s Accepting pauses: %@", "SpacekeepListener", std::strerror(errno));
-      pause();
-      return;
+      return pause(pause_ns_);
     }
     // Anything else (accept(2) names network errors of the one connection) concerns one peer only.
   }
+  pause(kPauseBetweenTurnsNs);
 }
 
-void Acceptor::pause() {
-  const std::uint64_t usec = std::max<std::uint64_t>(pause_ns_ / 1000, 1);
-  if (sd_event_add_time_relative(loop_.event(), &pause_, CLOCK_MONOTONIC, usec, 0,
+void Acceptor::pause(std::uint64_t duration_ns) {
+  const std::uint64_t usec = std::max<std::uint64_t>(duration_ns / 1000, 1);
+  // The accuracy is given, since 0 stands for a quarter of a second.
+  if (sd_event_add_time_relative(loop_.event(), &pause_, CLOCK_MONOTONIC, usec, 1000,
                                  &Acceptor::onPauseEnd, this) >= 0) {
     sd_event_source_set_enabled(readable_, SD_EVENT_OFF);
   }

@@ -29,7 +29,7 @@ class Acceptor {
   static int onReadable(sd_event_source*, int fd, std::uint32_t events, void* self);
   static int onPauseEnd(sd_event_source*, std::uint64_t usec, void* self);
   void acceptSome();
-  void pause();
+  void pause(std::uint64_t duration_ns);
 
   IpcLoop& loop_;
   const SharedDescriptor listening_;

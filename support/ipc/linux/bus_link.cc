@@ -73,17 +73,24 @@ bool BusLink::watch() {
   events_ = bus_ == nullptr ? EPOLLIN : EPOLLIN | EPOLLRDHUP | EPOLLET;
   if (sd_event_add_io(loop_.event(), &io_, fd_, events_, &BusLink::onIo, this) < 0) return false;
   waits_behind_others_ = false;
+  sd_event_source_set_priority(io_, quietPriority());
   // Who has not said who he is comes after those who have.
   setPriority(bus_ == nullptr && role_ == Authentication::Role::kServer);
   return true;
+}
+
+/// Two hundred services may answer at the same moment, so who only asks now and then comes before
+/// them. How much one user can ask is limited by the server.
+int BusLink::quietPriority() const {
+  return role_ == Authentication::Role::kServer ? SD_EVENT_PRIORITY_NORMAL - 10
+                                                : SD_EVENT_PRIORITY_NORMAL;
 }
 
 /// A peer that keeps its connection busy is served when no quiet one has anything to say, so the
 /// small call of one waits for a few messages of the others, however many connections are busy.
 void BusLink::setPriority(bool waits_behind_others) {
   if (std::exchange(waits_behind_others_, waits_behind_others) == waits_behind_others) return;
-  sd_event_source_set_priority(
-      io_, waits_behind_others ? SD_EVENT_PRIORITY_IDLE : SD_EVENT_PRIORITY_NORMAL);
+  sd_event_source_set_priority(io_, waits_behind_others ? SD_EVENT_PRIORITY_IDLE : quietPriority());
 }
 
 int BusLink::onTimeout(sd_event_source*, std::uint64_t, void* self) {
@@ -93,6 +100,10 @@ int BusLink::onTimeout(sd_event_source*, std::uint64_t, void* self) {
 
 int BusLink::onIo(sd_event_source*, int, std::uint32_t events, void* self) {
   auto* link = static_cast<BusLink*>(self);
+  if (!link->owner_.linkMayRead()) {
+    sd_event_source_set_enabled(link->io_, SD_EVENT_OFF);
+    return 0;
+  }
   if (link->bus_ == nullptr) {
     link->authenticate();
     return 0;
@@ -104,6 +115,11 @@ int BusLink::onIo(sd_event_source*, int, std::uint32_t events, void* self) {
     link->end(LinkEnd::kPeerLeft, "the peer has left");
   }
   return 0;
+}
+
+/// What came meanwhile is told at once, since the socket is watched anew.
+void BusLink::resumeReading() {
+  if (io_ != nullptr) sd_event_source_set_enabled(io_, SD_EVENT_ON);
 }
 
 void BusLink::authenticate() {

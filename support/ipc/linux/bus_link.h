@@ -40,6 +40,9 @@ class BusLink {
     virtual ~Owner() = default;
     /// Authenticated; messages may be sent from now on.
     virtual void linkReady() = 0;
+    /// Asked before anything is read, the authentication included. After a false nothing is read and
+    /// no end is noticed until resumeReading().
+    virtual bool linkMayRead() { return true; }
     /// The message is good during the call only.
     virtual void linkMessage(sd_bus_message* message) = 0;
     /// Nothing follows. Never called after close(). The owner may not destroy the link within.
@@ -65,6 +68,8 @@ class BusLink {
   /// Sends or queues the message; `bytes` is its estimated size. Answers its serial, none when it
   /// was not sent. A peer that leaves too much unread is cut off.
   std::optional<std::uint64_t> send(sd_bus_message* message, std::size_t bytes);
+  /// May follow a linkMayRead that said no, also when the link has ended.
+  void resumeReading();
   /// Closes without telling the owner. Safe within its callbacks.
   void close();
 
@@ -85,6 +90,7 @@ class BusLink {
   bool readWithDescriptors();
   bool messageWasDropped(std::size_t available);
   void updateEvents();
+  [[nodiscard]] int quietPriority() const;
   void setPriority(bool waits_behind_others);
   void forgetWritten();
   void end(LinkEnd how, const std::string& why);

@@ -36,6 +36,7 @@ struct BusServer::State : public std::enable_shared_from_this<BusServer::State> 
   explicit State(std::shared_ptr<ServerContext> shared) : context(std::move(shared)) {}
 
   void serve(const SharedDescriptor& connected, std::function<void()> on_end);
+  bool mustWait(const SharedDescriptor& connected, std::function<void()>& on_end);
   std::string refusal(const AcceptedPeer& peer) const;
   std::string admissionRefusal(AcceptedPeer& peer) const;
   void ended(std::uint64_t id, std::uint32_t uid, std::function<void()> on_end);
@@ -50,9 +51,28 @@ struct BusServer::State : public std::enable_shared_from_this<BusServer::State> 
   bool closed = false;
 };
 
+/// A user whose share is used up has new connections as soon as it has come back. Nothing but the
+/// user is looked at before. Answers false when the connection is to be served now.
+bool BusServer::State::mustWait(const SharedDescriptor& connected, std::function<void()>& on_end) {
+  UserPace& pace = context->pace;
+  const auto uid = access::peerUid(connected->fd());
+  if (closed || !uid || pace.mayGoOn(*uid)) return false;
+  const ServerLimits& limits = context->options.limits;
+  if (pace.waiting(*uid) < limits.connections_per_uid && pace.waiting() < limits.connections) {
+    pace.wait(*uid, [self = weak_from_this(), connected, on_end = std::move(on_end)] {
+      if (const auto alive = self.lock()) alive->serve(connected, on_end);
+    });
+    return true;
+  }
+  context->refusals.write("user " + std::to_string(*uid), "too many of its connections wait");
+  if (on_end) context->global.async(std::move(on_end));
+  return true;
+}
+
 /// The order matters: who the peer is comes before anything that it says, and whatever goes wrong
 /// costs this one peer its connection and nobody else.
 void BusServer::State::serve(const SharedDescriptor& connected, std::function<void()> on_end) {
+  if (mustWait(connected, on_end)) return;
   auto identity = closed ? nullptr : access::capturePeerIdentity(connected->fd());
   if (identity == nullptr) {
     if (!closed) context->refusals.write("an unknown peer", "the kernel does not tell who it is");
@@ -60,6 +80,7 @@ void BusServer::State::serve(const SharedDescriptor& connected, std::function<vo
     return;
   }
   const auto peer = std::make_shared<AcceptedPeer>(std::move(identity));
+  context->pace.spendOnConnection(peer->identity().uid());
   std::string why = refusal(*peer);
   if (why.empty()) why = admissionRefusal(*peer);
   if (!why.empty()) {
@@ -112,6 +133,7 @@ void BusServer::State::close() {
   for (const auto& [id, connection] : connections) connection->close();
   connections.clear();
   context->turns.clear();
+  context->pace.close();
   open = 0;
 }
 

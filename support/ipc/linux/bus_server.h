@@ -15,6 +15,7 @@
 #include "support/ipc/linux/ipc_loop.h"
 #include "support/ipc/linux/user_turns.h"
 #include "support/ipc/served.h"
+#include "support/ipc/user_shares.h"
 #include "support/queues/concurrent_queue.h"
 
 namespace spacekeep::ipc {
@@ -29,6 +30,7 @@ struct ServerLimits {
   std::size_t queued_messages = 256;           ///< per connection, not yet taken by the peer
   std::size_t queued_bytes = 4 * 1024 * 1024;  ///< per connection, estimated
   UserTurnLimits turns;
+  UserShareLimits shares;
   std::uint64_t accept_pause_ns = 1'000'000'000;  ///< after running out of descriptors
 };
 

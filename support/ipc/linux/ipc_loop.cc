@@ -4,6 +4,8 @@
 #include <systemd/sd-event.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <iterator>
 #include <mutex>
 #include <utility>
 
@@ -16,6 +18,8 @@ namespace {
 
 /// The loop whose duty this thread has.
 thread_local const IpcLoop* current_loop = nullptr;
+
+constexpr std::size_t kTasksPerTurn = 8;  // then the sockets are looked at
 
 }  // namespace
 
@@ -91,20 +95,28 @@ bool IpcLoop::isCurrent() const { return current_loop == this; }
 int IpcLoop::onWake(sd_event_source*, int fd, std::uint32_t, void* self) {
   std::uint64_t count = 0;
   [[maybe_unused]] const ssize_t read = ::read(fd, &count, sizeof count);
-  static_cast<IpcLoop*>(self)->runPosted();
+  static_cast<IpcLoop*>(self)->takePosted();
   return 0;
 }
 
-void IpcLoop::runPosted() {
+void IpcLoop::takePosted() {
   std::vector<Task> tasks;
   {
     const std::scoped_lock lock(inbox_->mutex_);
     tasks.swap(inbox_->posted_);
     inbox_->wake_pending_ = false;
   }
-  for (Task& task : tasks) {
+  std::move(tasks.begin(), tasks.end(), std::back_inserter(to_run_));
+}
+
+/// A few at a time: a purge posts a call for each of hundreds of services at once, and whoever has a
+/// small call is not to wait until all of them are written.
+void IpcLoop::runPosted() {
+  for (std::size_t left = std::min(to_run_.size(), kTasksPerTurn); left > 0; --left) {
+    // What a task holds is let go before the next one runs.
+    const Task task = std::move(to_run_.front());
+    to_run_.pop_front();
     task();
-    task = nullptr;  // what a task holds is let go before the next one runs
   }
 }
 
@@ -142,7 +154,7 @@ void IpcLoop::giveUpDuty() {
 }
 
 bool IpcLoop::mayStop() {
-  if (!stopping_) return false;
+  if (!stopping_ || !to_run_.empty()) return false;
   const std::scoped_lock lock(inbox_->mutex_);
   inbox_->stopped_ = inbox_->posted_.empty();
   return inbox_->stopped_;
@@ -153,8 +165,9 @@ void IpcLoop::run() {
   while (true) {
     if (!serve()) return;
     runOwn();
+    runPosted();
     if (mayStop()) break;
-    const bool idle = to_serve_.empty() && inbox_->from_duty_.empty();
+    const bool idle = to_serve_.empty() && inbox_->from_duty_.empty() && to_run_.empty();
     if (sd_event_run(event_, idle ? UINT64_MAX : 0) < 0) rt::panic("IPC: the event loop failed");
     wakeups_.fetch_add(1, std::memory_order_relaxed);
   }

@@ -90,6 +90,7 @@ class IpcLoop {
   void startThread();
   void run();
   bool mayStop();
+  void takePosted();
   void runPosted();
   void runOwn();
   /// Answers whether this thread still has the duty.
@@ -102,6 +103,7 @@ class IpcLoop {
   // IPC thread.
   bool stopping_ = false;
   std::deque<ToServe> to_serve_;
+  std::deque<Task> to_run_;  // posted by other threads
 
   std::atomic<std::uint64_t> wakeups_{0};
   rt::Mutex threads_mutex_;

@@ -73,7 +73,17 @@ void ServedConnection::linkEnded(LinkEnd end, const std::string& why) {
   if (const auto on_end = std::exchange(on_end_, nullptr)) on_end();
 }
 
+bool ServedConnection::linkMayRead() {
+  const uid_t uid = identity().uid();
+  if (context_->pace.mayGoOn(uid)) return true;
+  context_->pace.wait(uid, [weak = weak_from_this()] {
+    if (const auto self = weak.lock()) self->link_.resumeReading();
+  });
+  return false;
+}
+
 void ServedConnection::linkMessage(sd_bus_message* message) {
+  context_->pace.spendOnMessage(identity().uid(), link_.messageBytes());
   // Answers and signals are of no interest here: nothing is ever asked over this connection.
   if (sd_bus_message_is_method_call(message, nullptr, nullptr) > 0) dispatch(message);
 }
@@ -156,6 +166,7 @@ void ServedConnection::serve(sd_bus_message* call, const MethodDescription& meth
   std::uint64_t serial = 0;
   if (sd_bus_message_get_cookie(call, &serial) < 0) return;
   ++unanswered_;
+  context_->pace.spendOnCall(identity().uid(), served->mode == ServeMode::kLane);
   auto open = std::make_shared<OpenCall>(
       context_, weak_from_this(), method, serial, sd_bus_message_get_expect_reply(call) > 0,
       served->turn_per_user ? std::optional(identity().uid()) : std::nullopt);

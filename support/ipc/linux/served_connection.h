@@ -33,6 +33,7 @@ class ServedConnection final : public BusLink::Owner,
   void forgetCall() { --unanswered_; }
 
   void linkReady() override {}
+  bool linkMayRead() override;
   void linkMessage(sd_bus_message* message) override;
   void linkEnded(LinkEnd end, const std::string& why) override;
 

@@ -13,6 +13,7 @@
 #include "support/ipc/linux/ipc_loop.h"
 #include "support/ipc/linux/refusal_log.h"
 #include "support/ipc/linux/sockets.h"
+#include "support/ipc/linux/user_pace.h"
 #include "support/ipc/linux/user_turns.h"
 #include "support/ipc/served.h"
 #include "support/ipc/serving_gate.h"
@@ -27,7 +28,8 @@ struct ServerContext {
         interface(std::move(served)),
         options(std::move(server_options)),
         lanes(std::make_shared<Lanes>(global_queue)),
-        turns(options.limits.turns) {
+        turns(options.limits.turns),
+        pace(loop, options.limits.shares) {
     endpoint_rules.refuse_own_process = options.refuse_own_process;
   }
 
@@ -38,6 +40,7 @@ struct ServerContext {
   const std::shared_ptr<Lanes> lanes;  ///< any thread
   ServingGate gate;                    ///< any thread; loop is there at least while one is inside
   UserTurns turns;                     ///< IPC thread
+  UserPace pace;                       ///< IPC thread
   EndpointRules endpoint_rules;        ///< IPC thread
   RefusalLog refusals;                 ///< IPC thread
 };

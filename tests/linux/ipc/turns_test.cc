@@ -6,30 +6,11 @@
 #include <memory>
 #include <vector>
 
+#include "tests/linux/ipc/busy_loop.h"
 #include "tests/linux/ipc/ipc_world.h"
 
 namespace spacekeep::ipc::test {
 namespace {
-
-/// Keeps the IPC thread from its sockets until it is let go.
-class BusyLoop {
- public:
-  explicit BusyLoop(IpcLoop& loop) {
-    loop.post([state = state_] {
-      state->begun.signal();
-      state->released.wait();
-    });
-    state_->begun.wait();
-  }
-  void letGo() { state_->released.signal(); }
-
- private:
-  struct State {
-    CountingSemaphore begun{0};
-    CountingSemaphore released{0};
-  };
-  std::shared_ptr<State> state_ = std::make_shared<State>();
-};
 
 void sendNumber(BareClient& client, int number, const char* member = "number") {
   sd_bus_message* call = client.newCall(member);

@@ -1,8 +1,9 @@
 // Honest clients at a steady rate, each on a connection and a thread of its own.
-// Usage: soak-clients PREFIX COUNT CALLS_PER_SECOND_EACH SECONDS VOLUME...
+// Usage: soak-clients PREFIX COUNT CALLS_PER_SECOND_EACH SECONDS PROGRESS VOLUME...
 //
-// One client in five purges and queries, the others read and write state and cancel. At the end one
-// line says how many calls of each kind were answered and how many failed.
+// One client in five purges and queries, the others read and write state and cancel. The file
+// PROGRESS always holds the number of purges and queries answered so far. At the end one line says how many calls
+// of each kind were answered and how many failed.
 #include <fmt/format.h>
 #include <spacekeep/client.h>
 
@@ -22,6 +23,9 @@ namespace {
 
 struct Counts {
   std::atomic<long> purges{0}, queries{0}, reads{0}, writes{0}, cancels{0}, failed{0};
+  std::atomic<unsigned> running{0};
+
+  [[nodiscard]] long workAnswered() const { return purges + queries; }
 };
 
 class OneClient {
@@ -96,21 +100,36 @@ class OneClient {
   Counts& counts_;
 };
 
+/// The digits only ever get more, so whoever reads in between sees the old number or the new one.
+void tell(const char* path, long answered) {
+  std::FILE* file = std::fopen(path, "r+");
+  if (file == nullptr) return;
+  fmt::print(file, "{:012}\n", answered);
+  std::fclose(file);
+}
+
 }  // namespace
 
 int main(int count, char** arguments) {
-  if (count < 6) return 2;
+  if (count < 7) return 2;
   const std::string prefix = arguments[1];
   const unsigned clients = static_cast<unsigned>(std::strtoul(arguments[2], nullptr, 10));
   const double rate = std::strtod(arguments[3], nullptr);
   const auto end = Clock::now() + std::chrono::seconds(std::strtol(arguments[4], nullptr, 10));
-  const std::vector<std::string> volumes(arguments + 5, arguments + count);
+  const char* progress = arguments[5];
+  const std::vector<std::string> volumes(arguments + 6, arguments + count);
   Counts counts;
+  counts.running = clients;
   std::vector<std::thread> threads;
   for (unsigned i = 0; i < clients; ++i) {
     threads.emplace_back([&counts, &prefix, &volumes, i, rate, end] {
       OneClient(fmt::format("{}-{}", prefix, i), i + 1, volumes, counts).run(rate, end);
+      --counts.running;
     });
+  }
+  while (counts.running > 0) {
+    tell(progress, counts.workAnswered());
+    std::this_thread::sleep_for(std::chrono::seconds(1));
   }
   for (std::thread& thread : threads) thread.join();
   fmt::print(

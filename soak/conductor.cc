@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
+#include <utility>
 #include <vector>
 
 #include "soak/plan.h"
@@ -19,6 +20,7 @@ namespace {
 constexpr double kLookSeconds = 0.5;
 constexpr double kSampleSeconds = 5;
 constexpr double kProgressSeconds = 30;
+constexpr double kMostSecondsWithoutAnswer = 120;
 
 class Conductor {
  public:
@@ -30,8 +32,9 @@ class Conductor {
     for (const Step& step : plan_) {
       const double step_begin_seconds = monotonicSeconds();
       begin(step);
-      while (monotonicSeconds() < step_begin_seconds + step.seconds) look(step);
+      while (monotonicSeconds() < step_begin_seconds + step.seconds && !stands()) look(step);
       periods_.push_back({step.phase, step_begin_seconds, monotonicSeconds()});
+      if (stands()) break;
     }
     world_.waitForClients();
     return report();
@@ -45,6 +48,7 @@ class Conductor {
         return;
       case Phase::kComingUp:
         world_.startServices();
+        clients_begin_seconds_ = last_answer_seconds_ = monotonicSeconds();
         return world_.startClients(secondsAfter(Phase::kComingUp));
       case Phase::kFlooded:
         return world_.startFlood(kSocket, "everything", step.seconds);
@@ -59,6 +63,20 @@ class Conductor {
       seconds = step.phase == phase ? 0 : seconds + step.seconds;
     }
     return seconds;
+  }
+
+  /// Whoever waits for the daemon for good would otherwise only be noticed at the end.
+  bool stands() {
+    if (stands_ || clients_begin_seconds_ == 0) return stands_;
+    const long answers = World::answersOfClients();
+    const double now = monotonicSeconds();
+    if (std::exchange(last_answers_, answers) != answers) last_answer_seconds_ = now;
+    stands_ = now >= last_answer_seconds_ + kMostSecondsWithoutAnswer;
+    if (stands_) {
+      world_.addProblem(fmt::format("no purge or query of a client was answered for {} s, after {}",
+                                    kMostSecondsWithoutAnswer, answers));
+    }
+    return stands_;
   }
 
   void look(const Step& step) {
@@ -85,12 +103,14 @@ class Conductor {
     const Latencies latencies = latenciesOf(readFile(kProbeLog), periods_);
     missed += reportLatencies(latencies);
     fmt::print("\n{}{}", readFile("/tmp/clients.log"), readFile("/tmp/hostile.log"));
+    const auto services = World::servicesInQueries();
+    if (!services) world_.addProblem("the last queries were not answered");
     for (const std::string& problem : world_.problems()) fmt::print("problem: {}\n", problem);
     missed += static_cast<int>(world_.problems().size());
     fmt::print(
         "\nsoak of {:.1f} minutes: {} services of 200 in the last answers, {} crashes, p99 "
         "of a small call {} us unloaded, {} us loaded, {} us flooded, {} targets missed\n",
-        (monotonicSeconds() - begin_seconds_) / 60, World::servicesInQueries(), world_.crashes(),
+        (monotonicSeconds() - begin_seconds_) / 60, services.value_or(0), world_.crashes(),
         wholeP99(latencies, Phase::kUnloaded), wholeP99(latencies, Phase::kLoaded),
         wholeP99(latencies, Phase::kFlooded), missed);
     return missed == 0 ? 0 : 1;
@@ -105,6 +125,10 @@ class Conductor {
   double begin_seconds_ = 0;
   double next_sample_seconds_ = 0;
   double next_progress_seconds_ = 0;
+  double clients_begin_seconds_ = 0;
+  double last_answer_seconds_ = 0;
+  long last_answers_ = 0;
+  bool stands_ = false;
   std::vector<Sample> samples_;
   std::vector<Period> periods_;
 };

@@ -182,6 +182,8 @@ void pester() {
   while (!isOver()) {
     Line().push(garbage);
     Line large;
+    // As in flood().
+    if (!large.open()) std::this_thread::sleep_for(std::chrono::milliseconds(1));
     large.push(std::string(kOpening));
     large.push(huge);
     half_open.emplace_back();

@@ -41,11 +41,13 @@ Process::Process(const std::vector<std::string>& command, const std::string& log
 }
 
 Process::Process(Process&& other) noexcept
-    : pid_(std::exchange(other.pid_, -1)), status_(other.status_) {}
+    : pid_(std::exchange(other.pid_, -1)), status_(std::exchange(other.status_, std::nullopt)) {}
 
+// What was held before goes at once, not when `other` does.
 Process& Process::operator=(Process&& other) noexcept {
-  std::swap(pid_, other.pid_);
-  std::swap(status_, other.status_);
+  Process held(std::move(other));
+  std::swap(pid_, held.pid_);
+  std::swap(status_, held.status_);
   return *this;
 }
 
@@ -61,10 +63,16 @@ std::optional<int> Process::ended() {
   return status_;
 }
 
-int Process::wait() {
-  int raw = 0;
-  if (pid_ > 0 && !status_ && ::waitpid(pid_, &raw, 0) == pid_) status_ = statusOf(raw);
-  return status_.value_or(-1);
+std::optional<int> Process::wait(double patience_seconds) {
+  const double give_up_seconds = monotonicSeconds() + patience_seconds;
+  while (pid_ > 0 && !ended()) {
+    if (monotonicSeconds() >= give_up_seconds) {
+      *this = Process();
+      return std::nullopt;
+    }
+    sleepSeconds(0.02);
+  }
+  return status_;
 }
 
 std::string readFile(const std::string& path) {

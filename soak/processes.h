@@ -24,8 +24,8 @@ class Process {
   [[nodiscard]] pid_t pid() const { return pid_; }
   /// The exit status once it has ended (128 + the signal that ended it).
   std::optional<int> ended();
-  /// Waits for the end.
-  int wait();
+  /// Waits for the end, for so long. A program that has not ended by then is killed; none is answered.
+  std::optional<int> wait(double patience_seconds);
 
  private:
   pid_t pid_ = -1;

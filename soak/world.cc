@@ -28,6 +28,9 @@ constexpr int kCrashingProcesses = 4;
 constexpr int kCrashingServicesEach = 5;
 constexpr int kDeclared = 20;
 constexpr double kRestartSeconds = 2;
+// The purges and queries of ten clients go one by one, and a silent service holds up each for as
+// long as it may wait: some ten seconds.
+constexpr double kPatienceSeconds = 240;
 constexpr const char* kFilesPerSecond = "60";  // of each big process: 16 KiB a file
 
 std::vector<std::string> volumes() { return {"/volumes/a", "/volumes/b"}; }
@@ -90,10 +93,12 @@ void World::startPeers() {
   quiet_peer_ = Process({"/programs/bench/bench-bare-peer", kQuietPeer}, "/tmp/peers.log");
   flooded_peer_ = Process({"/programs/bench/bench-bare-peer", kFloodedPeer}, "/tmp/peers.log");
   // Low space comes again and again; a purge for it must not hold the queue once it has its bytes.
+  std::ofstream(kClientsProgress).close();
+  ::chmod(kClientsProgress, 0666);
   waitFor("the daemon", [] {
     return Process({"/programs/ctl/spacekeepctl", "state", "set", "SPACEKEEP_FINISH_EARLY", "true"},
                    "/tmp/setup.log")
-               .wait() == 0;
+               .wait(kPatienceSeconds) == 0;
   });
   waitFor("the bare peers", [] { return fs::exists(kQuietPeer) && fs::exists(kFloodedPeer); });
   probe_ =
@@ -135,7 +140,7 @@ void World::startCrashing(Crashing& crashing) const {
 
 void World::startClients(double seconds) {
   clients_ = Process(with({"/programs/soak/soak-clients", "client", "50", "2",
-                           std::to_string(static_cast<long>(seconds))},
+                           std::to_string(static_cast<long>(seconds)), kClientsProgress},
                           volumes()),
                      "/tmp/clients.log", kClientUser);
 }
@@ -174,18 +179,26 @@ void World::mustRun(Process& process, const std::string& name) {
 }
 
 void World::waitForClients() {
-  const int status = clients_.wait();
-  if (status != 0) problems_.push_back(fmt::format("the clients ended with status {}", status));
+  const auto status = clients_.wait(kPatienceSeconds);
+  if (!status) {
+    addProblem(fmt::format("the clients still waited for answers after {} s", kPatienceSeconds));
+  } else if (*status != 0) {
+    addProblem(fmt::format("the clients ended with status {}", *status));
+  }
 }
 
-std::size_t World::servicesInQueries() {
+long World::answersOfClients() {
+  return std::strtol(readFile(kClientsProgress).c_str(), nullptr, 10);
+}
+
+std::optional<std::size_t> World::servicesInQueries() {
   std::set<std::string> services;
   const std::regex id("\"((?:batch|crashing|declared)[0-9]*-[0-9]+)\"");
   for (const std::string& volume : volumes()) {
     std::remove("/tmp/query.log");
-    Process({"/programs/ctl/spacekeepctl", "query", volume, "--itemized", "--json"},
-            "/tmp/query.log")
-        .wait();
+    Process query({"/programs/ctl/spacekeepctl", "query", volume, "--itemized", "--json"},
+                  "/tmp/query.log");
+    if (query.wait(kPatienceSeconds) != 0) return std::nullopt;
     const std::string answer = readFile("/tmp/query.log");
     for (std::sregex_iterator found(answer.begin(), answer.end(), id), end; found != end; ++found) {
       services.insert((*found)[1]);

@@ -6,6 +6,7 @@
 #include <array>
 #include <cstddef>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -16,6 +17,7 @@ namespace soak {
 inline constexpr const char* kSocket = "/run/spacekeep/spacekeep.sock";
 inline constexpr const char* kQuietPeer = "/tmp/quiet-peer.sock";
 inline constexpr const char* kFloodedPeer = "/tmp/flooded-peer.sock";
+inline constexpr const char* kClientsProgress = "/tmp/clients.progress";
 inline constexpr const char* kProbeLog = "/tmp/probe.times";
 /// In the order in which the probe numbers them.
 inline constexpr std::array<const char*, 3> kProbed = {kSocket, kQuietPeer, kFloodedPeer};
@@ -31,14 +33,18 @@ class World {
 
   /// Starts again the services that crashed on purpose. Anything else that has ended is a problem.
   void lookAfter();
-  /// Waits until the clients have ended by themselves.
+  /// Waits until the clients have ended by themselves, or tells that they have not.
   void waitForClients();
+  /// How many purges and queries of the honest clients have been answered so far.
+  [[nodiscard]] static long answersOfClients();
+  void addProblem(const std::string& problem) { problems_.push_back(problem); }
 
   [[nodiscard]] pid_t daemon() const { return daemon_.pid(); }
   [[nodiscard]] int crashes() const { return crashes_; }
   [[nodiscard]] const std::vector<std::string>& problems() const { return problems_; }
-  /// How many different services the answers to a query of each volume name.
-  [[nodiscard]] static std::size_t servicesInQueries();
+  /// How many different services the answers to a query of each volume name. None when one is not
+  /// answered.
+  [[nodiscard]] static std::optional<std::size_t> servicesInQueries();
 
  private:
   struct Crashing {

@@ -18,3 +18,11 @@ if(SPACEKEEP_COVERAGE)
                       "SHELL:-mllvm -runtime-counter-relocation")
   string(APPEND CMAKE_EXE_LINKER_FLAGS " -fprofile-instr-generate")
 endif()
+
+# For a program without any counted source: the counting library would complain of that at each start.
+function(sk_not_counted target)
+  if(SPACEKEEP_COVERAGE)
+    target_compile_options(${target} PRIVATE -fno-profile-instr-generate -fno-coverage-mapping)
+    target_link_options(${target} PRIVATE -fno-profile-instr-generate)
+  endif()
+endfunction()

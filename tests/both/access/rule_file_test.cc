@@ -96,7 +96,7 @@ TEST(RuleFile, WhatIsBrokenAndWhy) {
   EXPECT_EQ(reason(Dictionary{{"MATCH_USER", 4294967295LL}}), ids);
   EXPECT_EQ(reason(Dictionary{{"MATCH_USER", 4294967296LL}}), ids);
   EXPECT_EQ(reason(Dictionary{{"MATCH_USER", 1.5}}), ids);
-  EXPECT_EQ(reason(Dictionary{{"MATCH_USER", Array{Array{}}}}), ids);
+  EXPECT_EQ(reason(Dictionary{{"MATCH_USER", Array{Value(Array{})}}}), ids);
   EXPECT_EQ(reason(Dictionary{{"MATCH_UNIT", 5}}),
             "MATCH_UNIT must be a text or an array of texts");
   EXPECT_EQ(reason(Dictionary{{"MATCH_LABEL", ""}}),

@@ -253,17 +253,36 @@ std::variant<Rules, RuleError> rulesOf(const Value& document, std::string_view f
   return Reader(file).read(document);
 }
 
-std::variant<Rules, RuleError> parseRules(std::span<const std::uint8_t> document,
-                                          std::string_view file) {
-  const std::variant<Value, PlistError> parsed = parsePlist(document);
+namespace {
+
+std::variant<Value, RuleError> parseDocument(std::span<const std::uint8_t> document,
+                                             std::string_view file) {
+  std::variant<Value, PlistError> parsed = parsePlist(document);
   if (const auto* error = std::get_if<PlistError>(&parsed)) {
     return RuleError{std::string(file) + ": not a property list: " + error->reason +
                      "; write it as an XML or binary property list"};
   }
-  return rulesOf(std::get<Value>(parsed), file);
+  return std::move(std::get<Value>(parsed));
+}
+
+std::variant<Rules, RuleError> rulesOrError(const std::variant<Value, RuleError>& document,
+                                            std::string_view file) {
+  if (const auto* error = std::get_if<RuleError>(&document)) return *error;
+  return rulesOf(std::get<Value>(document), file);
+}
+
+}  // namespace
+
+std::variant<Rules, RuleError> parseRules(std::span<const std::uint8_t> document,
+                                          std::string_view file) {
+  return rulesOrError(parseDocument(document, file), file);
 }
 
 std::variant<Rules, RuleError> readRules(const std::string& file) {
+  return rulesOrError(readDocument(file), file);
+}
+
+std::variant<Value, RuleError> readDocument(const std::string& file) {
   const UniqueFd fd(::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
   struct stat facts {};
   if (!fd || ::fstat(fd.get(), &facts) != 0) {
@@ -282,7 +301,7 @@ std::variant<Rules, RuleError> readRules(const std::string& file) {
   }
   if (used > kMaxPlistBytes) return RuleError{file + ": larger than 4 MiB; make it smaller"};
   bytes.resize(used);
-  return parseRules(bytes, file);
+  return parseDocument(bytes, file);
 }
 
 bool isKept(const DirectoryRule& rule, const std::string& path) {

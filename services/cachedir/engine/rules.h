@@ -61,6 +61,8 @@ struct RuleError {
 /// The same of a document that is already a value.
 [[nodiscard]] std::variant<Rules, RuleError> rulesOf(const Value& document, std::string_view file);
 [[nodiscard]] std::variant<Rules, RuleError> readRules(const std::string& file);
+/// The property list in `file`, whatever it says.
+[[nodiscard]] std::variant<Value, RuleError> readDocument(const std::string& file);
 
 /// Whether a file or directory at `path` (relative to the rule's directory) is never taken. A
 /// pattern with a slash is compared with the whole path, one without with the last component.

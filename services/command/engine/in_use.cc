@@ -1,0 +1,151 @@
+#include "services/command/engine/in_use.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+#include <memory>
+#include <string_view>
+
+#include "services/cachedir/engine/beneath.h"
+
+namespace spacekeep::command {
+namespace {
+
+struct DirectoryCloser {
+  void operator()(DIR* directory) const { ::closedir(directory); }
+};
+
+constexpr std::size_t kCommBytes = 15;  // TASK_COMM_LEN without its end, proc_pid_comm(5)
+
+std::string executableOf(const std::string& process) {
+  char target[PATH_MAX];
+  const ssize_t size = ::readlink((process + "/exe").c_str(), target, sizeof target);
+  if (size <= 0) return "";
+  std::string_view path(target, static_cast<std::size_t>(size));
+  // An upgrade replaces the file under a program that goes on running.
+  constexpr std::string_view kGone = " (deleted)";
+  if (path.ends_with(kGone)) path.remove_suffix(kGone.size());
+  return std::string(path.substr(path.rfind('/') + 1));
+}
+
+std::string commOf(const std::string& process) {
+  std::ifstream stream(process + "/comm");
+  std::string name;
+  std::getline(stream, name);
+  return name;
+}
+
+/// By the executable, and by the name that the process goes by: an interpreter's script sets it
+/// ("npm install"), and it can be read where the executable cannot.
+bool isCalled(const std::string& process, const std::string& name) {
+  if (executableOf(process) == name) return true;
+  const std::string comm = commOf(process);
+  return comm == name.substr(0, kCommBytes) || comm.substr(0, comm.find(' ')) == name;
+}
+
+bool isOurs(const std::string& process) {
+  struct stat facts {};
+  const uid_t own = ::geteuid();
+  return ::stat(process.c_str(), &facts) == 0 && (own == 0 || facts.st_uid == own);
+}
+
+bool runs(const std::string& name, const std::string& proc) {
+  const std::unique_ptr<DIR, DirectoryCloser> processes(::opendir(proc.c_str()));
+  if (!processes) return true;  // nobody can tell
+  while (const dirent* entry = ::readdir(processes.get())) {
+    if (entry->d_name[0] < '0' || entry->d_name[0] > '9') continue;
+    const std::string process = proc + "/" + entry->d_name;
+    if (isOurs(process) && isCalled(process, name)) return true;
+  }
+  return false;
+}
+
+bool livesByPidFile(const std::string& path, const std::string& proc) {
+  std::ifstream stream(path);
+  long pid = 0;
+  return stream >> pid && pid > 0 && pid <= INT_MAX &&
+         ::access((proc + "/" + std::to_string(pid)).c_str(), F_OK) == 0;
+}
+
+std::string whyNot(const Condition& condition, const std::string& proc) {
+  switch (condition.kind) {
+    case Condition::Kind::kProcess:
+      return runs(condition.subject, proc) ? condition.subject + " is running" : "";
+    case Condition::Kind::kLocked:
+      return isLocked(condition.subject, proc) ? condition.subject + " is locked" : "";
+    case Condition::Kind::kPidFile:
+      return livesByPidFile(condition.subject, proc)
+                 ? "the process of " + condition.subject + " is running"
+                 : "";
+  }
+  return "";
+}
+
+bool locks(int fd, OwnersLock::Kind kind) {
+  if (kind == OwnersLock::Kind::kFlock) return ::flock(fd, LOCK_EX | LOCK_NB) == 0;
+  struct flock whole {};
+  whole.l_type = F_WRLCK;
+  whole.l_whence = SEEK_SET;
+  // Of the description, not of the process: closing another descriptor of the file keeps it.
+  return ::fcntl(fd, F_OFD_SETLK, &whole) == 0;
+}
+
+}  // namespace
+
+std::string whyNotNow(const std::vector<Condition>& conditions, const std::string& proc) {
+  for (const Condition& condition : conditions) {
+    std::string why = whyNot(condition, proc);
+    if (!why.empty()) return why;
+  }
+  return "";
+}
+
+/// The lines of /proc/locks as proc_locks(5) describes them. Device numbers in them are those of the
+/// file system; on btrfs a file's own differ, so there the number of the inode decides alone.
+bool isLocked(const std::string& path, const std::string& proc) {
+  struct stat facts {};
+  if (::stat(path.c_str(), &facts) != 0) return false;
+  std::ifstream table(proc + "/locks");
+  for (std::string line; std::getline(table, line);) {
+    unsigned major_number = 0, minor_number = 0;
+    unsigned long long inode = 0;
+    if (std::sscanf(line.c_str(), "%*d: %*s %*s %*s %*d %x:%x:%llu", &major_number, &minor_number,
+                    &inode) != 3 ||
+        inode != facts.st_ino) {
+      continue;
+    }
+    const bool virtual_device = major(facts.st_dev) == 0;
+    if (virtual_device || makedev(major_number, minor_number) == facts.st_dev) return true;
+  }
+  return false;
+}
+
+std::string HeldLocks::take(const std::vector<OwnersLock>& wanted) {
+  for (const OwnersLock& lock : wanted) {
+    cachedir::UniqueFd fd(::open(lock.path.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK));
+    if (!fd && errno == ENOENT) continue;
+    if (!fd) return lock.path + " cannot be opened: " + cachedir::errnoText(errno);
+    if (!locks(fd.get(), lock.kind)) return lock.path + " is locked";
+    held_.push_back(std::move(fd));
+  }
+  return "";
+}
+
+std::string whoHolds(const std::vector<OwnersLock>& locks) {
+  for (const OwnersLock& lock : locks) {
+    if (isLocked(lock.path)) return lock.path + " is locked";
+  }
+  return "";
+}
+
+}  // namespace spacekeep::command

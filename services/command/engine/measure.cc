@@ -1,0 +1,139 @@
+#include "services/command/engine/measure.h"
+
+#include <fcntl.h>
+#include <fnmatch.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <charconv>
+
+#include "services/cachedir/engine/link_groups.h"
+#include "services/cachedir/engine/tree_walk.h"
+#include "services/command/base/path_patterns.h"
+
+namespace spacekeep::command {
+namespace {
+
+using cachedir::FoundFile;
+using cachedir::Root;
+using Wanted = std::function<bool(const FoundFile&)>;
+
+Measured measureIf(const std::vector<Root>& roots, const Wanted& wanted,
+                   const cachedir::CancelToken& cancel) {
+  Measured sum;
+  cachedir::LinkGroups groups;
+  cachedir::Tally tally;
+  const auto add = [&sum](std::uint64_t bytes) {
+    sum.bytes += bytes;
+    ++sum.files;
+  };
+  const auto visit = [&](const FoundFile& found) {
+    if (!wanted(found)) return;
+    if (found.links == 1) return add(found.bytes);
+    if (const auto group = groups.offer(found, 0)) add(group->bytes);
+  };
+  sum.whole = cachedir::TreeWalk(roots).forEachFile(visit, cancel, tally) &&
+              std::ranges::all_of(tally.counts, [](std::uint64_t count) { return count == 0; });
+  return sum;
+}
+
+bool matchesOne(const std::vector<std::string>& patterns, const std::string& name) {
+  return std::ranges::any_of(patterns, [&name](const std::string& pattern) {
+    return ::fnmatch(pattern.c_str(), name.c_str(), 0) == 0;
+  });
+}
+
+/// Access does not count here: tools go by when a file was written.
+std::optional<std::int64_t> modifiedNs(const FoundFile& found, const Root& root) {
+  const std::string path = cachedir::joined(found.folder->path, found.name);
+  struct stat facts {};
+  if (::fstatat(root.fd.get(), path.c_str(), &facts, AT_SYMLINK_NOFOLLOW) != 0) return std::nullopt;
+  return cachedir::nsOf(facts.st_mtim);
+}
+
+std::optional<std::uint64_t> hexadecimal(std::string_view text) {
+  std::uint64_t number = 0;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number, 16);
+  if (error != std::errc() || end != text.data() + text.size()) return std::nullopt;
+  return number;
+}
+
+}  // namespace
+
+cachedir::Rules matched(const cachedir::Rules& rules) {
+  cachedir::Rules found = rules;
+  found.directories.clear();
+  for (const cachedir::DirectoryRule& rule : rules.directories) {
+    for (std::string& path : matchesOf(rule.path)) {
+      cachedir::DirectoryRule each = rule;
+      each.path = std::move(path);
+      if (found.directories.size() < kMaxMatches) found.directories.push_back(std::move(each));
+    }
+  }
+  return found;
+}
+
+Measured measure(const std::vector<Root>& roots, const cachedir::CancelToken& cancel) {
+  return measureIf(
+      roots, [](const FoundFile&) { return true; }, cancel);
+}
+
+Measured measureThoseThatGo(const std::vector<Root>& roots, const FilesThatGo& go,
+                            std::int64_t now_ns, const cachedir::CancelToken& cancel) {
+  const std::int64_t latest_ns = now_ns - go.older_seconds * cachedir::kNsPerSecond;
+  const auto oldEnough = [&](const FoundFile& found) {
+    const auto modified_ns = modifiedNs(found, roots[found.folder->root]);
+    if (!modified_ns) return false;
+    if (go.age == FilesThatGo::Age::kModified) return *modified_ns < latest_ns;
+    const auto time_ns = journalTimeNs(found.name, *modified_ns);
+    return time_ns && *time_ns < latest_ns;
+  };
+  return measureIf(
+      roots,
+      [&](const FoundFile& found) {
+        const std::string name(found.name);
+        if (!go.patterns.empty() && !matchesOne(go.patterns, name)) return false;
+        if (matchesOne(go.keep, name)) return false;
+        return (go.older_seconds == 0 && go.age == FilesThatGo::Age::kModified) || oldEnough(found);
+      },
+      cancel);
+}
+
+Measured measureBelow(const std::vector<Root>& roots, const std::set<std::string>& paths,
+                      const cachedir::CancelToken& cancel) {
+  return measureIf(
+      roots,
+      [&](const FoundFile& found) {
+        std::string path = roots[found.folder->root].rule->path + "/" +
+                           cachedir::joined(found.folder->path, found.name);
+        // The file itself, and then each directory above it.
+        for (std::size_t end = path.size(); end != std::string::npos && end > 0;
+             end = path.rfind('/')) {
+          path.resize(end);
+          if (paths.contains(path)) return true;
+        }
+        return false;
+      },
+      cancel);
+}
+
+/// "system@SEQNUMID-SEQNUM-REALTIME.journal" was closed in order, "system@REALTIME-RANDOM.journal~"
+/// was not; REALTIME is microseconds, all numbers are hexadecimal.
+std::optional<std::int64_t> journalTimeNs(std::string_view name, std::int64_t modified_ns) {
+  const std::size_t at = name.find('@');
+  const bool closed = name.ends_with(".journal");
+  if (at == std::string_view::npos || (!closed && !name.ends_with(".journal~"))) {
+    return std::nullopt;
+  }
+  name = name.substr(at + 1, name.rfind(".journal") - at - 1);
+  const std::size_t first = name.find('-');
+  const std::size_t last = name.rfind('-');
+  if (first == std::string_view::npos || (closed == (first == last))) return std::nullopt;
+  const auto microseconds = hexadecimal(closed ? name.substr(last + 1) : name.substr(0, first));
+  if (!microseconds || *microseconds > static_cast<std::uint64_t>(INT64_MAX) / 1000) {
+    return std::nullopt;
+  }
+  return std::min(static_cast<std::int64_t>(*microseconds) * 1000, modified_ns);
+}
+
+}  // namespace spacekeep::command

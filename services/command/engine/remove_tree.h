@@ -1,0 +1,15 @@
+// Thread safety: pure function over the file system.
+//
+// Removes a directory with all that is in it, by descriptors, and never what is mounted inside or what
+// a symbolic link names.
+#pragma once
+
+#include "services/cachedir/engine/cancel_token.h"
+
+namespace spacekeep::command {
+
+/// `name` in the directory `folder_fd`. False when something stayed: an error, another mount, more
+/// than 100 directories deep, or a cancel; a later call goes on.
+[[nodiscard]] bool removeTree(int folder_fd, const char* name, const cachedir::CancelToken& cancel);
+
+}  // namespace spacekeep::command

@@ -1,0 +1,206 @@
+#include "services/command/engine/tool_cache.h"
+
+#include <sys/statvfs.h>
+
+#include <algorithm>
+
+#include "services/cachedir/engine/space_return.h"
+#include "services/command/engine/in_use.h"
+#include "services/command/engine/measure.h"
+#include "services/command/engine/output_amount.h"
+#include "support/runtime/runtime.h"
+
+namespace spacekeep::command {
+namespace {
+
+using cachedir::OpenedRoots;
+using cachedir::Root;
+
+std::uint64_t freeBytesOf(const Root& root) {
+  struct statvfs facts {};
+  if (::fstatvfs(root.fd.get(), &facts) != 0) return 0;
+  return static_cast<std::uint64_t>(facts.f_bavail) * facts.f_frsize;
+}
+
+void replaceAll(std::string& text, std::string_view what, const std::string& by) {
+  for (std::size_t at = text.find(what); at != std::string::npos;
+       at = text.find(what, at + by.size())) {
+    text.replace(at, what.size(), by);
+  }
+}
+
+Words withAmounts(Words words, std::uint64_t amount, std::uint64_t occupied) {
+  for (std::string& word : words) {
+    replaceAll(word, "{AMOUNT}", std::to_string(amount));
+    replaceAll(word, "{KEEP}", std::to_string(occupied - std::min(occupied, amount)));
+  }
+  return words;
+}
+
+bool dependsOnAmount(const Words& words) {
+  return std::ranges::any_of(words, [](const std::string& word) {
+    return word.find("{AMOUNT}") != std::string::npos || word.find("{KEEP}") != std::string::npos;
+  });
+}
+
+bool onOneFileSystem(const std::vector<Root>& roots) {
+  return std::ranges::all_of(
+      roots, [&](const Root& root) { return root.file_system == roots.front().file_system; });
+}
+
+}  // namespace
+
+/// Why none of the tools is here, empty when one is. Its absence is no problem: caches of programs
+/// that nobody installed are empty.
+std::string CacheOfTool::absence() const {
+  std::string missing;
+  for (const auto& step : tool().steps) {
+    if (!step) continue;
+    if (!whereIs(step->command.front()).empty()) return "";
+    missing = step->command.front();
+  }
+  return missing + " is not installed";
+}
+
+std::optional<std::uint64_t> CacheOfTool::wouldFree(const CleanStep& step,
+                                                    const std::vector<Root>& roots,
+                                                    const CancelToken& cancel,
+                                                    std::vector<std::string>& problems) const {
+  if (const auto* go = std::get_if<FilesThatGo>(&step.preview)) {
+    return measureThoseThatGo(roots, *go, rt::wallClockNs(), cancel).bytes;
+  }
+  const auto* told = std::get_if<ToldByTool>(&step.preview);
+  if (told == nullptr) return std::nullopt;
+  const ToolRun run = runTool(told->command, environment_, told->limit_ns, cancel);
+  if (!run.good()) {
+    if (run.end != ToolEnd::kCancelled) problems.push_back(problemOf(told->command, run));
+    return std::nullopt;
+  }
+  if (told->amount.kind == AmountInOutput::Kind::kPaths) {
+    return measureBelow(roots, pathsIn(run.output, told->amount.after), cancel).bytes;
+  }
+  auto amount = amountIn(run.output, told->amount);
+  if (!amount) {
+    problems.push_back(textOf(told->command) + " printed no amount where the rule looks for one");
+    return std::nullopt;
+  }
+  // A tool may count what others share, or lies elsewhere.
+  return std::min(*amount, measure(roots, cancel).bytes);
+}
+
+Offer CacheOfTool::offer(const std::optional<std::string>& volume,
+                         const CancelToken& cancel) const {
+  Offer offer;
+  const cachedir::Rules rules = matched(tool().measured);
+  OpenedRoots opened = openRoots(rules, volume);
+  offer.problems = std::move(opened.problems);
+  if (opened.roots.empty()) return offer;
+  offer.note = absence();
+  if (offer.note.empty()) offer.note = whyNotNow(rule().not_while);
+  if (!offer.note.empty()) return offer;
+  std::uint64_t so_far = 0;
+  bool unknown = false;
+  for (std::size_t i = 0; i < kUrgencies; ++i) {
+    if (const auto& step = tool().steps[i]) {
+      const auto amount = wouldFree(*step, opened.roots, cancel, offer.problems);
+      unknown = !amount;
+      so_far = std::max(so_far, amount.value_or(0));
+    }
+    offer.bytes[i] = so_far;
+    offer.unknown[i] = unknown;
+  }
+  return offer;
+}
+
+/// One request: the mildest command first, the next only while something is missing.
+class CacheOfTool::Cleaning {
+ public:
+  Cleaning(const CacheOfTool& cache, const Request& request, const CancelToken& cancel,
+           const Visitor& visit)
+      : cache_(cache),
+        request_(request),
+        cancel_(cancel),
+        visit_(visit),
+        rules_(matched(cache.tool().measured)),
+        opened_(openRoots(rules_, request.volume)) {
+    result_.problems = opened_.problems;
+  }
+
+  Result result() {
+    if (opened_.roots.empty() || isNotNow()) return std::move(result_);
+    const std::uint64_t free_before = freeBytesOf(opened_.roots.front());
+    cachedir::SpaceReturn space(opened_.roots.front().fd.get());
+    const Measured before = measure(opened_.roots, cancel_);
+    const bool steady = freeBytesOf(opened_.roots.front()) == free_before;
+    occupied_ = before.bytes;
+    for (int urgency = 1; urgency <= request_.urgency && !satisfied(); ++urgency) {
+      const auto& step = cache_.tool().steps[static_cast<std::size_t>(urgency - 1)];
+      if (step) play(*step);
+    }
+    if (request_.dry_run || result_.bytes == 0) return std::move(result_);
+    space.add(result_.bytes);
+    space.wait(cancel_);
+    if (steady && onOneFileSystem(opened_.roots)) capByGain(free_before);
+    return std::move(result_);
+  }
+
+ private:
+  bool isNotNow() {
+    result_.note = cache_.absence();
+    if (result_.note.empty()) result_.note = whyNotNow(cache_.rule().not_while);
+    return !result_.note.empty();
+  }
+
+  [[nodiscard]] bool satisfied() const {
+    return result_.bytes >= request_.amount || cancel_.cancelled();
+  }
+
+  void play(const CleanStep& step) {
+    const std::uint64_t missing = request_.amount - result_.bytes;
+    const Words words = withAmounts(step.command, missing, occupied_);
+    std::uint64_t freed = 0;
+    if (request_.dry_run) {
+      std::uint64_t all =
+          cache_.wouldFree(step, opened_.roots, cancel_, result_.problems).value_or(0);
+      if (dependsOnAmount(step.command)) all = std::min(all, request_.amount);
+      freed = all - std::min(all, result_.bytes);  // what milder commands took is in it
+    } else {
+      const ToolRun run = runTool(words, cache_.environment_, step.limit_ns, cancel_);
+      if (!run.good() && run.end != ToolEnd::kCancelled && run.end != ToolEnd::kAbsent) {
+        result_.problems.push_back(problemOf(words, run));
+      }
+      // What has gone has gone, wanted or not: the count after a cancel is made all the same.
+      const std::uint64_t left = measure(opened_.roots, CancelToken()).bytes;
+      freed = occupied_ - std::min(occupied_, left);
+      occupied_ = left;
+    }
+    result_.bytes += freed;
+    if (visit_ && freed > 0) visit_(textOf(words), freed);
+  }
+
+  /// The volume stood still before, so what it did not gain did not come back.
+  void capByGain(std::uint64_t free_before) {
+    const std::uint64_t now = freeBytesOf(opened_.roots.front());
+    result_.bytes = std::min(result_.bytes, now - std::min(now, free_before));
+  }
+
+  const CacheOfTool& cache_;
+  const Request& request_;
+  const CancelToken& cancel_;
+  const Visitor& visit_;
+  const cachedir::Rules rules_;
+  const OpenedRoots opened_;
+  std::uint64_t occupied_ = 0;
+  Result result_;
+};
+
+Result CacheOfTool::free(const Request& request, const CancelToken& cancel,
+                         const Visitor& visit) const {
+  if (request.periodic || request.amount == 0 || request.urgency < 1 ||
+      request.urgency > kUrgencies) {
+    return {};
+  }
+  return Cleaning(*this, request, cancel, visit).result();
+}
+
+}  // namespace spacekeep::command

@@ -1,0 +1,241 @@
+#include "services/command/engine/whole_directories.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdio>
+#include <set>
+
+#include "services/cachedir/engine/ages.h"
+#include "services/cachedir/engine/beneath.h"
+#include "services/cachedir/engine/link_groups.h"
+#include "services/cachedir/engine/remover.h"
+#include "services/cachedir/engine/roots.h"
+#include "services/cachedir/engine/space_return.h"
+#include "services/cachedir/engine/tree_walk.h"
+#include "services/command/base/path_patterns.h"
+#include "services/command/engine/measure.h"
+#include "services/command/engine/remove_tree.h"
+#include "support/runtime/runtime.h"
+
+namespace spacekeep::command {
+namespace {
+
+using cachedir::Root;
+
+constexpr std::uint64_t kScanKeptNs = 1'000'000'000;
+
+/// One directory and what a look at it told.
+struct Unit {
+  const cachedir::DirectoryRule* rule = nullptr;
+  std::int64_t used_ns = 0;  // wall clock, of its youngest file
+  std::uint64_t bytes = 0;
+  bool in_use = false;
+  bool whole = true;  // everything in it could be looked at
+};
+
+Unit look(const std::vector<Root>& roots, std::size_t index, const cachedir::OpenFiles& open_files,
+          const CancelToken& cancel) {
+  Unit unit{.rule = roots[index].rule};
+  cachedir::LinkGroups groups;
+  cachedir::Tally tally;
+  const auto visit = [&](const cachedir::FoundFile& found) {
+    unit.used_ns = std::max(unit.used_ns, found.used_ns);
+    unit.in_use = unit.in_use || open_files.holds(found.inode, roots[index].file_system);
+    if (found.links == 1) {
+      unit.bytes += found.bytes;
+    } else if (const auto group = groups.offer(found, 0)) {
+      unit.bytes += group->bytes;
+    }
+  };
+  unit.whole = cachedir::TreeWalk(roots).walkRoot(index, visit, cancel, tally) &&
+               std::ranges::all_of(tally.counts, [](std::uint64_t count) { return count == 0; });
+  return unit;
+}
+
+/// All that could go, with what they were found by.
+struct Units {
+  cachedir::OpenedRoots opened;
+  std::vector<Unit> units;
+  std::vector<std::string> problems;
+};
+
+Units unitsOf(const cachedir::Rules& rules, const std::optional<std::string>& volume,
+              const CancelToken& cancel) {
+  Units found;
+  found.opened = openRoots(rules, volume);
+  found.problems = found.opened.problems;
+  cachedir::OpenFiles open_files;
+  const auto& roots = found.opened.roots;
+  if (roots.empty() || !open_files.scan(roots, cancel)) return found;
+  for (std::size_t i = 0; i < roots.size() && !cancel.cancelled(); ++i) {
+    Unit unit = look(roots, i, open_files, cancel);
+    if (unit.bytes > 0 && unit.whole && !unit.in_use) found.units.push_back(unit);
+  }
+  return found;
+}
+
+std::string folderOf(const std::string& path) { return path.substr(0, path.rfind('/')); }
+std::string nameOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
+
+/// Whether every single file could go now, by the checks that come right before a deletion.
+struct Checked {
+  bool all = false;
+  std::uint64_t bytes = 0;  // that would come back
+};
+
+class Check {
+ public:
+  Check(const std::string& path, cachedir::OpenFiles& open_files, const CancelToken& cancel)
+      : cancel_(cancel), open_files_(open_files) {
+    rules_.directories.push_back({.path = path});
+    opened_ = openRoots(rules_, std::nullopt);
+  }
+
+  Checked result() {
+    if (opened_.roots.empty() || !open_files_.ensure(opened_.roots, kScanKeptNs, cancel_))
+      return {};
+    cachedir::Remover remover(opened_.roots, open_files_, {.dry_run = true, .take_empty = true});
+    Checked checked{.all = true};
+    for (const cachedir::Candidate& candidate : candidates()) {
+      if (cancel_.cancelled()) return {};
+      const auto outcome = remover.take(candidate, cancel_);
+      const auto* removal = std::get_if<cachedir::Removal>(&outcome);
+      if (removal == nullptr) return {};
+      checked.bytes += removal->bytes;
+    }
+    checked.all = checked.all && whole_;
+    return checked;
+  }
+
+ private:
+  /// Files of which a name is elsewhere are not among them: only a name of theirs goes.
+  std::vector<cachedir::Candidate> candidates() {
+    std::vector<cachedir::Candidate> found;
+    cachedir::LinkGroups groups;
+    cachedir::Tally tally;
+    const auto visit = [&](const cachedir::FoundFile& file) {
+      if (file.links == 1) {
+        found.push_back(cachedir::candidateOf(file, 0));
+      } else if (auto group = groups.offer(file, 0)) {
+        found.push_back(std::move(*group));
+      }
+    };
+    whole_ = cachedir::TreeWalk(opened_.roots).forEachFile(visit, cancel_, tally) &&
+             std::ranges::all_of(tally.counts, [](std::uint64_t count) { return count == 0; });
+    return found;
+  }
+
+  const CancelToken& cancel_;
+  cachedir::OpenFiles& open_files_;
+  cachedir::Rules rules_;
+  cachedir::OpenedRoots opened_;
+  bool whole_ = false;
+};
+
+std::uint64_t occupiedBy(const std::string& path) {
+  cachedir::Rules rules;
+  rules.directories.push_back({.path = path});
+  const cachedir::OpenedRoots opened = openRoots(rules, std::nullopt);
+  return measure(opened.roots, CancelToken()).bytes;
+}
+
+/// Removes one directory; the bytes that come back, 0 when it is in use after all. After a cancel
+/// the rest waits for the next request, under a name that nobody looks for.
+std::uint64_t removeUnit(const std::string& path, cachedir::OpenFiles& open_files,
+                         const CancelToken& cancel, std::vector<std::string>& problems) {
+  const std::string name = nameOf(path);
+  const std::string going = kGoingPrefix + name;
+  const std::string going_path = folderOf(path) + "/" + going;
+  const cachedir::UniqueFd folder = cachedir::openDirectoryWithoutLinks(folderOf(path));
+  const auto rename = [&folder](const std::string& from, const std::string& to) {
+    return ::renameat2(folder.get(), from.c_str(), folder.get(), to.c_str(), RENAME_NOREPLACE) == 0;
+  };
+  if (!folder || !rename(name, going)) {
+    problems.push_back(path + ": cannot be renamed: " + cachedir::errnoText(errno));
+    return 0;
+  }
+  const Checked checked = Check(going_path, open_files, cancel).result();
+  if (!checked.all) {
+    if (!rename(going, name)) {
+      problems.push_back(path + ": in use, and made anew meanwhile; the old one is " + going_path);
+    }
+    return 0;
+  }
+  if (removeTree(folder.get(), going.c_str(), cancel)) return checked.bytes;
+  if (!cancel.cancelled()) problems.push_back(going_path + ": not all of it could be removed");
+  return checked.bytes - std::min(checked.bytes, occupiedBy(going_path));
+}
+
+/// What a cancel or a crash left half removed, next to the directories of these rules.
+std::uint64_t finishOldWork(const cachedir::Rules& rules, const CancelToken& cancel) {
+  std::set<std::string> folders;
+  for (const auto& rule : rules.directories) folders.insert(folderOf(rule.path));
+  std::uint64_t freed = 0;
+  for (const std::string& folder : folders) {
+    for (const std::string& path : matchesOf(folder + "/" + kGoingPrefix + "*")) {
+      const cachedir::UniqueFd fd = cachedir::openDirectoryWithoutLinks(folder);
+      const std::uint64_t before = occupiedBy(path);
+      if (!fd || cancel.cancelled()) return freed;
+      const bool gone = removeTree(fd.get(), nameOf(path).c_str(), cancel);
+      freed += gone ? before : before - std::min(before, occupiedBy(path));
+    }
+  }
+  return freed;
+}
+
+}  // namespace
+
+cachedir::Estimate estimateWhole(const cachedir::Rules& rules,
+                                 const std::optional<std::string>& volume,
+                                 const CancelToken& cancel) {
+  cachedir::Estimate sum;
+  Units found = unitsOf(rules, volume, cancel);
+  sum.problems = std::move(found.problems);
+  const std::int64_t now_ns = rt::wallClockNs();
+  for (const Unit& unit : found.units) {
+    const int mildest = cachedir::mildestUrgency(*unit.rule, unit.used_ns, now_ns);
+    for (auto i = static_cast<std::size_t>(mildest - 1); i < kUrgencies; ++i) {
+      sum.bytes[i] += unit.bytes;
+      ++sum.files[i];
+    }
+  }
+  return sum;
+}
+
+WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::FreeRequest& request,
+                      const CancelToken& cancel, const Visitor& visit) {
+  WholeResult result;
+  if (!request.dry_run) result.bytes = finishOldWork(rules, cancel);
+  Units found = unitsOf(rules, request.volume, cancel);
+  result.problems = std::move(found.problems);
+  std::ranges::sort(found.units, {}, [](const Unit& unit) { return unit.used_ns; });
+  const std::int64_t now_ns = rt::wallClockNs();
+  if (found.units.empty()) return result;
+  const std::uint64_t old_work = result.bytes;
+  cachedir::OpenFiles open_files;
+  cachedir::SpaceReturn space(found.opened.roots.front().fd.get());
+  for (const Unit& unit : found.units) {
+    if (result.bytes >= request.amount || cancel.cancelled()) break;
+    if (cachedir::mildestUrgency(*unit.rule, unit.used_ns, now_ns) > request.urgency) continue;
+    const std::string& path = unit.rule->path;
+    std::uint64_t bytes = 0;
+    if (request.dry_run) {
+      const Checked checked = Check(path, open_files, cancel).result();
+      bytes = checked.all ? checked.bytes : 0;
+    } else {
+      bytes = removeUnit(path, open_files, cancel, result.problems);
+    }
+    result.bytes += bytes;
+    if (visit && bytes > 0) visit(path + "/", bytes);
+  }
+  if (!request.dry_run) {
+    space.add(result.bytes - old_work);
+    space.wait(cancel);
+  }
+  return result;
+}
+
+}  // namespace spacekeep::command

@@ -83,8 +83,12 @@ class MountTree {
   std::map<std::int32_t, std::vector<std::size_t>> children_;
 };
 
+/// Holds device nodes, also where a service manager or a container makes it a tmpfs of a few inodes:
+/// one that is always full, and where nobody has anything to give.
+constexpr std::string_view kDeviceFolder = "/dev";
+
 bool countsAsVolume(const MountEntry& mount) {
-  if (mount.read_only) return false;
+  if (mount.read_only || mount.mount_point == kDeviceFolder) return false;
   const FileSystemKind kind = kindOf(mount);
   return kind == FileSystemKind::kLocal ||
          (kind == FileSystemKind::kRootLocal && mount.mount_point == "/");

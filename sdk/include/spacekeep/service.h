@@ -124,7 +124,7 @@ struct SocketOptions : ServiceOptions {
   /// A listening unix stream socket, which becomes the host's. None: the one that the service
   /// manager handed over (sd_listen_fds(3): LISTEN_PID, LISTEN_FDS).
   std::optional<int> listening_fd;
-  /// Besides root and the process's own user.
+  /// Besides root, the account "_spacekeep" of the installed daemon, and the process's own user.
   std::optional<uid_t> allowed_uid;
   /// Stop once nothing has been asked for this long. None: never.
   std::optional<std::chrono::milliseconds> stop_when_idle;

@@ -53,6 +53,12 @@ TEST(LocalMounts, ATypicalMachineInMountOrder) {
             (Paths{"/", "/run", "/data"}));
 }
 
+TEST(LocalMounts, AFolderOfDeviceNodesIsNoVolumeWhenItIsATmpfsButWhatIsMountedInItIs) {
+  EXPECT_EQ(volumes({mount(1, 0, "/", "ext4", 254), mount(2, 1, "/dev", "tmpfs"),
+                     mount(3, 2, "/dev/shm", "tmpfs"), mount(4, 1, "/devices", "tmpfs")}),
+            (Paths{"/", "/dev/shm", "/devices"}));
+}
+
 TEST(LocalMounts, AnOverlayCountsAsTheRootOnly) {
   EXPECT_EQ(volumes({mount(1, 0, "/", "overlay"), mount(2, 1, "/layers", "overlay")}),
             (Paths{"/"}));

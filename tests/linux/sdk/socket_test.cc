@@ -19,6 +19,7 @@
 #include <string>
 #include <thread>
 
+#include "sdk/daemon_account.h"
 #include "sdk/socket_loop.h"
 #include "tests/linux/sdk/fake_daemon.h"
 #include "tests/linux/sdk/test_service.h"
@@ -262,6 +263,11 @@ int readAsUser(uid_t user, const std::string& path) {
   int status = 0;
   waitpid(child, &status, 0);
   return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+TEST(DaemonAccount, AnAccountHasItsNumberAndAMissingOneHasNone) {
+  EXPECT_EQ(accountNumber("root"), uid_t{0});
+  EXPECT_EQ(accountNumber("no such account"), std::nullopt);
 }
 
 TEST_F(SocketTest, AForeignUserIsCutOffAndAnAllowedOneIsNot) {

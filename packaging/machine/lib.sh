@@ -26,7 +26,7 @@ show() {
 # inside COMMAND...: runs it in the machine, as root.
 inside() {
   nsenter -t "$init" -m -u -i -n -p -C -T -r -w env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin HOME=/root \
-    LANG=C.UTF-8 DEBIAN_FRONTEND=noninteractive "$@"
+    LANG=C.UTF-8 PYTHONDONTWRITEBYTECODE=1 DEBIAN_FRONTEND=noninteractive "$@"
 }
 inside_sh() { inside sh -c "$1"; }
 property() { inside systemctl show -p "$2" --value "$1"; }
@@ -106,7 +106,7 @@ is_up() { inside systemctl is-system-running | grep -qE '^(running|degraded)$'; 
 
 stop_machine() {
   [ -n "${init:-}" ] || return 0
-  inside systemctl poweroff --force >/dev/null 2>&1 || true
+  inside systemctl poweroff >/dev/null 2>&1 || true
   until_true 60 test ! -e "/proc/$init" || kill -KILL "$init" 2>/dev/null || true
   wait "$outer" 2>/dev/null || true
   init=

@@ -1,8 +1,9 @@
 # The daily pass by the machine's clock. The second start of the machine has a boot clock that is 25
 # hours ahead, given by the kernel (time_namespaces(7)); the daemon is the installed one.
 
-runs() { inside_sh "journalctl -q -b 0 -u spacekeepd SPACEKEEP_OPERATION=performPeriodicsWithInfo -o cat | wc -l"; }
+runs() { inside_sh "journalctl -q -u spacekeepd SPACEKEEP_OPERATION=performPeriodicsWithInfo -o cat | wc -l"; }
 recorded() { inside_sh 'stat -c %y /var/lib/spacekeep/com.quorvel.Spacekeep.daily.run'; }
+record_is_newer_than() { [ "$(recorded)" != "$1" ]; }
 pass_has_run() { [ "$(runs)" -gt "$1" ]; }
 
 trace_without_delay() {
@@ -33,8 +34,8 @@ walk_daily() {
   echo "  started again; the boot clock says $(inside cut -d. -f1 /proc/uptime) s"
   check "the clock is 25 hours further" test "$(inside cut -d. -f1 /proc/uptime)" -gt 90000
   check "the daemon has come up with the machine" until_true 30 inside systemctl is-active spacekeepd.service
-  check "the pass of the day has run" until_true 60 test "$(recorded)" != "$before"
-  check "and asked the services of each volume" until_true 60 pass_has_run 0
+  check "the pass of the day has run" until_true 60 record_is_newer_than "$before"
+  check "and asked the services of each volume" until_true 60 pass_has_run "$first"
   inside rm -r /etc/spacekeep
   inside systemctl restart spacekeepd.service
 }

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "sim/program/play.h"
+#include "sim/program/progress.h"
 
 namespace spacekeep::sim {
 namespace {
@@ -20,11 +21,16 @@ namespace {
 constexpr std::uint64_t kMostStoriesPrinted = 50;
 constexpr char kLineBreak = '\x1f';
 
+/// A child process says how far it is that often.
+constexpr double kSecondsBetweenReports = 0.25;
+
 /// A child process and what it has said so far.
 struct Job {
   pid_t process = -1;
   int output = -1;
   std::string unread;
+  std::uint64_t runs = 0;
+  std::uint64_t failed = 0;
 };
 
 double secondsNow() {
@@ -54,8 +60,16 @@ std::string onOneLine(std::string story) {
 }
 
 [[noreturn]] void work(const Options& options, unsigned index, int output) {
+  double reported_seconds = secondsNow();
+  const auto report = [&](const Played& so_far) {
+    const double now = secondsNow();
+    if (now - reported_seconds < kSecondsBetweenReports) return;
+    reported_seconds = now;
+    writeLine(output, "+ " + std::to_string(so_far.runs) + " " + std::to_string(so_far.failed));
+  };
   const Played played = playSeeds(
-      options, index, [&](const std::string& story) { writeLine(output, onOneLine(story)); });
+      options, index, [&](const std::string& story) { writeLine(output, onOneLine(story)); },
+      report);
   writeLine(output, "= " + std::to_string(played.runs) + " " + std::to_string(played.failed) + " " +
                         std::to_string(played.repeated) + " " + std::to_string(played.steps) + " " +
                         std::to_string(played.virtual_seconds));
@@ -72,62 +86,116 @@ Job startJob(const Options& options, unsigned index) {
     work(options, index, ends[1]);
   }
   close(ends[1]);
-  return {process, ends[0], {}};
+  return {.process = process, .output = ends[0], .unread = {}};
 }
 
-/// Adds up the summary line of a job, prints any other line, which is a story.
-void takeLine(const std::string& line, Played& total, std::uint64_t& printed) {
-  unsigned long long runs = 0;
-  unsigned long long failed = 0;
-  unsigned long long repeated = 0;
-  unsigned long long steps = 0;
-  unsigned long long seconds = 0;
-  if (std::sscanf(line.c_str(), "= %llu %llu %llu %llu %llu", &runs, &failed, &repeated, &steps,
-                  &seconds) == 5) {
-    total.runs += runs;
-    total.failed += failed;
-    total.repeated += repeated;
-    total.steps += steps;
-    total.virtual_seconds += seconds;
-  } else if (printed++ < kMostStoriesPrinted) {
-    std::string story = line;
-    std::replace(story.begin(), story.end(), kLineBreak, '\n');
-    std::printf("%s\n", story.c_str());
-    std::fflush(stdout);
+/// What the jobs say, as it comes in.
+class Listener {
+ public:
+  Listener(std::vector<Job>& jobs, std::uint64_t seeds)
+      : jobs_(jobs),
+        seeds_(seeds),
+        is_terminal_(isatty(STDERR_FILENO) == 1),
+        start_seconds_(secondsNow()),
+        pace_(is_terminal_, start_seconds_) {}
+
+  void readAll() {
+    std::vector<pollfd> waiting;
+    for (const Job& job : jobs_) waiting.push_back({job.output, POLLIN, 0});
+    std::size_t open = jobs_.size();
+    while (open > 0) {
+      if (poll(waiting.data(), waiting.size(), 1000) < 0 && errno != EINTR) return;
+      for (std::size_t i = 0; i < jobs_.size(); ++i) {
+        if (waiting[i].fd < 0 || waiting[i].revents == 0) continue;
+        if (readSome(jobs_[i])) continue;
+        waiting[i].fd = -1;
+        --open;
+      }
+      if (open > 0 && pace_.isDue(secondsNow())) showProgress();
+    }
+    clearLine();
   }
-}
 
-/// Answers false once the job has closed its output.
-bool readSome(Job& job, Played& total, std::uint64_t& printed) {
-  char buffer[4096];
-  const ssize_t count = read(job.output, buffer, sizeof buffer);
-  if (count < 0 && errno == EINTR) return true;
-  if (count <= 0) return false;
-  job.unread.append(buffer, static_cast<std::size_t>(count));
-  std::size_t newline = job.unread.find('\n');
-  while (newline != std::string::npos) {
-    takeLine(job.unread.substr(0, newline), total, printed);
-    job.unread.erase(0, newline + 1);
-    newline = job.unread.find('\n');
+  [[nodiscard]] const Played& total() const { return total_; }
+
+ private:
+  /// Answers false once the job has closed its output.
+  bool readSome(Job& job) {
+    char buffer[4096];
+    const ssize_t count = read(job.output, buffer, sizeof buffer);
+    if (count < 0 && errno == EINTR) return true;
+    if (count <= 0) return false;
+    job.unread.append(buffer, static_cast<std::size_t>(count));
+    std::size_t newline = job.unread.find('\n');
+    while (newline != std::string::npos) {
+      takeLine(job, job.unread.substr(0, newline));
+      job.unread.erase(0, newline + 1);
+      newline = job.unread.find('\n');
+    }
+    return true;
   }
-  return true;
-}
 
-void readAll(std::vector<Job>& jobs, Played& total) {
-  std::uint64_t printed = 0;
-  std::vector<pollfd> waiting;
-  for (const Job& job : jobs) waiting.push_back({job.output, POLLIN, 0});
-  std::size_t open = jobs.size();
-  while (open > 0) {
-    if (poll(waiting.data(), waiting.size(), -1) < 0 && errno != EINTR) return;
-    for (std::size_t i = 0; i < jobs.size(); ++i) {
-      if (waiting[i].fd < 0 || waiting[i].revents == 0) continue;
-      if (readSome(jobs[i], total, printed)) continue;
-      waiting[i].fd = -1;
-      --open;
+  /// How far the job is, its summary, or else a story, which is printed.
+  void takeLine(Job& job, const std::string& line) {
+    unsigned long long runs = 0;
+    unsigned long long failed = 0;
+    if (std::sscanf(line.c_str(), "+ %llu %llu", &runs, &failed) == 2) {
+      job.runs = runs;
+      job.failed = failed;
+    } else if (!takeSummary(job, line) && printed_++ < kMostStoriesPrinted) {
+      std::string story = line;
+      std::replace(story.begin(), story.end(), kLineBreak, '\n');
+      clearLine();
+      std::printf("%s\n", story.c_str());
+      std::fflush(stdout);
     }
   }
-}
+
+  bool takeSummary(Job& job, const std::string& line) {
+    unsigned long long runs = 0;
+    unsigned long long failed = 0;
+    unsigned long long repeated = 0;
+    unsigned long long steps = 0;
+    unsigned long long seconds = 0;
+    if (std::sscanf(line.c_str(), "= %llu %llu %llu %llu %llu", &runs, &failed, &repeated, &steps,
+                    &seconds) != 5) {
+      return false;
+    }
+    job.runs = runs;
+    job.failed = failed;
+    total_.runs += runs;
+    total_.failed += failed;
+    total_.repeated += repeated;
+    total_.steps += steps;
+    total_.virtual_seconds += seconds;
+    return true;
+  }
+
+  void showProgress() {
+    Progress progress;
+    progress.total = seeds_;
+    progress.elapsed_seconds = secondsNow() - start_seconds_;
+    for (const Job& job : jobs_) {
+      progress.done += job.runs;
+      progress.failed += job.failed;
+    }
+    const std::string text = progressText(progress);
+    std::fprintf(stderr, is_terminal_ ? "\r%s\x1b[K" : "%s\n", text.c_str());
+    std::fflush(stderr);
+  }
+
+  void clearLine() const {
+    if (is_terminal_) std::fputs("\r\x1b[K", stderr);
+  }
+
+  std::vector<Job>& jobs_;
+  const std::uint64_t seeds_;
+  const bool is_terminal_;
+  const double start_seconds_;
+  ProgressPace pace_;
+  Played total_;
+  std::uint64_t printed_ = 0;
+};
 
 /// Answers how many jobs did not end by themselves.
 unsigned reap(const std::vector<Job>& jobs) {
@@ -152,8 +220,9 @@ int playInProcesses(const Options& options) {
   for (unsigned index = 0; index < options.jobs; ++index) {
     jobs.push_back(startJob(options, index));
   }
-  Played total;
-  readAll(jobs, total);
+  Listener listener(jobs, options.seeds);
+  listener.readAll();
+  const Played& total = listener.total();
   const unsigned lost = reap(jobs);
   const double seconds = secondsNow() - start;
   if (options.stop_at_first && total.failed != 0) {

@@ -34,22 +34,24 @@ void tell(const std::vector<Event>& events) {
 
 }  // namespace
 
-Verdict playOnce(Scenario scenario, std::uint64_t seed, const std::vector<std::size_t>& without) {
+Verdict playOnce(Scenario scenario, std::uint64_t seed, const std::vector<std::size_t>& without,
+                 std::uint64_t schedule) {
   if (scenario == Scenario::kPurge) return verdictOn(runPurgeScenario(seed));
-  return verdictOn(playSystem(planOf(seed, without), seed));
+  return verdictOn(playSystem(planOf(seed, without), seed, schedule));
 }
 
 std::size_t elementsOf(Scenario scenario, std::uint64_t seed) {
   return scenario == Scenario::kPurge ? 0 : elementCount(deriveSystemScenario(seed));
 }
 
-Verdict tellRun(Scenario scenario, std::uint64_t seed, const std::vector<std::size_t>& without) {
+Verdict tellRun(Scenario scenario, std::uint64_t seed, const std::vector<std::size_t>& without,
+                std::uint64_t schedule) {
   if (scenario == Scenario::kPurge) {
     const PurgeRun run = runPurgeScenario(seed);
     tell(run.events);
     return verdictOn(run);
   }
-  const SystemRun run = playSystem(planOf(seed, without), seed);
+  const SystemRun run = playSystem(planOf(seed, without), seed, schedule);
   tell(run.events);
   if (run.end == SystemEnd::kSilentPing) std::printf("deadlock: silent ping\n");
   for (const std::string& blocked : run.blocked) std::printf("waits: %s\n", blocked.c_str());

@@ -21,15 +21,18 @@ struct Verdict {
   std::vector<Violation> violations;
 };
 
-/// Plays the seed without those elements of its plan (the purge scenario has none to take away).
+/// Plays the seed without those elements of its plan (the purge scenario has none to take away, and
+/// no schedule but the seed's own).
 [[nodiscard]] Verdict playOnce(Scenario scenario, std::uint64_t seed,
-                               const std::vector<std::size_t>& without = {});
+                               const std::vector<std::size_t>& without = {},
+                               std::uint64_t schedule = 0);
 
 /// How many elements the plan of that seed has.
 [[nodiscard]] std::size_t elementsOf(Scenario scenario, std::uint64_t seed);
 
 /// The same run, told event by event to the standard output.
-Verdict tellRun(Scenario scenario, std::uint64_t seed, const std::vector<std::size_t>& without);
+Verdict tellRun(Scenario scenario, std::uint64_t seed, const std::vector<std::size_t>& without,
+                std::uint64_t schedule = 0);
 
 /// The plan in words.
 [[nodiscard]] std::string planText(Scenario scenario, std::uint64_t seed,

@@ -39,6 +39,8 @@ bool applyNumber(Options& options, const std::string& name, std::uint64_t number
     options.jobs = static_cast<unsigned>(number);
   } else if (name == "--replay") {
     options.replay = number;
+  } else if (name == "--schedule") {
+    options.schedule = number;
   } else {
     return false;
   }
@@ -76,6 +78,12 @@ std::variant<Options, OptionError> parseOptions(const std::vector<std::string>& 
   }
   if (!options.without.empty() && !options.replay) {
     return OptionError{"--without goes with --replay: see --help"};
+  }
+  if (options.schedule != 0 && !options.replay) {
+    return OptionError{"--schedule goes with --replay: see --help"};
+  }
+  if (options.schedule != 0 && options.scenario == Scenario::kPurge) {
+    return OptionError{"--schedule goes with the system scenario: see --help"};
   }
   return options;
 }

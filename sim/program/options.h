@@ -25,6 +25,7 @@ struct Options {
   bool stop_at_first = false;
   std::optional<std::uint64_t> replay;
   std::vector<std::size_t> without;  ///< elements of the replayed plan to leave out, ascending
+  std::uint64_t schedule = 0;        ///< to replay another order of events than the seed's own
   bool help = false;
 };
 
@@ -44,6 +45,7 @@ inline constexpr const char* kHelp =
     "  --scenario system|purge   the whole daemon (as it is without this), or purges alone\n"
     "  --stop                    end at the first failure\n"
     "  --without 0,3,7           leave out these elements of the plan, as a failure tells\n"
+    "  --schedule K              another order of events than the seed's own, likewise\n"
     "\n"
     "Each seed stands for one plan and one schedule. Every hundredth seed is played twice, and "
     "both\n"

@@ -20,9 +20,11 @@ struct Played {
 };
 
 /// Plays the seeds of the options that are `index` modulo their number of jobs. `tell` gets the
-/// story of each failed seed, of several lines.
+/// story of each failed seed, of several lines; `played_one`, which may be empty, is called after
+/// each seed.
 Played playSeeds(const Options& options, unsigned index,
-                 const std::function<void(const std::string& story)>& tell);
+                 const std::function<void(const std::string& story)>& tell,
+                 const std::function<void(const Played& so_far)>& played_one = nullptr);
 
 /// Plays one seed and prints plan, events and verdict. Answers whether all invariants held.
 bool replaySeed(const Options& options);

@@ -51,4 +51,29 @@ Shrunk shrink(std::size_t elements, const std::function<bool(const Kept&)>& fail
   return shrunk;
 }
 
+SmallerPlan shrinkOverSchedules(
+    std::size_t elements, const std::function<bool(const Kept&, std::uint64_t schedule)>& fails,
+    unsigned max_plans, unsigned schedules) {
+  SmallerPlan smaller;
+  const auto fails_somehow = [&](const Kept& kept) {
+    for (std::uint64_t schedule = 0; schedule < schedules; ++schedule) {
+      if (!fails(kept, schedule)) continue;
+      smaller.schedule = schedule;
+      return true;
+    }
+    return false;
+  };
+  smaller.shrunk = shrink(elements, fails_somehow, max_plans);
+  return smaller;
+}
+
+std::string limitsText(const Shrunk& shrunk, std::size_t elements, unsigned schedules) {
+  const std::string tried = std::to_string(shrunk.runs) + " smaller plans, by " +
+                            std::to_string(schedules) + " schedules each";
+  if (shrunk.kept.size() == elements) {
+    return "could not be made smaller: it failed in none of " + tried;
+  }
+  return shrunk.is_minimal ? "" : "may not be the smallest: no more than " + tried + ", were tried";
+}
+
 }  // namespace spacekeep::sim

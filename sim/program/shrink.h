@@ -4,7 +4,9 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <functional>
+#include <string>
 #include <vector>
 
 namespace spacekeep::sim {
@@ -23,5 +25,22 @@ struct Shrunk {
 /// fail is why one is here.
 [[nodiscard]] Shrunk shrink(std::size_t elements, const std::function<bool(const Kept&)>& fails,
                             unsigned max_runs);
+
+/// A smaller plan, and the schedule by which it fails.
+struct SmallerPlan {
+  Shrunk shrunk;
+  std::uint64_t schedule = 0;
+};
+
+/// The same for a failure that hangs on the order of events, which changes with each element that is
+/// taken away: each smaller plan is played by schedule 0, which is the seed's own, and by further
+/// ones up to `schedules` in all, until one fails. `max_plans` bounds the plans, not the runs.
+[[nodiscard]] SmallerPlan shrinkOverSchedules(
+    std::size_t elements, const std::function<bool(const Kept&, std::uint64_t schedule)>& fails,
+    unsigned max_plans, unsigned schedules);
+
+/// What to say where not every element could be tried, or none could go; else empty.
+[[nodiscard]] std::string limitsText(const Shrunk& shrunk, std::size_t elements,
+                                     unsigned schedules);
 
 }  // namespace spacekeep::sim

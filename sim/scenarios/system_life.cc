@@ -15,9 +15,14 @@ constexpr std::int64_t kFirstWallClockNs = 1'700'000'000'000'000'000;
 // A run takes some thousands. What takes that many goes round in circles.
 constexpr std::uint64_t kMaxSteps = 1'000'000;
 
+std::uint64_t scheduleSeedOf(const SystemRun& run) {
+  const std::uint64_t own = rt::SplitMix::mix(run.seed);
+  return run.schedule == 0 ? own : rt::SplitMix::mix(own ^ run.schedule);
+}
+
 rt::ScheduleOptions optionsFor(const SystemRun& run, unsigned number, const Lasting& lasting) {
   rt::ScheduleOptions options;
-  options.seed = rt::SplitMix::mix(run.seed) + number;
+  options.seed = scheduleSeedOf(run) + number;
   options.strategy = run.seed % 2 == 0 ? rt::Strategy::kRandom : rt::Strategy::kPct;
   options.pct_depth = 2 + static_cast<unsigned>(run.seed / 2 % 4);
   options.max_steps = kMaxSteps;

@@ -44,10 +44,11 @@ class CallsOfClients {
 
 }  // namespace
 
-SystemRun playSystem(const SystemPlan& plan, std::uint64_t seed) {
+SystemRun playSystem(const SystemPlan& plan, std::uint64_t seed, std::uint64_t schedule) {
   SystemRun run;
   run.plan = plan;
   run.seed = seed;
+  run.schedule = schedule;
   Lasting lasting = lastingAtFirst(plan);
   for (unsigned number = 0; number <= plan.crashes.size(); ++number) {
     playLife(run, number, lasting);

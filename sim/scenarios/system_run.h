@@ -63,6 +63,7 @@ struct LifeOfDaemon {
 struct SystemRun {
   SystemPlan plan;
   std::uint64_t seed = 0;
+  std::uint64_t schedule = 0;
   SystemEnd end = SystemEnd::kFinished;  ///< of the first life that did not finish, if any
   std::vector<std::string> blocked;      ///< who waits for what in that life
   std::vector<LifeOfDaemon> lives;
@@ -72,7 +73,9 @@ struct SystemRun {
   std::uint64_t trace_hash = 0;                 ///< over schedules and events
 };
 
-/// The same plan and seed give the same run to the byte.
-[[nodiscard]] SystemRun playSystem(const SystemPlan& plan, std::uint64_t seed);
+/// The same plan, seed and schedule give the same run to the byte. Schedule 0 is the one that the
+/// seed itself stands for; each other number is another order of events, drawn in the same way.
+[[nodiscard]] SystemRun playSystem(const SystemPlan& plan, std::uint64_t seed,
+                                   std::uint64_t schedule = 0);
 
 }  // namespace spacekeep::sim

@@ -72,5 +72,43 @@ TEST(Shrink, NoElementsNeedNoRuns) {
             0U);
 }
 
+TEST(ShrinkOverSchedules, APlanThatFailsByAnotherScheduleIsSmaller) {
+  // Only the whole plan fails by the seed's own schedule, the fewer elements the later the one that
+  // shows it.
+  const auto fails = [](const Kept& kept, std::uint64_t schedule) {
+    return holds(kept, 4) && schedule == 9 - kept.size();
+  };
+  const SmallerPlan smaller = shrinkOverSchedules(9, fails, 1000, 10);
+  EXPECT_EQ(smaller.shrunk.kept, Kept{4});
+  EXPECT_EQ(smaller.schedule, 8U);
+}
+
+TEST(ShrinkOverSchedules, TheSeedsOwnScheduleComesFirst) {
+  const SmallerPlan smaller = shrinkOverSchedules(
+      6, [](const Kept& kept, std::uint64_t) { return holds(kept, 2); }, 1000, 10);
+  EXPECT_EQ(smaller.shrunk.kept, Kept{2});
+  EXPECT_EQ(smaller.schedule, 0U);
+}
+
+TEST(ShrinkOverSchedules, SchedulesAreBounded) {
+  std::uint64_t most = 0;
+  const auto never = [&most](const Kept&, std::uint64_t schedule) {
+    most = std::max(most, schedule);
+    return false;
+  };
+  EXPECT_EQ(shrinkOverSchedules(5, never, 1000, 7).shrunk.kept.size(), 5U);
+  EXPECT_EQ(most, 6U);
+}
+
+TEST(Shrink, WhatCouldNotBeMadeSmallerIsToldWithWhatWasTried) {
+  EXPECT_EQ(limitsText({.kept = {0, 1, 2}, .runs = 12, .is_minimal = true}, 3, 30),
+            "could not be made smaller: it failed in none of 12 smaller plans, by 30 schedules "
+            "each");
+  EXPECT_EQ(limitsText({.kept = {1}, .runs = 300, .is_minimal = false}, 3, 30),
+            "may not be the smallest: no more than 300 smaller plans, by 30 schedules each, were "
+            "tried");
+  EXPECT_EQ(limitsText({.kept = {1}, .runs = 40, .is_minimal = true}, 3, 30), "");
+}
+
 }  // namespace
 }  // namespace spacekeep::sim

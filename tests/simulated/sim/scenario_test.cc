@@ -3,6 +3,7 @@
 #include <set>
 
 #include "sim/invariants/invariants.h"
+#include "sim/program/one_run.h"
 #include "sim/program/options.h"
 #include "sim/program/play.h"
 #include "sim/scenarios/purge_run.h"
@@ -88,6 +89,25 @@ TEST(Options, ElementsCanOnlyBeLeftOutOfAReplay) {
   const auto* error = std::get_if<OptionError>(&parsed);
   ASSERT_NE(error, nullptr);
   EXPECT_EQ(error->text, "--without goes with --replay: see --help");
+}
+
+TEST(Options, AnotherScheduleIsOfAReplayOfTheWholeDaemon) {
+  const auto options = std::get<Options>(parseOptions({"--replay", "7", "--schedule", "12"}));
+  EXPECT_EQ(options.schedule, 12U);
+  EXPECT_EQ(std::get<OptionError>(parseOptions({"--schedule", "12"})).text,
+            "--schedule goes with --replay: see --help");
+  EXPECT_EQ(std::get<OptionError>(
+                parseOptions({"--scenario", "purge", "--replay", "7", "--schedule", "12"}))
+                .text,
+            "--schedule goes with the system scenario: see --help");
+}
+
+TEST(OneRun, AnotherScheduleIsAnotherOrderOfTheSamePlanAndTheSameEachTime) {
+  const Verdict own = playOnce(Scenario::kSystem, 3);
+  const Verdict other = playOnce(Scenario::kSystem, 3, {}, 5);
+  EXPECT_NE(own.hash, other.hash);
+  EXPECT_EQ(playOnce(Scenario::kSystem, 3, {}, 5).hash, other.hash);
+  EXPECT_EQ(playOnce(Scenario::kSystem, 3, {}, 0).hash, own.hash);
 }
 
 TEST(Options, TheScenarioIsOneOfTwo) {

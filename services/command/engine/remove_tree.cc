@@ -24,9 +24,15 @@ using Directory = std::unique_ptr<DIR, DirectoryCloser>;
 Directory opened(int folder_fd, const char* name) {
   cachedir::UniqueFd fd = cachedir::openBeneath(folder_fd, name, O_RDONLY | O_DIRECTORY);
   if (!fd) return nullptr;
-  // Some programs take the right to write from what they keep, and the right is the owner's to give.
+  struct stat above {};
   struct stat facts {};
-  if (::fstat(fd.get(), &facts) == 0 && (facts.st_mode & S_IRWXU) != S_IRWXU) {
+  if (::fstat(folder_fd, &above) != 0 || ::fstat(fd.get(), &facts) != 0) return nullptr;
+  if (facts.st_dev != above.st_dev) {  // a subvolume
+    errno = EXDEV;
+    return nullptr;
+  }
+  // Some programs take the right to write from what they keep, and the right is the owner's to give.
+  if ((facts.st_mode & S_IRWXU) != S_IRWXU) {
     static_cast<void>(::fchmod(fd.get(), (facts.st_mode & 07777) | S_IRWXU));
   }
   Directory directory(::fdopendir(fd.get()));

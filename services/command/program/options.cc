@@ -95,7 +95,7 @@ std::variant<Options, int> readCommandLine(int argc, char** argv) {
   app.add_option("--socket", options.socket_path, "With --check-in: the daemon's socket")
       ->capture_default_str();
   app.add_option("--allow-user", options.allowed_user,
-                 "At a handed-over socket: this user may call, besides root and the service's own");
+                 "At a handed-over socket: this user may call, too");
   app.add_option("--stop-when-idle", options.stop_when_idle_seconds,
                  "At a handed-over socket: end after so many seconds without a request")
       ->check(CLI::Range(1, 1'000'000));

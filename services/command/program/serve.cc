@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cstdio>
+#include <optional>
 #include <set>
 
 #include "services/cachedir/program/stop_signals.h"
@@ -23,15 +24,38 @@ using sdk::ServiceHost;
 constexpr const char* kServicesGroup = "spacekeep-services";
 constexpr const char* kIdOfSeveral = "com.quorvel.spacekeep.caches";
 
+constexpr std::size_t kEntryBytes = 64 * 1024;
+
+std::optional<gid_t> numberOfGroup(const char* name) {
+  std::vector<char> room(kEntryBytes);
+  group entry{};
+  group* found = nullptr;
+  if (::getgrnam_r(name, &entry, room.data(), room.size(), &found) != 0 || found == nullptr) {
+    return std::nullopt;
+  }
+  return entry.gr_gid;
+}
+
+std::optional<uid_t> numberOfUser(const std::string& name) {
+  std::vector<char> room(kEntryBytes);
+  passwd entry{};
+  passwd* found = nullptr;
+  if (::getpwnam_r(name.c_str(), &entry, room.data(), room.size(), &found) != 0 ||
+      found == nullptr) {
+    return std::nullopt;
+  }
+  return entry.pw_uid;
+}
+
 /// What the daemon sees of this process: the groups that it was started with, not those that the
 /// user has been given since.
 bool isInServicesGroup() {
-  const group* wanted = ::getgrnam(kServicesGroup);
-  if (wanted == nullptr) return false;
+  const std::optional<gid_t> wanted = numberOfGroup(kServicesGroup);
+  if (!wanted) return false;
   std::vector<gid_t> groups(static_cast<std::size_t>(std::max(0, ::getgroups(0, nullptr))));
   const int count = ::getgroups(static_cast<int>(groups.size()), groups.data());
   groups.resize(static_cast<std::size_t>(std::max(0, count)));
-  return ::getegid() == wanted->gr_gid || std::ranges::count(groups, wanted->gr_gid) > 0;
+  return ::getegid() == *wanted || std::ranges::count(groups, *wanted) > 0;
 }
 
 std::string adviceFor(const HostStatus& status) {
@@ -89,12 +113,11 @@ sdk::Result<ServiceHost> serveSocket(std::shared_ptr<CacheSet> set, const Option
   how.handlers = sdk::Handlers::kSideBySide;
   how.on_status = printStatus;
   if (!options.allowed_user.empty()) {
-    const passwd* user = ::getpwnam(options.allowed_user.c_str());
-    if (user == nullptr) {
+    how.allowed_uid = numberOfUser(options.allowed_user);
+    if (!how.allowed_uid) {
       return sdk::Error{sdk::ErrorKind::kInvalidArgument,
                         "--allow-user " + options.allowed_user + ": there is no such user"};
     }
-    how.allowed_uid = user->pw_uid;
   }
   if (options.stop_when_idle_seconds) {
     how.stop_when_idle = std::chrono::seconds(*options.stop_when_idle_seconds);

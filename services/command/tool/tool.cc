@@ -61,6 +61,8 @@ class Settings {
     ::posix_spawn_file_actions_addopen(&actions_, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
     ::posix_spawn_file_actions_adddup2(&actions_, output, STDOUT_FILENO);
     ::posix_spawn_file_actions_adddup2(&actions_, complaint, STDERR_FILENO);
+    // Not even what this process was itself given by mistake.
+    ::posix_spawn_file_actions_addclosefrom_np(&actions_, STDERR_FILENO + 1);
     // A tool that remembers where it was started must not keep a volume busy.
     ::posix_spawn_file_actions_addchdir_np(&actions_, "/");
     ::posix_spawnattr_init(&attributes_);

@@ -39,11 +39,11 @@ void handOver(int listening) {
 
 }  // namespace
 
-Program::Program(const std::vector<std::string>& arguments, int listening) {
+Program::Program(const std::vector<std::string>& arguments, int listening,
+                 const std::string& program) {
   const std::string folder = temporaryDirectory();
   out_ = folder + "/out";
   err_ = folder + "/err";
-  const std::string program = SPACEKEEP_BUILD_DIR "/services/spacekeep-cachedir";
   std::vector<char*> words{const_cast<char*>(program.c_str())};
   for (const std::string& word : arguments) words.push_back(const_cast<char*>(word.c_str()));
   words.push_back(nullptr);

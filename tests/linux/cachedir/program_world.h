@@ -10,6 +10,8 @@
 
 namespace spacekeep::cachedir {
 
+inline const std::string kCachedir = SPACEKEEP_BUILD_DIR "/services/spacekeep-cachedir";
+
 struct Ended {
   int status = -1;  // exit status, or 128 + the signal
   std::string out;
@@ -20,7 +22,8 @@ struct Ended {
 class Program {
  public:
   /// `listening` becomes the descriptor that a service manager hands over, none when negative.
-  explicit Program(const std::vector<std::string>& arguments, int listening = -1);
+  explicit Program(const std::vector<std::string>& arguments, int listening = -1,
+                   const std::string& program = kCachedir);
   ~Program();
   Program(const Program&) = delete;
   Program& operator=(const Program&) = delete;

@@ -30,6 +30,7 @@ std::vector<LineRule> ofTheCLibrary() {
   numbers.exceptions = {
       {"services/cachedir/bench/", "a measurement, started by hand"},
       {"services/cachedir/engine/", "lines of /proc, whose count of fields is looked at"},
+      {"services/command/engine/in_use.cc", "lines of /proc, whose count of fields is looked at"},
       {"sim/program/jobs.cc", "lines of the program's own children, whose count is looked at"},
       {"tests/", "a test fails when what it reads is no number"},
       {"bench/", "a benchmark reads what it has written"}};
@@ -62,6 +63,7 @@ std::vector<LineRule> ofProcesses() {
                               "execl", "posix_spawn", "posix_spawnp", "wordexp"},
                              "the service manager starts programs; the daemon starts none");
   processes.exceptions = {{"ctl/check_service/", "the tool starts the service that it checks"},
+                          {"services/command/tool/", "caches that only their owner's tool cleans"},
                           {"sim/program/jobs.cc", "a seed runs in a process of its own"},
                           {"services/cachedir/bench/", "a measurement of a fresh process"}};
   processes.planted = {"std::system(command);", "const pid_t child = ::fork();"};
@@ -73,6 +75,7 @@ std::vector<LineRule> ofProcesses() {
                                "variable that the daemon looks at");
   environment.exceptions = {
       {"sdk/service_host.cc", "whoever starts a service may put another daemon in front of it"},
+      {"services/command/base/user_folders.cc", "where a user keeps caches is said in this way"},
       {"ctl/check_service/", "where a tool may put its scratch files"},
       {"support/logging/linux/journal.cc", "the service manager says so where output goes"},
       {"ctl/style.cc", "NO_COLOR and the terminal's size are given to tools in this way"}};

@@ -1,0 +1,237 @@
+// Caches that their owner's tool cleans: here a shell script that removes files by name.
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <fstream>
+
+#include "services/command/engine/in_use.h"
+#include "services/command/engine/measure.h"
+#include "support/runtime/runtime.h"
+#include "tests/linux/command/command_world.h"
+
+namespace spacekeep::command {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+
+class ToolCacheTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    writeFile(cache_ + "/old1", kMiB, 50);
+    writeFile(cache_ + "/old2", kMiB, 50);
+    writeFile(cache_ + "/new1", kMiB, 5);
+    writeFile(cache_ + "/new2", 2 * kMiB, 5);
+  }
+  /// `tool old` and, at urgency 3, `tool ''`: removes the files whose names begin so.
+  [[nodiscard]] std::string rule(const std::string& tool, const std::string& more = "") const {
+    const auto step = [&](const char* urgency, const char* prefix, const char* days) {
+      return std::string("<key>") + urgency + "</key><dict><key>COMMAND</key>" +
+             arrayOf({tool, cache_, prefix}) +
+             "<key>AMOUNT</key><dict><key>OLDER_THAN_DAYS</key><integer>" + days +
+             "</integer></dict></dict>";
+    };
+    return "<key>MEASURE</key>" + arrayOf({cache_}) + "<key>CLEAN</key><dict>" +
+           step("1", "old", "30") + step("3", "o", "30") + step("4", "/", "0") + "</dict>" + more;
+  }
+  [[nodiscard]] std::unique_ptr<Cache> cache(const std::string& tool,
+                                             const std::string& more = "") const {
+    return makeCache(ruleFrom(rule(tool, more)), nullptr);
+  }
+  [[nodiscard]] Request request(int urgency, std::uint64_t amount = 100 * kMiB) const {
+    return {.amount = amount, .urgency = urgency, .volume = volume_.path()};
+  }
+
+  Volume volume_{"tmpfs"};
+  const std::string cache_ = volume_ / "cache";
+  // A prefix of "/" means all: an empty word would be no word.
+  const std::string tool_ =
+      shellTool("[ \"$2\" = / ] && set -- \"$1\" ''; rm -f \"$1/$2\"*; echo 9999");
+};
+
+TEST_F(ToolCacheTest, EachUrgencyTakesWhatItsCommandTakesAndTheDryRunForetellsIt) {
+  const auto all = cache(tool_);
+  const Offer offer = all->offer(volume_.path(), CancelToken());
+  EXPECT_THAT(offer.bytes, ElementsAre(2 * kMiB, 2 * kMiB, 2 * kMiB, 5 * kMiB));
+  EXPECT_THAT(offer.unknown, ElementsAre(false, false, false, false));
+  const Went mild = freeAsForetold(*all, request(2));
+  EXPECT_EQ(mild.result.bytes, 2 * kMiB);
+  EXPECT_THAT(mild.what, ElementsAre(tool_ + " " + cache_ + " old"));
+  EXPECT_TRUE(exists(cache_ + "/new1"));
+  const std::uint64_t before = volume_.freeBytes();
+  const Went hard = freeAsForetold(*all, request(4));
+  EXPECT_EQ(hard.result.bytes, 3 * kMiB);
+  EXPECT_EQ(volume_.freeBytes() - before, 3 * kMiB);
+  EXPECT_FALSE(exists(cache_ + "/new1"));
+}
+
+TEST_F(ToolCacheTest, TheMildestCommandThatSufficesIsTheLast) {
+  const Went went = freeAsForetold(*cache(tool_), request(4, kMiB));
+  EXPECT_EQ(went.result.bytes, 2 * kMiB);
+  EXPECT_TRUE(exists(cache_ + "/new2"));
+}
+
+TEST_F(ToolCacheTest, NothingIsDoneForNothingOrAtNoUrgencyOrOnAnotherVolume) {
+  const auto all = cache(tool_);
+  const Volume other("tmpfs");
+  EXPECT_EQ(freeFrom(*all, request(4, 0)).result.bytes, 0U);
+  EXPECT_EQ(freeFrom(*all, request(0)).result.bytes, 0U);
+  EXPECT_EQ(freeFrom(*all, request(5)).result.bytes, 0U);
+  Request elsewhere = request(4);
+  elsewhere.volume = other.path();
+  EXPECT_EQ(freeFrom(*all, elsewhere).result.bytes, 0U);
+  EXPECT_THAT(all->offer(other.path(), CancelToken()).bytes, ElementsAre(0, 0, 0, 0));
+  EXPECT_TRUE(exists(cache_ + "/old1"));
+}
+
+TEST_F(ToolCacheTest, WhatTheToolClaimsCountsForNothing) {
+  const std::string liar = shellTool("echo 'freed 99 GB'");
+  EXPECT_EQ(freeFrom(*cache(liar), request(4)).result.bytes, 0U);
+}
+
+TEST_F(ToolCacheTest, BytesThatDoNotComeBackAreNotClaimed) {
+  const int held = ::open((cache_ + "/new2").c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(held, 0);
+  EXPECT_EQ(cache(tool_)->free(request(4), CancelToken(), {}).bytes, 3 * kMiB);
+  ::close(held);
+}
+
+TEST_F(ToolCacheTest, ANameOfAFileThatIsLinkedElsewhereGivesNothing) {
+  ASSERT_EQ(::link((cache_ + "/new2").c_str(), (volume_ / "elsewhere").c_str()), 0);
+  EXPECT_EQ(cache(tool_)->offer(volume_.path(), CancelToken()).bytes[3], 3 * kMiB);
+  EXPECT_EQ(freeFrom(*cache(tool_), request(4)).result.bytes, 3 * kMiB);
+}
+
+TEST_F(ToolCacheTest, AToolThatIsNotThereIsNoProblemAndGivesNothing) {
+  const auto none = cache("no-such-tool");
+  const Offer offer = none->offer(volume_.path(), CancelToken());
+  EXPECT_THAT(offer.bytes, ElementsAre(0, 0, 0, 0));
+  EXPECT_EQ(offer.note, "no-such-tool is not installed");
+  const Went went = freeFrom(*none, request(4));
+  EXPECT_EQ(went.result.bytes, 0U);
+  EXPECT_EQ(went.result.note, "no-such-tool is not installed");
+  EXPECT_TRUE(went.result.problems.empty());
+}
+
+TEST_F(ToolCacheTest, AToolThatFailsIsToldAndWhatItFreedAllTheSameCounts) {
+  const std::string failing = shellTool("rm \"$1/old1\"; echo 'no more' >&2; exit 3");
+  const Went went = freeFrom(*cache(failing), request(1));
+  EXPECT_EQ(went.result.bytes, kMiB);
+  ASSERT_EQ(went.result.problems.size(), 1U);
+  EXPECT_THAT(went.result.problems[0], HasSubstr(" ended with status 3: no more"));
+}
+
+TEST_F(ToolCacheTest, ACancelEndsTheToolAndWhatWentCounts) {
+  const std::string slow = shellTool("rm \"$1/old1\"; sleep 1000; rm \"$1/old2\"");
+  const CancelToken cancel([this] { return !exists(cache_ + "/old1"); });
+  EXPECT_EQ(cache(slow)->free(request(4), cancel, {}).bytes, kMiB);
+  EXPECT_TRUE(exists(cache_ + "/old2"));
+}
+
+TEST_F(ToolCacheTest, WhileItsOwnerRunsNothingIsTaken) {
+  const std::string pid_file = volume_ / "pid";
+  const std::string lock_file = volume_ / "lock";
+  writeFile(lock_file, 1);
+  std::ofstream(pid_file) << ::getpid() << "\n";
+  const auto condition = [](const char* key, const std::string& subject) {
+    return std::string("<key>NOT_WHILE</key><array><dict><key>") + key + "</key><string>" +
+           subject + "</string></dict></array>";
+  };
+  const auto checkKept = [&](const std::string& more, const std::string& note) {
+    const auto kept = cache(tool_, more);
+    EXPECT_EQ(kept->offer(volume_.path(), CancelToken()).note, note);
+    EXPECT_EQ(freeAsForetold(*kept, request(4)).result.note, note);
+    EXPECT_TRUE(exists(cache_ + "/old1"));
+  };
+  checkKept(condition("PID_FILE", pid_file), "the process of " + pid_file + " is running");
+  checkKept(condition("PROCESS", "test_linux_command"), "test_linux_command is running");
+  {
+    const cachedir::Holder holder(
+        [&] { return ::flock(::open(lock_file.c_str(), O_RDWR), LOCK_EX) == 0; });
+    checkKept(condition("LOCKED", lock_file), lock_file + " is locked");
+  }
+  std::ofstream(pid_file) << "not a number";
+  const auto free = cache(tool_, condition("PID_FILE", pid_file));
+  EXPECT_EQ(freeAsForetold(*free, request(4)).result.bytes, 5 * kMiB);
+}
+
+TEST_F(ToolCacheTest, WhatTheToolsOwnDryRunTellsIsPromised) {
+  const std::string lists =
+      shellTool("[ \"$1\" = -n ] && exec printf 'would remove %s\\n' " + cache_ + "/old1 " +
+                cache_ + "/sub /etc/passwd; rm -r " + cache_ + "/old1 " + cache_ + "/sub");
+  writeFile(cache_ + "/sub/deep/file", kMiB);
+  const auto listed = makeCache(
+      ruleFrom("<key>MEASURE</key>" + arrayOf({cache_}) +
+               "<key>CLEAN</key><dict><key>1</key><dict>"
+               "<key>COMMAND</key>" +
+               arrayOf({lists}) + "<key>AMOUNT</key><dict><key>COMMAND</key>" +
+               arrayOf({lists, "-n"}) +
+               "<key>AFTER</key><string>would remove </string><key>PATHS</key><true/></dict></dict>"
+               "</dict>"),
+      nullptr);
+  EXPECT_EQ(listed->offer(volume_.path(), CancelToken()).bytes[0], 2 * kMiB);
+  EXPECT_EQ(freeAsForetold(*listed, request(1)).result.bytes, 2 * kMiB);
+}
+
+TEST_F(ToolCacheTest, AnAmountThatIsNotPrintedIsToldAndNotGuessed) {
+  const auto told =
+      makeCache(ruleFrom("<key>MEASURE</key>" + arrayOf({cache_}) +
+                         "<key>CLEAN</key><dict><key>1</key><dict>"
+                         "<key>COMMAND</key>" +
+                         arrayOf({tool_}) + "<key>AMOUNT</key><dict><key>COMMAND</key>" +
+                         arrayOf({"echo", "space: lots"}) +
+                         "<key>AFTER</key><string>space:</string></dict></dict></dict>"),
+                nullptr);
+  const Offer offer = told->offer(volume_.path(), CancelToken());
+  EXPECT_EQ(offer.bytes[0], 0U);
+  EXPECT_TRUE(offer.unknown[0]);
+  EXPECT_THAT(offer.problems,
+              ElementsAre("echo \"space: lots\" printed no amount where the rule looks for one"));
+}
+
+TEST_F(ToolCacheTest, APromiseIsNeverMoreThanTheDirectoriesHold) {
+  const auto told =
+      makeCache(ruleFrom("<key>MEASURE</key>" + arrayOf({cache_}) +
+                         "<key>CLEAN</key><dict><key>1</key><dict>"
+                         "<key>COMMAND</key>" +
+                         arrayOf({tool_}) + "<key>AMOUNT</key><dict><key>COMMAND</key>" +
+                         arrayOf({"echo", "1T"}) +
+                         "<key>COLUMN</key><integer>1</integer></dict></dict></dict>"),
+                nullptr);
+  EXPECT_EQ(told->offer(volume_.path(), CancelToken()).bytes[3], 5 * kMiB);
+}
+
+TEST_F(ToolCacheTest, PlaceholdersStandForTheAmountAndForWhatMayStay) {
+  const std::string notes = shellTool("echo \"$1 $2\" > " + (volume_ / "words"));
+  const auto told =
+      makeCache(ruleFrom("<key>MEASURE</key>" + arrayOf({cache_}) +
+                         "<key>CLEAN</key><dict><key>1</key><dict>"
+                         "<key>COMMAND</key>" +
+                         arrayOf({notes, "{AMOUNT}", "--size={KEEP}"}) + "</dict></dict>"),
+                nullptr);
+  static_cast<void>(freeFrom(*told, request(1, 2 * kMiB)));
+  std::ifstream stream(volume_ / "words");
+  std::string words;
+  std::getline(stream, words);
+  EXPECT_EQ(words, "2097152 --size=3145728");
+}
+
+TEST(JournalTime, ArchivedFilesAreAsOldAsTheirFirstEntryOrTheirLastWrite) {
+  const std::string closed =
+      "system@0123456789abcdef0123456789abcdef-00000000000003e8-"
+      "000005f5e1000000.journal";
+  EXPECT_EQ(journalTimeNs(closed, INT64_MAX), 0x000005f5e1000000LL * 1000);
+  EXPECT_EQ(journalTimeNs(closed, 5), 5);
+  EXPECT_EQ(journalTimeNs("user-1000@000005f5e1000000-0123456789abcdef.journal~", INT64_MAX),
+            0x000005f5e1000000LL * 1000);
+  for (const char* active : {"system.journal", "user-1000.journal", "system@x.journal",
+                             "a@b-c.journal", "system@00000000000003e8-000005f5e1000000.log"}) {
+    EXPECT_EQ(journalTimeNs(active, INT64_MAX), std::nullopt) << active;
+  }
+}
+
+}  // namespace
+}  // namespace spacekeep::command

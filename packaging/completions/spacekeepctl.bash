@@ -13,6 +13,8 @@ _spacekeepctl_matches() {
 # The options of the command in $1; those of the tool itself may stand anywhere.
 _spacekeepctl_options() {
   case $1 in
+    status) printf '%s\n' --volume ;;
+    doctor) printf '%s\n' --root ;;
     purge) printf '%s\n' --urgency --timeout --token --wait-all ;;
     query) printf '%s\n' --itemized --urgency ;;
     'state set') printf '%s\n' --type --force ;;
@@ -30,7 +32,7 @@ _spacekeepctl_option_value() {
   case $1 in
     --urgency) _spacekeepctl_matches "$2" <<<$'1\n2\n3\n4' ;;
     --type) _spacekeepctl_matches "$2" <<<$'string\nnumber\nbool\nsize\njson' ;;
-    --socket | --endpoint | --data | --in-use)
+    --socket | --endpoint | --data | --in-use | --root)
       compopt -o filenames 2>/dev/null
       mapfile -t COMPREPLY < <(compgen -f -- "$2")
       ;;
@@ -66,7 +68,7 @@ _spacekeepctl() {
         return
         ;;
       --socket | --urgency | --timeout | --token | --type | --volume | --endpoint | --data | \
-        --in-use | --patience)
+        --in-use | --patience | --root)
         local option=${COMP_WORDS[i]}
         [[ ${COMP_WORDS[i + 1]} == = ]] && ((i++))
         ((i++))
@@ -83,8 +85,8 @@ _spacekeepctl() {
     return
   fi
   case "${#words[@]} $command" in
-    '0 ') _spacekeepctl_matches "$current" <<<$'purge\nquery\nstate\nvolumes\ncancel\ncheck-service' ;;
-    '1 purge' | '1 query')
+    '0 ') _spacekeepctl_matches "$current" <<<$'status\nexplain\ndoctor\npurge\nquery\nstate\nvolumes\ncancel\ncheck-service' ;;
+    '1 explain' | '1 purge' | '1 query')
       _spacekeepctl_matches "$current" < <("$tool" "${socket[@]}" volumes --names 2>/dev/null)
       ;;
     '1 state') _spacekeepctl_matches "$current" <<<$'get\nset\nunset\nlist' ;;

@@ -25,6 +25,8 @@ walk_install() {
   check "its socket is open to everybody" inside_sh '[ "$(stat -c %a /run/spacekeep/spacekeep.sock)" = 666 ]'
   check "only root writes where services are reached" inside_sh \
     '[ "$(stat -c "%U %a" /run/spacekeep/services)" = "root 755" ]'
+  check "the daemon cannot put another folder in its place" inside_sh \
+    '[ "$(stat -c "%U %a" /run/spacekeep)" = "root 1775" ]'
   check "only the daemon reads its state" inside_sh \
     '[ "$(stat -c "%U %a" /var/lib/spacekeep)" = "_spacekeep 700" ]'
   check "the daemon and its socket come up with the machine" inside systemctl is-enabled spacekeepd.service spacekeepd.socket

@@ -1,8 +1,7 @@
 #include "services/command/engine/cache_set.h"
 
-#include <mutex>
-
 #include "support/logging/log.h"
+#include "support/runtime/locks.h"
 
 namespace spacekeep::command {
 namespace {

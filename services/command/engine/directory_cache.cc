@@ -57,6 +57,8 @@ Offer CacheOfDirectories::offer(const std::optional<std::string>& volume,
 
 Result CacheOfDirectories::free(const Request& request, const CancelToken& cancel,
                                 const Visitor& visit) const {
+  const bool sensible = request.amount > 0 && request.urgency >= 1 && request.urgency <= kUrgencies;
+  if (!request.periodic && !sensible) return {};
   Result result;
   result.note = whyNotNow(rule().not_while);
   HeldLocks locks;

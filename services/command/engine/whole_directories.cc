@@ -6,9 +6,7 @@
 
 #include <algorithm>
 #include <cstdio>
-#include <fstream>
 #include <set>
-#include <sstream>
 
 #include "services/cachedir/engine/ages.h"
 #include "services/cachedir/engine/beneath.h"
@@ -18,6 +16,7 @@
 #include "services/cachedir/engine/space_return.h"
 #include "services/cachedir/engine/tree_walk.h"
 #include "services/command/base/path_patterns.h"
+#include "services/command/engine/lived_in.h"
 #include "services/command/engine/measure.h"
 #include "services/command/engine/remove_tree.h"
 #include "support/runtime/runtime.h"
@@ -57,23 +56,6 @@ Unit look(const std::vector<Root>& roots, std::size_t index, const cachedir::Ope
   return unit;
 }
 
-/// Mount points (proc_pid_mountinfo(5)); what is mounted inside is nobody's cache.
-std::set<std::string> mountPoints() {
-  std::set<std::string> points;
-  std::ifstream table("/proc/self/mountinfo");
-  for (std::string line; std::getline(table, line);) {
-    std::istringstream fields(line);
-    std::string id, parent, device, root, point;
-    if (fields >> id >> parent >> device >> root >> point) points.insert(std::move(point));
-  }
-  return points;
-}
-
-bool hasMountBelow(const std::set<std::string>& points, const std::string& path) {
-  const auto next = points.lower_bound(path + "/");
-  return next != points.end() && next->starts_with(path + "/");
-}
-
 /// All that could go, with what they were found by.
 struct Units {
   cachedir::OpenedRoots opened;
@@ -89,11 +71,13 @@ Units unitsOf(const cachedir::Rules& rules, const std::optional<std::string>& vo
   cachedir::OpenFiles open_files;
   const auto& roots = found.opened.roots;
   if (roots.empty() || !open_files.scan(roots, cancel)) return found;
-  const std::set<std::string> mounted = mountPoints();
+  std::set<std::string> lived_in = mountPoints();
+  lived_in.merge(workingDirectories());
   for (std::size_t i = 0; i < roots.size() && !cancel.cancelled(); ++i) {
     Unit unit = look(roots, i, open_files, cancel);
-    const bool apart = !hasMountBelow(mounted, unit.rule->path);
-    if (unit.bytes > 0 && unit.whole && !unit.in_use && apart) found.units.push_back(unit);
+    if (unit.bytes == 0 || !unit.whole || unit.in_use) continue;
+    if (isAnyWithin(lived_in, unit.rule->path) || hasMeetingPoint(roots[i].fd.get())) continue;
+    found.units.push_back(unit);
   }
   return found;
 }

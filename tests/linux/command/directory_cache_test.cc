@@ -131,6 +131,13 @@ TEST_F(WholeDirectories, ADirectoryIsAsYoungAsItsYoungestFileAndTheOldestGoesFir
   EXPECT_TRUE(exists(volume_ / "all"));
 }
 
+TEST_F(WholeDirectories, NothingGoesForNothingOrAtNoUrgency) {
+  for (const Request& none : {request(0), request(5), request(-1), request(4, 0)}) {
+    EXPECT_EQ(freeFrom(*cache(), none).result.bytes, 0U);
+  }
+  EXPECT_TRUE(exists(volume_ / "all/oldest/g"));
+}
+
 TEST_F(WholeDirectories, OneFileInUseKeepsAllOfIt) {
   const cachedir::Holder holder(
       [this] { return ::open((volume_ / "all/oldest/g").c_str(), O_RDONLY) >= 0; });
@@ -171,6 +178,22 @@ TEST_F(WholeDirectories, WhatIsMountedInsideKeepsIt) {
   EXPECT_THAT(freeAsForetold(*cache(), request(1)).what, ElementsAre(volume_ / "all/older/"));
   EXPECT_TRUE(exists(volume_ / "all/oldest/mount/f"));
   cachedir::run("umount " + (volume_ / "all/oldest/mount"));
+}
+
+TEST_F(WholeDirectories, OneWhereAProgramWaitsAtASocketOrAPipeIsKept) {
+  cachedir::run("mkfifo " + (volume_ / "all/oldest/deep/pipe"));
+  cachedir::run("python3 -c \"import socket; socket.socket(socket.AF_UNIX).bind('" +
+                (volume_ / "all/older/socket") + "')\"");
+  EXPECT_THAT(offered(*cache()), ElementsAre(0, 0, 2 * kMiB, 2 * kMiB));
+  EXPECT_EQ(freeAsForetold(*cache(), request(2)).result.bytes, 0U);
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+}
+
+TEST_F(WholeDirectories, OneInWhichAProcessStandsIsKept) {
+  const cachedir::Holder holder(
+      [this] { return ::chdir((volume_ / "all/oldest/deep").c_str()) == 0; });
+  EXPECT_THAT(freeAsForetold(*cache(), request(2)).what, ElementsAre(volume_ / "all/older/"));
+  EXPECT_TRUE(exists(volume_ / "all/oldest/g"));
 }
 
 TEST_F(WholeDirectories, WhatACrashLeftIsFinishedFirstAndCounts) {

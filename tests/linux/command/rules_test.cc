@@ -29,75 +29,78 @@ TEST(Rules, AToolsRuleIsReadWithItsDefaults) {
   EXPECT_TRUE(std::holds_alternative<Unknown>(tool.steps[1]->preview));
 }
 
+std::string stepOf(const std::string& step) {
+  return "<key>MEASURE</key><array><string>/a/b</string></array><key>CLEAN</key><dict><key>1</key>"
+         "<dict>" +
+         step + "</dict></dict>";
+}
+
+const std::string kCommand = "<key>COMMAND</key><array><string>t</string></array>";
+
+/// What stands in the file, and what is said of it.
+const std::map<std::string, std::string> kBadContents = {
+    {"",
+     "FILE: neither DIRECTORIES alone nor MEASURE with CLEAN; give DIRECTORIES for caches of "
+     "files, or MEASURE and CLEAN for a tool"},
+    {"<key>DIRECTORIES</key><array/>",
+     "FILE: DIRECTORIES: not an array of dictionaries; describe each cache directory by a "
+     "dictionary with a PATH"},
+    {"<key>ENABLED</key><string>yes</string>" + kClean,
+     "FILE: ENABLED: not a boolean; give true or false"},
+    {"<key>MEASURE</key><array><string>cache</string></array><key>CLEAN</key><dict/>",
+     "FILE: MEASURE: \"cache\" is not an absolute path without \".\" and \"..\"; begin it with a "
+     "slash, ~/ or $XDG_CACHE_HOME/"},
+    {"<key>MEASURE</key><array><string>~/x</string></array><key>CLEAN</key><dict/>",
+     "FILE: MEASURE: \"~/x\" is a user's path; serve this file with --user, or write an absolute "
+     "path"},
+    {"<key>MEASURE</key><array><string>/usr</string></array><key>CLEAN</key><dict/>",
+     "FILE: MEASURE[0] PATH: \"/usr\" is a system directory; name the cache below it"},
+    {"<key>MEASURE</key><array><string>/a/b</string></array>",
+     "FILE: CLEAN: missing, or not a dictionary; give a dictionary with a COMMAND under the keys "
+     "1 "
+     "to 4, the urgencies"},
+    {"<key>MEASURE</key><array><string>/a/b</string></array><key>CLEAN</key><dict><key>5</key>"
+     "<dict/></dict>",
+     "FILE: CLEAN: unknown urgency \"5\"; the urgencies are 1 to 4"},
+    {stepOf(""),
+     "FILE: CLEAN 1 COMMAND: missing or empty; give the program and its arguments as an array of "
+     "strings"},
+    {stepOf("<key>COMMAND</key><array><string>t</string><string>{HOME}</string></array>"),
+     "FILE: CLEAN 1 COMMAND: unknown placeholder \"{HOME}\"; use {AMOUNT}, the bytes to free, or "
+     "{KEEP}, the bytes that may stay"},
+    {stepOf(kCommand + "<key>TIMEOUT_SECONDS</key><integer>0</integer>"),
+     "FILE: CLEAN 1 TIMEOUT_SECONDS: not a number from 1 to 600; give one, or leave the key out "
+     "for 60"},
+    {stepOf(kCommand + "<key>AMOUNT</key><dict>" + kCommand + "</dict>"),
+     "FILE: CLEAN 1 AMOUNT: not told where the amount stands in the output; give one of AFTER, "
+     "COLUMN and PATHS (PATHS may go with AFTER)"},
+    {stepOf(kCommand + "<key>AMOUNT</key><dict><key>AGE</key><string>OLD</string></dict>"),
+     "FILE: CLEAN 1 AMOUNT AGE: unknown age \"OLD\"; use MODIFIED or JOURNAL_NAME"},
+    {stepOf(kCommand +
+            "<key>AMOUNT</key><dict><key>OLDER_THAN_DAYS</key><integer>-1</integer></dict>"),
+     "FILE: CLEAN 1 AMOUNT OLDER_THAN_DAYS: not a number of days from 0 to 36500; give one"},
+    {"<key>NOT_WHILE</key><array><dict><key>PROCESS</key><string>a/b</string></dict></array>" +
+         kClean,
+     "FILE: NOT_WHILE[0] PROCESS: \"a/b\" holds a slash; give the executable's name without its "
+     "directory"},
+    {"<key>NOT_WHILE</key><array><dict/></array>" + kClean,
+     "FILE: NOT_WHILE[0]: not exactly one key; make one dictionary of each"},
+    {"<key>OWNERS_LOCKS</key><array><dict><key>FLOCK</key><string>/a/l</string></dict></array>" +
+         kClean,
+     "FILE: OWNERS_LOCKS: not with CLEAN, because the tool takes its locks itself; use NOT_WHILE "
+     "with LOCKED"},
+    {"<key>DIRECTORIES</key><array><dict><key>PATH</key><string>/a/b</"
+     "string><key>WHOLE_DIRECTORIES"
+     "</key><integer>1</integer></dict></array>",
+     "FILE: DIRECTORIES[0] WHOLE_DIRECTORIES: not a boolean; give true or false"},
+    {"<key>DIRECTORIES</key><array><dict><key>PATH</key><string>/a/b</string></"
+     "dict><dict><key>PATH"
+     "</key><string>/a/b/c</string></dict></array>",
+     "FILE: DIRECTORIES[1] PATH: \"/a/b/c\" overlaps \"/a/b\"; let each file stand under one "
+     "directory only"}};
+
 TEST(Rules, ABadFileIsToldInOneLineWithThePlaceAndTheWayOut) {
-  const auto clean = [](const std::string& step) {
-    return "<key>MEASURE</key><array><string>/a/b</string></array><key>CLEAN</key><dict><key>1</"
-           "key>"
-           "<dict>" +
-           step + "</dict></dict>";
-  };
-  const std::string command = "<key>COMMAND</key><array><string>t</string></array>";
-  const std::map<std::string, std::string> cases = {
-      {"",
-       "FILE: neither DIRECTORIES alone nor MEASURE with CLEAN; give DIRECTORIES for caches of "
-       "files, or MEASURE and CLEAN for a tool"},
-      {"<key>DIRECTORIES</key><array/>",
-       "FILE: DIRECTORIES: not an array of dictionaries; describe each cache directory by a "
-       "dictionary with a PATH"},
-      {"<key>ENABLED</key><string>yes</string>" + kClean,
-       "FILE: ENABLED: not a boolean; give true or false"},
-      {"<key>MEASURE</key><array><string>cache</string></array><key>CLEAN</key><dict/>",
-       "FILE: MEASURE: \"cache\" is not an absolute path without \".\" and \"..\"; begin it with a "
-       "slash, ~/ or $XDG_CACHE_HOME/"},
-      {"<key>MEASURE</key><array><string>~/x</string></array><key>CLEAN</key><dict/>",
-       "FILE: MEASURE: \"~/x\" is a user's path; serve this file with --user, or write an absolute "
-       "path"},
-      {"<key>MEASURE</key><array><string>/usr</string></array><key>CLEAN</key><dict/>",
-       "FILE: MEASURE[0] PATH: \"/usr\" is a system directory; name the cache below it"},
-      {"<key>MEASURE</key><array><string>/a/b</string></array>",
-       "FILE: CLEAN: missing, or not a dictionary; give a dictionary with a COMMAND under the keys "
-       "1 "
-       "to 4, the urgencies"},
-      {"<key>MEASURE</key><array><string>/a/b</string></array><key>CLEAN</key><dict><key>5</key>"
-       "<dict/></dict>",
-       "FILE: CLEAN: unknown urgency \"5\"; the urgencies are 1 to 4"},
-      {clean(""),
-       "FILE: CLEAN 1 COMMAND: missing or empty; give the program and its arguments as an array of "
-       "strings"},
-      {clean("<key>COMMAND</key><array><string>t</string><string>{HOME}</string></array>"),
-       "FILE: CLEAN 1 COMMAND: unknown placeholder \"{HOME}\"; use {AMOUNT}, the bytes to free, or "
-       "{KEEP}, the bytes that may stay"},
-      {clean(command + "<key>TIMEOUT_SECONDS</key><integer>0</integer>"),
-       "FILE: CLEAN 1 TIMEOUT_SECONDS: not a number from 1 to 600; give one, or leave the key out "
-       "for 60"},
-      {clean(command + "<key>AMOUNT</key><dict>" + command + "</dict>"),
-       "FILE: CLEAN 1 AMOUNT: not told where the amount stands in the output; give one of AFTER, "
-       "COLUMN and PATHS (PATHS may go with AFTER)"},
-      {clean(command + "<key>AMOUNT</key><dict><key>AGE</key><string>OLD</string></dict>"),
-       "FILE: CLEAN 1 AMOUNT AGE: unknown age \"OLD\"; use MODIFIED or JOURNAL_NAME"},
-      {clean(command +
-             "<key>AMOUNT</key><dict><key>OLDER_THAN_DAYS</key><integer>-1</integer></dict>"),
-       "FILE: CLEAN 1 AMOUNT OLDER_THAN_DAYS: not a number of days from 0 to 36500; give one"},
-      {"<key>NOT_WHILE</key><array><dict><key>PROCESS</key><string>a/b</string></dict></array>" +
-           kClean,
-       "FILE: NOT_WHILE[0] PROCESS: \"a/b\" holds a slash; give the executable's name without its "
-       "directory"},
-      {"<key>NOT_WHILE</key><array><dict/></array>" + kClean,
-       "FILE: NOT_WHILE[0]: not exactly one key; make one dictionary of each"},
-      {"<key>OWNERS_LOCKS</key><array><dict><key>FLOCK</key><string>/a/l</string></dict></array>" +
-           kClean,
-       "FILE: OWNERS_LOCKS: not with CLEAN, because the tool takes its locks itself; use NOT_WHILE "
-       "with LOCKED"},
-      {"<key>DIRECTORIES</key><array><dict><key>PATH</key><string>/a/b</"
-       "string><key>WHOLE_DIRECTORIES"
-       "</key><integer>1</integer></dict></array>",
-       "FILE: DIRECTORIES[0] WHOLE_DIRECTORIES: not a boolean; give true or false"},
-      {"<key>DIRECTORIES</key><array><dict><key>PATH</key><string>/a/b</string></"
-       "dict><dict><key>PATH"
-       "</key><string>/a/b/c</string></dict></array>",
-       "FILE: DIRECTORIES[1] PATH: \"/a/b/c\" overlaps \"/a/b\"; let each file stand under one "
-       "directory only"}};
-  for (const auto& [content, text] : cases) EXPECT_EQ(errorOf(content), text);
+  for (const auto& [content, text] : kBadContents) EXPECT_EQ(errorOf(content), text);
   EXPECT_TRUE(errorOf("<key>CLAEN</key><dict/>" + kClean)
                   .starts_with("FILE: unknown key \"CLAEN\"; the keys are SPACEKEEP_ID, "));
 }

@@ -66,6 +66,11 @@ bootstrap() {
     touch "$cache/base.done"
   fi
   cp -a "$cache/base/." "$root/"
+  # They would look for news on the network.
+  ln -sf /dev/null "$root/etc/systemd/system/apt-daily.timer"
+  ln -sf /dev/null "$root/etc/systemd/system/apt-daily-upgrade.timer"
+  # The kernel hands its audit records to the outside only.
+  ln -sf /dev/null "$root/etc/systemd/system/systemd-journald-audit.socket"
 }
 
 # What installing needs is fetched before: the machine has no network.

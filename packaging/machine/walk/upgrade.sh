@@ -20,7 +20,7 @@ walk_upgrade() {
   process=$(property spacekeepd.service MainPID)
   socket=$(inside stat -c %i /run/spacekeep/spacekeep.sock)
   inside_sh 'mkdir -p /etc/spacekeep; echo "<plist version=\"1.0\"><dict><key>LogLevel</key><integer>4</integer></dict></plist>" > /etc/spacekeep/log.plist'
-  show sh -c 'apt-get install -y --no-install-recommends --no-download /root/newer/*.deb | tail -3'
+  show sh -c 'apt-get install -y --no-install-recommends /root/newer/*.deb | tail -3'
   check "the newer version is there" inside_sh 'dpkg-query -W -f "\${Version}" spacekeep | grep -q "+later$"'
   check "the daemon runs as a new process" inside_sh \
     "systemctl -q is-active spacekeepd && [ \$(systemctl show -p MainPID --value spacekeepd) != $process ]"

@@ -1,0 +1,38 @@
+// What is installed about the interfaces is what the daemon declares.
+#include <gtest/gtest.h>
+
+#include "client/client_protocol.h"
+#include "registry/service_protocol.h"
+#include "tests/linux/packaging/packaging_world.h"
+
+namespace spacekeep::packaging {
+namespace {
+
+TEST(Interfaces, TheInstalledDocumentsAreWhatTheDaemonDeclares) {
+  std::set<fs::path> expected;
+  for (const auto* interface : {&spacekeepClientInterface(), &spacekeepServiceInterface()}) {
+    const fs::path file = kSource / "packaging/dbus" / (std::string(interface->name) + ".xml");
+    EXPECT_EQ(contentOf(file), ipc::introspectionXml(*interface)) << file;
+    expected.insert(file);
+  }
+  const auto found = filesBelow(kSource / "packaging/dbus");
+  EXPECT_EQ(std::set<fs::path>(found.begin(), found.end()), expected);
+}
+
+TEST(Interfaces, TheManualTellsOfEveryMethod) {
+  const std::string page = contentOf(kSource / "packaging/man/spacekeep-protocol.7");
+  for (const auto* interface : {&spacekeepClientInterface(), &spacekeepServiceInterface()}) {
+    for (const auto& method : interface->methods) {
+      const std::string entry = ".It Fn " + std::string(method.name);
+      EXPECT_NE(page.find(entry), std::string::npos) << entry;
+      for (const auto& argument : method.in) {
+        const std::string shown =
+            "\"" + std::string(ipc::signatureOf(argument.kind)) + " " + std::string(argument.name);
+        EXPECT_NE(page.find(shown, page.find(entry)), std::string::npos) << entry << shown;
+      }
+    }
+  }
+}
+
+}  // namespace
+}  // namespace spacekeep::packaging

@@ -44,6 +44,7 @@ walk_caches() {
   echo "  archives before: $count, after: $(archives); bytes gained on /var: $((after - before))"
   check "the volume has gained what was asked for" test $((after - before)) -ge 40000000
   check "not all of them went" test "$(archives)" -gt 0
+  check "statistics appear" until_true 20 inside test -s /run/spacekeep/metrics.prom
   before=$(archives)
   # The lock of a package manager that is at work.
   inside_sh 'exec 9>>/var/lib/dpkg/lock-frontend; python3 -c "import fcntl,subprocess;fcntl.lockf(9,fcntl.LOCK_EX);subprocess.run([\"spacekeepctl\",\"purge\",\"/var\",\"500M\",\"--urgency\",\"4\"])"' >/dev/null || true

@@ -23,8 +23,7 @@ walk_daemon() {
     'spacekeepctl state set com.example.walk kept && spacekeepctl state get com.example.walk | grep -q kept'
   check "the folder of its device nodes is no volume to it" inside_sh \
     '! spacekeepctl query /dev'
-  check "statistics appear" until_true 20 inside test -s /run/spacekeep/metrics.prom
   check "the journal has its fields" inside_sh \
     'journalctl -q -o json SYSLOG_IDENTIFIER=spacekeepd SPACEKEEP_CATEGORY=Spacekeep | grep -q SPACEKEEP_OPERATION'
-  show systemd-analyze security --no-pager spacekeepd.service
+  show sh -c 'systemd-analyze security --no-pager spacekeepd.service | grep -v ✓'
 }

@@ -75,12 +75,12 @@ bootstrap() {
 
 # What installing needs is fetched before: the machine has no network.
 fetch_dependencies() {
-  mkdir -p "$root/root/debs"
-  cp "$out"/*.deb "$root/root/debs/"
-  rm -f "$root/root/debs/"*dbgsym*
+  mkdir -p "$root/srv/debs"
+  cp "$out"/*.deb "$root/srv/debs/"
+  rm -f "$root/srv/debs/"*dbgsym*
   cp /etc/resolv.conf "$root/etc/resolv.conf"
   chroot "$root" apt-get update -qq
-  chroot "$root" sh -c 'apt-get install -y -qq -d --no-install-recommends /root/debs/*.deb' >/dev/null
+  chroot "$root" sh -c 'apt-get install -y -qq -d --no-install-recommends /srv/debs/*.deb' >/dev/null
   # A cache of the package manager as machines have it.
   chroot "$root" apt-get install -y -qq -d --no-install-recommends $cached_packages >/dev/null
   rm -f "$root/etc/resolv.conf"

@@ -2,7 +2,7 @@
 
 files_of_the_machine() {
   inside_sh 'find / -xdev \( -path /proc -o -path /sys -o -path /dev -o -path /run -o -path /tmp \
-      -o -path /root/debs -o -path /var/cache/apt -o -path /var/lib/apt -o -path /var/log \) -prune -o -print;
+      -o -path /srv/debs -o -path /var/cache/apt -o -path /var/lib/apt -o -path /var/log \) -prune -o -print;
     find /var -xdev \( -path /var/cache/apt -o -path /var/lib/apt -o -path /var/log \) -prune -o -print' |
     sort -u
 }
@@ -15,7 +15,7 @@ walk_install() {
   say "Installing the packages"
   files_of_the_machine > "$work/files.before"
   inside_sh 'dpkg -l | grep -c ^ii' > "$work/packages.before"
-  show sh -c 'apt-get install -y --no-install-recommends /root/debs/*.deb | tail -3'
+  show sh -c 'apt-get install -y --no-install-recommends /srv/debs/*.deb | tail -3'
   show sh -c 'dpkg -l "*spacekeep*" | tail -n +6'
   echo "  packages that came along: $(($(inside_sh 'dpkg -l | grep -c ^ii') - $(cat "$work/packages.before")))"
   check "the packages are installed and configured" inside_sh \

@@ -23,8 +23,8 @@ walk_users() {
   check "she may ask how much there is" alice_query
   check "but not have it freed" fails alice_purge
   show spacekeepctl purge / 15M --urgency 2
-  echo "  thumbnails left: $(inside_sh 'ls /home/alice/.cache/thumbnails/normal | wc -l') of 40"
-  check "old thumbnails of hers went" inside_sh '[ $(ls /home/alice/.cache/thumbnails/normal | wc -l) -lt 40 ]'
+  echo "  thumbnails left: $(inside_sh 'ls ~alice/.cache/thumbnails/normal | wc -l') of 40"
+  check "old thumbnails of hers went" inside_sh '[ $(ls ~alice/.cache/thumbnails/normal | wc -l) -lt 40 ]'
 }
 alice_query() { alice spacekeepctl query /; }
 alice_purge() { alice spacekeepctl purge / 1M; }

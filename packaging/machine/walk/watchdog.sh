@@ -3,10 +3,10 @@
 walk_watchdog() {
   say "A silent service wedges the registry"
   local before since=$SECONDS
-  cp "$here/silent_service.py" "$root/root/"
+  cp "$here/silent_service.py" "$root/srv/"
   before=$(property spacekeepd.service MainPID)
   check "it checks in and says nothing until the daemon goes" \
-    inside timeout 150 python3 /root/silent_service.py /run/spacekeep/spacekeep.sock 140
+    inside timeout 150 python3 /srv/silent_service.py /run/spacekeep/spacekeep.sock 140
   check "the daemon is there again, as another process" until_true 30 inside_sh \
     "systemctl -q is-active spacekeepd && [ \$(systemctl show -p MainPID --value spacekeepd) != $before ]"
   echo "  the whole took $((SECONDS - since)) s"

@@ -5,6 +5,7 @@
 #include "support/access/linux/load_rules.h"
 #include "support/ipc/linux/bus_listener.h"
 #include "support/ipc/linux/sockets.h"
+#include "support/linux/process_limits.h"
 #include "support/linux/token.h"
 #include "support/logging/log.h"
 #include "support/preferences/linux/sqlite_suite.h"
@@ -59,7 +60,7 @@ LinuxEventSources::Options eventOptions(const LinuxPaths& paths) {
 
 LinuxPlatform::LinuxPlatform(const ipc::InterfaceDescription& service_interface, LinuxPaths paths)
     : paths_(std::move(paths)),
-      global_({}),
+      global_({.on_less_to_do = &giveBackFreeMemory}),
       loop_(std::make_shared<EventLoop>()),
       reserve_(std::make_shared<ReserveFile>(paths_.state_directory + "/reserve")),
       volumes_(paths_.mount_table),

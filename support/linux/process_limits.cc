@@ -12,6 +12,8 @@ void raiseDescriptorLimit() {
   static_cast<void>(setrlimit(RLIMIT_NOFILE, &files));
 }
 
+void giveBackFreeMemory() { static_cast<void>(malloc_trim(0)); }
+
 void limitHeapArenas() { static_cast<void>(mallopt(M_ARENA_MAX, kHeapArenas)); }
 
 }  // namespace spacekeep

@@ -1,4 +1,4 @@
-// Thread safety: once, at start-up.
+// Thread safety: once, at start-up, but for what says otherwise.
 //
 // What this process may use up.
 #pragma once
@@ -15,5 +15,10 @@ inline constexpr int kHeapArenas = 2;
 /// wait for services would spread what they leave behind over eight heaps for each processor, and
 /// none of it would be given back.
 void limitHeapArenas();
+
+/// Gives the pages back that lie free between what is in use (malloc_trim(3)). A heap is as large as
+/// it ever had to be otherwise, as long as one small block near its end is in use. May be called
+/// from any thread; takes some milliseconds.
+void giveBackFreeMemory();
 
 }  // namespace spacekeep

@@ -134,8 +134,17 @@ void ConcurrentQueue::work(Worker& self) {
     membership.is_idle = true;
     provideWorker();
   }
+  const auto give_back = mayGiveBack() ? options_.on_less_to_do : nullptr;
   // Before the lock is given back: a task that comes now must not count on this worker.
   membership.leave();
+  lock.unlock();
+  if (give_back != nullptr) give_back();
+}
+
+bool ConcurrentQueue::mayGiveBack() {
+  if (options_.on_less_to_do == nullptr || stopping_ || rt::ticks() < may_give_back_) return false;
+  may_give_back_ = rt::deadlineAfterNs(options_.idle_worker_ns);
+  return true;
 }
 
 /// Waits for a task; false when the worker should end instead.

@@ -27,6 +27,10 @@ class ConcurrentQueue {
     std::string name = "global";
     std::size_t parallelism = 4;                    ///< runnable workers kept at most, at least 1
     std::uint64_t idle_worker_ns = 10'000'000'000;  ///< a worker idle or not needed for longer ends
+    /// Run by a worker that ends because there is less to do, at most once in `idle_worker_ns`, when
+    /// the queue no longer counts on it: to give back what busy times have taken. It may outlive the
+    /// queue.
+    void (*on_less_to_do)() = nullptr;
   };
   struct Counts {
     std::size_t threads;  ///< workers alive
@@ -64,6 +68,7 @@ class ConcurrentQueue {
   [[nodiscard]] bool mayTakeTask() const;
   void oneLessIdle();
   bool isSurplus();
+  bool mayGiveBack();
 
   const Options options_;
   mutable rt::Mutex mutex_;
@@ -75,9 +80,10 @@ class ConcurrentQueue {
   std::size_t idle_ = 0;  ///< alive without a task: waiting for one or about to look for one
   std::size_t blocked_ = 0;
   std::size_t peak_threads_ = 0;
-  std::uint64_t window_ends_ = 0;  ///< ticks
-  std::size_t least_idle_ = 0;     ///< of this window
-  std::size_t surplus_ = 0;        ///< workers that were idle throughout the window before
+  std::uint64_t window_ends_ = 0;    ///< ticks
+  std::size_t least_idle_ = 0;       ///< of this window
+  std::uint64_t may_give_back_ = 0;  ///< ticks
+  std::size_t surplus_ = 0;          ///< workers that were idle throughout the window before
   bool stopping_ = false;
 };
 

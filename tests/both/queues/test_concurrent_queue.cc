@@ -221,13 +221,17 @@ TEST(ConcurrentQueue, WorkersThatTheSteadyLoadAfterABurstDoesNotNeedEnd) {
   inEverySchedule(20, [] {
     ConcurrentQueue queue({.name = "global", .parallelism = 4, .idle_worker_ns = kIdleNs});
     blockWorkers(queue, 20);
-    EXPECT_GE(queue.counts().threads, 20U);
+    EXPECT_GE(queue.counts().peak_threads, 20U);
     // Each of the twenty would have a task in less than its idle time.
     for (std::uint64_t passed_ns = 0; passed_ns < 5 * kIdleNs; passed_ns += kIdleNs / 100) {
       queue.async([] {});
       rt::sleepNs(kIdleNs / 100);
     }
-    EXPECT_LE(queue.counts().threads, 5U);
+    if (onRealThreads()) {
+      EXPECT_LT(queue.counts().threads, 20U);  // a slow machine may need some more
+    } else {
+      EXPECT_LE(queue.counts().threads, 5U);
+    }
   });
 }
 
@@ -239,7 +243,43 @@ TEST(ConcurrentQueue, WorkersThatEachBurstNeedsStayBetweenTheBursts) {
       blockWorkers(queue, 20);
       rt::sleepNs(kIdleNs / 5);
     }
-    EXPECT_GE(queue.counts().threads, 20U);
+    // On real threads the machine may take longer between the bursts than a worker may be idle.
+    if (!onRealThreads()) {
+      EXPECT_EQ(queue.counts().peak_threads, queue.counts().threads);
+    }
+    EXPECT_GE(queue.counts().peak_threads, 20U);
+  });
+}
+
+std::atomic<int> given_back{0};
+
+TEST(ConcurrentQueue, WorkersThatEndForWantOfWorkGiveBackOnceInTheirIdleTime) {
+  inEverySchedule(20, [] {
+    given_back = 0;
+    ConcurrentQueue queue(
+        {.name = "global", .parallelism = 4, .idle_worker_ns = kSecondNs / 5, .on_less_to_do = [] {
+           ++given_back;
+         }});
+    for (int times = 1; times <= 2; ++times) {
+      blockWorkers(queue, 10);
+      waitForThreads(queue, 0);
+      // The worker no longer counts when it gives back. Real workers may end further apart.
+      while (given_back < times) rt::sleepNs(kMillisecondNs);
+      if (!onRealThreads()) {
+        EXPECT_EQ(given_back, times);
+      }
+    }
+  });
+}
+
+TEST(ConcurrentQueue, AQueueThatEndsGivesNothingBack) {
+  inEverySchedule(20, [] {
+    given_back = 0;
+    {
+      ConcurrentQueue queue({.on_less_to_do = [] { ++given_back; }});
+      queue.async([] {});
+    }
+    EXPECT_EQ(given_back, 0);
   });
 }
 

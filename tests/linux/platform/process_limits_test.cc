@@ -8,6 +8,7 @@
 #include <barrier>
 #include <cstdio>
 #include <cstdlib>
+#include <fstream>
 #include <memory>
 #include <string>
 #include <thread>
@@ -71,6 +72,29 @@ TEST(ProcessLimitsDeathTest, ManyThreadsShareFewHeaps) {
         std::_Exit(heapsOfManyThreads());
       },
       testing::ExitedWithCode(kHeapArenas), "");
+}
+
+long residentKib() {
+  std::ifstream status("/proc/self/status");
+  for (std::string line; std::getline(status, line);) {
+    if (line.starts_with("VmRSS:")) return std::stol(line.substr(6));
+  }
+  return 0;
+}
+
+TEST(ProcessLimits, FreeMemoryBetweenWhatIsInUseIsGivenBack) {
+  if (!kHasTheHeapOfTheLibrary) return;
+  constexpr std::size_t kBlocks = 20'000;
+  std::vector<std::unique_ptr<std::vector<char>>> blocks;
+  for (std::size_t i = 0; i < kBlocks; ++i) {
+    blocks.push_back(std::make_unique<std::vector<char>>(2000, 'x'));
+  }
+  for (std::size_t i = 0; i < kBlocks; ++i) {
+    if (i % 100 != 0) blocks[i].reset();
+  }
+  const long before_kib = residentKib();
+  giveBackFreeMemory();
+  EXPECT_LT(residentKib(), before_kib - 20'000);
 }
 
 TEST(ProcessLimits, AllDescriptorsThatTheKernelAllowsMayBeOpen) {

@@ -166,7 +166,8 @@ void ServedConnection::serve(sd_bus_message* call, const MethodDescription& meth
   std::uint64_t serial = 0;
   if (sd_bus_message_get_cookie(call, &serial) < 0) return;
   ++unanswered_;
-  context_->pace.spendOnCall(identity().uid(), served->mode == ServeMode::kLane);
+  const bool is_long = served->mode == ServeMode::kLane || !served->brief;
+  context_->pace.spendOnCall(identity().uid(), is_long);
   auto open = std::make_shared<OpenCall>(
       context_, weak_from_this(), method, serial, sd_bus_message_get_expect_reply(call) > 0,
       served->turn_per_user ? std::optional(identity().uid()) : std::nullopt);

@@ -66,5 +66,18 @@ TEST(ClientAdaptor, WhenTheDaemonObjectIsGoneEveryMemberSaysSo) {
   }
 }
 
+TEST(ClientAdaptor, OnlyWhatIsOverInMicrosecondsIsServedByTheThreadThatReadsTheMessages) {
+  const ipc::ServedInterface served = makeClientAdaptor(std::make_shared<UncalledExport>());
+  std::vector<std::string> brief;
+  std::vector<std::string> in_turns;
+  for (const ipc::ServedMethod& method : served.methods) {
+    if (method.brief) brief.emplace_back(method.name);
+    if (method.turn_per_user) in_turns.emplace_back(method.name);
+  }
+  EXPECT_EQ(brief, (std::vector<std::string>{"clientCancelPurge", "clientGetState"}))
+      << "a write of the state waits for the disk";
+  EXPECT_EQ(in_turns, (std::vector<std::string>{"clientSetState", "clientGetState"}));
+}
+
 }  // namespace
 }  // namespace spacekeep::test

@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
+#include <fstream>
 #include <utility>
 #include <vector>
 
@@ -37,6 +38,7 @@ class Conductor {
       if (stands()) break;
     }
     world_.waitForClients();
+    writeSamples();
     return report();
   }
 
@@ -96,6 +98,16 @@ class Conductor {
       next_progress_seconds_ = now + kProgressSeconds;
     }
     sleepSeconds(kLookSeconds);
+  }
+
+  /// All of them, for whoever wants to look closer than the report does.
+  void writeSamples() const {
+    std::ofstream file("/tmp/samples.times");
+    for (const Sample& sample : samples_) {
+      file << fmt::format("{:.1f} {:.0f} {:.0f} {:.0f} {:.0f} {:.2f}\n", sample.at_seconds,
+                          sample.rss_kib, sample.pss_kib, sample.descriptors, sample.threads,
+                          sample.cpu_seconds);
+    }
   }
 
   int report() {

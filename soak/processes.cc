@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <grp.h>
+#include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -17,6 +18,9 @@ namespace {
 int statusOf(int raw) { return WIFEXITED(raw) ? WEXITSTATUS(raw) : 128 + WTERMSIG(raw); }
 
 [[noreturn]] void become(char** arguments, const std::string& log, uid_t uid) {
+  // As the service manager starts programs: each in a session of its own, so that the kernel shares the
+  // processors between programs, and not between threads (sched(7), "The autogroup feature").
+  ::setsid();
   const int out = ::open(log.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
   const int in = ::open("/dev/null", O_RDONLY);
   ::dup2(in, 0);
@@ -25,6 +29,8 @@ int statusOf(int raw) { return WIFEXITED(raw) ? WEXITSTATUS(raw) : 128 + WTERMSI
   if (uid != 0 && (::setgroups(0, nullptr) != 0 || ::setgid(uid) != 0 || ::setuid(uid) != 0)) {
     ::_exit(126);
   }
+  // Nothing of a soak that was ended goes on. Here, since another user takes it back.
+  ::prctl(PR_SET_PDEATHSIG, SIGKILL);
   ::execv(arguments[0], arguments);
   ::_exit(127);
 }

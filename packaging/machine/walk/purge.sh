@@ -9,12 +9,12 @@ walk_purge() {
   check "its state stays for the next installation" inside test -s /var/lib/spacekeep/com.quorvel.spacekeep.sqlite
   say "Purging"
   inside rm -r /etc/spacekeep   # the administrator's own
-  show sh -c 'apt-get purge -y spacekeep spacekeep-services libspacekeep-dev | tail -3'
+  show sh -c 'apt-get purge -y spacekeep spacekeep-services | tail -3'
   inside_sh 'apt-get autoremove -y --purge >/dev/null'
   files_of_the_machine > "$work/files.after"
   comm -13 "$work/files.before" "$work/files.after" > "$work/files.left"
   # Not of the packages: accounts stay by design, and these files note what was done.
-  grep -vE '^/etc/(passwd|group|shadow|gshadow|subuid|subgid)-?$|^/etc/\.pwd\.lock$|^/var/lib/(dpkg|systemd)/|^/var/backups|^/var/cache/(ldconfig|debconf)|^/home|^/var/mail|^/srv/|^/etc/systemd/system$' \
+  grep -vE '^/etc/(passwd|group|shadow|gshadow|subuid|subgid)-?$|^/etc/\.pwd\.lock$|^/var/lib/(dpkg|systemd)/|^/var/backups|^/var/cache/(ldconfig|debconf)|^/home|^/var/mail|^/srv/|^/var/tmp/systemd-private-|^/etc/systemd/system$' \
     "$work/files.left" > "$work/files.ours" || true
   sed 's/^/  left: /' "$work/files.ours"
   check "no file is left that was not there before" test ! -s "$work/files.ours"

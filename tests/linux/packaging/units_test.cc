@@ -89,17 +89,22 @@ TEST_F(UnitFiles, AServiceIsExposedByAtMostTwoAndTheOneWithoutADaemonOfItsOwnHas
   }
 }
 
-TEST(Units, EachRuleOfTheSystemHasRightsADescriptorAndTheIdOfItsName) {
+TEST(Units, EachRuleOfTheSystemHasRightsAndTheIdOfItsNameAndADescriptorWhenItIsOn) {
   const std::string links = contentOf(kSource / "packaging/tmpfiles/spacekeep-services.conf");
+  const std::string build = contentOf(kSource / "packaging/CMakeLists.txt");
+  std::string listening = build.substr(build.find("foreach(rule IN ITEMS"));
+  listening = listening.substr(0, listening.find(')')) + " ";
   ASSERT_FALSE(ruleNames().empty());
   for (const std::string& name : ruleNames()) {
-    const fs::path rights = kUnits / ("spacekeep-service@" + name + ".service.d") / "rights.conf";
-    EXPECT_TRUE(fs::exists(rights)) << rights;
-    EXPECT_THAT(links,
-                HasSubstr("L /System/Library/Spacekeep/com.quorvel.spacekeep." + name +
-                          ".plist - - - - /usr/lib/spacekeep/rules/system/" + name + ".plist\n"));
+    EXPECT_TRUE(fs::exists(kUnits / ("spacekeep-service@" + name + ".service.d") / "rights.conf"))
+        << name;
     const std::string text = contentOf(kRules / (name + ".plist"));
     EXPECT_THAT(text, HasSubstr("<string>com.quorvel.spacekeep." + name + "</string>"));
+    const bool is_on = text.find("<key>ENABLED</key>") == std::string::npos;
+    const std::string link = "L /System/Library/Spacekeep/com.quorvel.spacekeep." + name +
+                             ".plist - - - - /usr/lib/spacekeep/rules/system/" + name + ".plist\n";
+    EXPECT_EQ(links.find(link) != std::string::npos, is_on) << name;
+    EXPECT_EQ(listening.find(" " + name + " ") != std::string::npos, is_on) << name;
   }
 }
 

@@ -10,12 +10,16 @@ service check runs on a fresh fill. As root, in a mount namespace of its own.
 import argparse
 import contextlib
 import fcntl
+import functools
+import hashlib
+import http.server
 import os
 import pathlib
 import shutil
 import subprocess
 import sys
 import tempfile
+import threading
 import time
 
 DAY = 86400
@@ -150,9 +154,10 @@ def keeps_what_is_open(world, kind, name, path):
         expect(os.path.exists(path), f"{path} was taken while it was open")
 
 
-def check_service(world, kind, name, cache):
+def check_service(world, kind, name, cache, in_use=True):
+    """`in_use`: whether single files that are open stay. A tool's cache stays as a whole then."""
     done = run([world.build / "ctl/spacekeepctl", "check-service", "--volume", world.volume, "--data", cache,
-                "--in-use", cache, "--yes", "--", world.build / "services/spacekeep-command",
+                *(["--in-use", cache] if in_use else []), "--yes", "--", world.build / "services/spacekeep-command",
                 *world.rules(kind, name), "--check-in"], check=False,
                env={"PATH": world.environment["PATH"]})
     failed = [line for line in done.stdout.splitlines() if " FAILED" in line]
@@ -203,24 +208,29 @@ def ccache(world):
     left = [p for p in files_below(cache) if not keep(p)]
     expect(left, "what was used today should have stayed")
     fill()
+    results = sorted(p for p in files_below(cache) if not keep(p))
+    age(results, 100)
+    keeps_what_is_open(world, "user", "ccache", results[0])
     counts = world.tool("ccache", "--print-stats").stdout
     expect("cache_size_kibibyte" in counts, counts)
     results = sorted(p for p in files_below(cache) if not keep(p))
     for i, path in enumerate(results):
         age([path], (100, 40, 10, 2)[i * 4 // len(results)])
-    return taken, check_service(world, "user", "ccache", cache)
+    return taken, check_service(world, "user", "ccache", cache, in_use=False)
 
 
 @case
 def npm(world):
+    packages = []
+    for i in range(6):
+        folder = world.tools / f"package{i}"
+        folder.mkdir()
+        (folder / "package.json").write_text(f'{{"name": "p{i}", "version": "1.0.0"}}')
+        (folder / "data.bin").write_bytes(os.urandom(200_000))
+        packages.append(world.tools / world.tool("npm", "pack", "--silent", folder, cwd=world.tools).stdout.strip())
+
     def fill():
-        for i in range(12):
-            folder = world.tools / f"package{i}"
-            folder.mkdir(exist_ok=True)
-            (folder / "package.json").write_text(f'{{"name": "p{i}", "version": "1.0.0"}}')
-            (folder / "data.bin").write_bytes(os.urandom(200_000))
-            packed = world.tool("npm", "pack", "--silent", folder, cwd=world.tools).stdout.strip()
-            world.tool("npm", "cache", "add", world.tools / packed)
+        world.tool("npm", "cache", "add", *packages)
 
     cache = world.home / ".npm"
     result = play(world, "user", "npm", fill, cache, (100, 40, 10, 2),
@@ -247,17 +257,47 @@ def pip(world):
     return result
 
 
+def crates_served(world, environment, names):
+    """A registry of these packages on this machine; answers its address and its server."""
+    served = world.tools / "registry"
+    for name in names:
+        package = world.tools / name
+        (package / "src").mkdir(parents=True)
+        (package / "src/lib.rs").write_text("//! Nothing.\n" * 2000)
+        (package / "Cargo.toml").write_text(f'[package]\nname = "{name}"\nversion = "1.0.0"\nedition = "2021"\n'
+                                            'description = "x"\nlicense = "MIT"\n')
+        world.tool("cargo", "package", "--quiet", "--no-verify", "--allow-dirty", cwd=package, env=environment)
+        archive = package / f"target/package/{name}-1.0.0.crate"
+        entry = served / name[:2] / name[2:4] / name
+        entry.parent.mkdir(parents=True, exist_ok=True)
+        entry.write_text(f'{{"name":"{name}","vers":"1.0.0","deps":[],"cksum":"'
+                         f'{hashlib.sha256(archive.read_bytes()).hexdigest()}","features":{{}},"yanked":false}}\n')
+        shutil.copy(archive, served / archive.name)
+    handler = functools.partial(http.server.SimpleHTTPRequestHandler, directory=str(served))
+    handler.func.log_message = lambda *_: None
+    server = http.server.ThreadingHTTPServer(("127.0.0.1", 0), handler)
+    address = f"http://127.0.0.1:{server.server_port}"
+    (served / "config.json").write_text(f'{{"dl": "{address}/{{crate}}-{{version}}.crate"}}')
+    threading.Thread(target=server.serve_forever, daemon=True).start()
+    return address, server
+
+
 @case
 def cargo(world):
-    project = world.tools / "project"
-    (project / "src").mkdir(parents=True)
-    (project / "src/main.rs").write_text("fn main() {}\n")
-    (project / "Cargo.toml").write_text(
-        '[package]\nname = "p"\nversion = "1.0.0"\nedition = "2021"\n[dependencies]\nitoa = "1"\nryu = "1"\nfnv = "1"\n')
-    environment = dict(world.environment, CARGO_HOME=str(world.home / ".cargo"))
+    environment = dict(world.environment, CARGO_HOME=str(world.home / ".cargo"), no_proxy="127.0.0.1")
     rustup = pathlib.Path("/root/.rustup")
     if rustup.is_dir():
         environment["RUSTUP_HOME"] = str(rustup)
+    names = ("alpha", "beta", "gamma")
+    address, server = crates_served(world, environment, names)
+    project = world.tools / "project"
+    (project / "src").mkdir(parents=True)
+    (project / ".cargo").mkdir()
+    (project / ".cargo/config.toml").write_text(
+        f'[source.crates-io]\nreplace-with = "own"\n[source.own]\nregistry = "sparse+{address}/"\n')
+    (project / "src/main.rs").write_text("fn main() {}\n")
+    (project / "Cargo.toml").write_text('[package]\nname = "p"\nversion = "1.0.0"\nedition = "2021"\n[dependencies]\n'
+                                        + "".join(f'{name} = "1"\n' for name in names))
     cache = world.home / ".cargo/registry"
 
     def build(*words):
@@ -282,7 +322,9 @@ def cargo(world):
     keeps_what_is_open(world, "user", "cargo", next(iter(files_below(units[1]))))
     build()
     age(files_below(cache), 400)
-    return taken, check_service(world, "user", "cargo", cache)
+    checked = check_service(world, "user", "cargo", cache)
+    server.shutdown()
+    return taken, checked
 
 
 @case
@@ -359,7 +401,7 @@ def trash(world):
     expect((bin_ / "files/thrown-away-1-days-ago").exists(), "what was thrown away yesterday went")
     shutil.rmtree(bin_)
     fill()
-    return taken, check_service(world, "user", "trash", bin_)
+    return taken, check_service(world, "user", "trash", bin_, in_use=False)
 
 
 @contextlib.contextmanager

@@ -17,6 +17,10 @@
 #include <string_view>
 
 #include "services/cachedir/engine/beneath.h"
+#include "services/cachedir/engine/open_files.h"
+#include "services/cachedir/engine/roots.h"
+#include "services/cachedir/engine/tree_walk.h"
+#include "services/command/base/path_patterns.h"
 
 namespace spacekeep::command {
 namespace {
@@ -77,6 +81,27 @@ bool livesByPidFile(const std::string& path, const std::string& proc) {
          ::access((proc + "/" + std::to_string(pid)).c_str(), F_OK) == 0;
 }
 
+/// Also when nobody can tell.
+bool isAnyOpenBelow(const std::string& pattern) {
+  cachedir::Rules rules;
+  for (std::string& path : matchesOf(pattern))
+    rules.directories.push_back({.path = std::move(path)});
+  const cachedir::OpenedRoots opened = openRoots(rules, std::nullopt);
+  cachedir::OpenFiles open_files;
+  if (opened.roots.empty()) return false;
+  if (!open_files.scan(opened.roots, cachedir::CancelToken())) return true;
+  bool found = false;
+  cachedir::Tally tally;
+  cachedir::TreeWalk(opened.roots)
+      .forEachFile(
+          [&](const cachedir::FoundFile& file) {
+            const auto& root = opened.roots[file.folder->root];
+            found = found || open_files.holds(file.inode, root.file_system);
+          },
+          cachedir::CancelToken([&found] { return found; }), tally);
+  return found;
+}
+
 std::string whyNot(const Condition& condition, const std::string& proc) {
   switch (condition.kind) {
     case Condition::Kind::kProcess:
@@ -87,6 +112,8 @@ std::string whyNot(const Condition& condition, const std::string& proc) {
       return livesByPidFile(condition.subject, proc)
                  ? "the process of " + condition.subject + " is running"
                  : "";
+    case Condition::Kind::kOpen:
+      return isAnyOpenBelow(condition.subject) ? "a file in " + condition.subject + " is open" : "";
   }
   return "";
 }

@@ -5,11 +5,11 @@
 #include <sys/stat.h>
 
 #include <algorithm>
-#include <charconv>
 
 #include "services/cachedir/engine/link_groups.h"
 #include "services/cachedir/engine/tree_walk.h"
 #include "services/command/base/path_patterns.h"
+#include "services/command/engine/file_age.h"
 
 namespace spacekeep::command {
 namespace {
@@ -51,11 +51,17 @@ std::optional<std::int64_t> modifiedNs(const FoundFile& found, const Root& root)
   return cachedir::nsOf(facts.st_mtim);
 }
 
-std::optional<std::uint64_t> hexadecimal(std::string_view text) {
-  std::uint64_t number = 0;
-  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number, 16);
-  if (error != std::errc() || end != text.data() + text.size()) return std::nullopt;
-  return number;
+std::optional<std::int64_t> timeNs(const FoundFile& found, const Root& root, FilesThatGo::Age age) {
+  const auto modified_ns = modifiedNs(found, root);
+  switch (age) {
+    case FilesThatGo::Age::kModified:
+      return modified_ns;
+    case FilesThatGo::Age::kJournalName:
+      return modified_ns ? journalTimeNs(found.name, *modified_ns) : std::nullopt;
+    case FilesThatGo::Age::kTrashRecord:
+      return trashTimeNs(root.fd.get(), cachedir::joined(found.folder->path, found.name));
+  }
+  return std::nullopt;
 }
 
 }  // namespace
@@ -82,10 +88,7 @@ Measured measureThoseThatGo(const std::vector<Root>& roots, const FilesThatGo& g
                             std::int64_t now_ns, const cachedir::CancelToken& cancel) {
   const std::int64_t latest_ns = now_ns - go.older_seconds * cachedir::kNsPerSecond;
   const auto oldEnough = [&](const FoundFile& found) {
-    const auto modified_ns = modifiedNs(found, roots[found.folder->root]);
-    if (!modified_ns) return false;
-    if (go.age == FilesThatGo::Age::kModified) return *modified_ns < latest_ns;
-    const auto time_ns = journalTimeNs(found.name, *modified_ns);
+    const auto time_ns = timeNs(found, roots[found.folder->root], go.age);
     return time_ns && *time_ns < latest_ns;
   };
   return measureIf(
@@ -115,25 +118,6 @@ Measured measureBelow(const std::vector<Root>& roots, const std::set<std::string
         return false;
       },
       cancel);
-}
-
-/// "system@SEQNUMID-SEQNUM-REALTIME.journal" was closed in order, "system@REALTIME-RANDOM.journal~"
-/// was not; REALTIME is microseconds, all numbers are hexadecimal.
-std::optional<std::int64_t> journalTimeNs(std::string_view name, std::int64_t modified_ns) {
-  const std::size_t at = name.find('@');
-  const bool closed = name.ends_with(".journal");
-  if (at == std::string_view::npos || (!closed && !name.ends_with(".journal~"))) {
-    return std::nullopt;
-  }
-  name = name.substr(at + 1, name.rfind(".journal") - at - 1);
-  const std::size_t first = name.find('-');
-  const std::size_t last = name.rfind('-');
-  if (first == std::string_view::npos || (closed == (first == last))) return std::nullopt;
-  const auto microseconds = hexadecimal(closed ? name.substr(last + 1) : name.substr(0, first));
-  if (!microseconds || *microseconds > static_cast<std::uint64_t>(INT64_MAX) / 1000) {
-    return std::nullopt;
-  }
-  return std::min(static_cast<std::int64_t>(*microseconds) * 1000, modified_ns);
 }
 
 }  // namespace spacekeep::command

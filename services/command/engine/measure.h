@@ -37,9 +37,4 @@ struct Measured {
                                     const std::set<std::string>& paths,
                                     const cachedir::CancelToken& cancel);
 
-/// When an archived journal file began, by its name or its modification, whichever is earlier: that
-/// is what journald's vacuum goes by. Nanoseconds on the wall clock; none for any other file.
-[[nodiscard]] std::optional<std::int64_t> journalTimeNs(std::string_view name,
-                                                        std::int64_t modified_ns);
-
 }  // namespace spacekeep::command

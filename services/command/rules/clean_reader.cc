@@ -44,8 +44,11 @@ FilesThatGo filesOf(const Dictionary& from, FieldReader& fields, const std::stri
   const std::string age = fields.text(from, "AGE", where + " ");
   if (age == "JOURNAL_NAME") {
     files.age = FilesThatGo::Age::kJournalName;
+  } else if (age == "TRASH_RECORD") {
+    files.age = FilesThatGo::Age::kTrashRecord;
   } else if (!age.empty() && age != "MODIFIED") {
-    fields.fail(where + " AGE", "unknown age \"" + age + "\"", "use MODIFIED or JOURNAL_NAME");
+    fields.fail(where + " AGE", "unknown age \"" + age + "\"",
+                "use MODIFIED, JOURNAL_NAME or TRASH_RECORD");
   }
   return files;
 }

@@ -28,6 +28,7 @@ struct Condition {
     kProcess,  // a process with that executable runs: of this user, or of anybody for root
     kLocked,   // somebody has a lock (of either kind) on that file
     kPidFile,  // the process runs whose number that file holds
+    kOpen,     // somebody has a file open below that directory (a pattern)
   };
   Kind kind = Kind::kProcess;
   std::string subject;
@@ -64,7 +65,7 @@ struct FilesThatGo {
   std::vector<std::string> patterns;  // of the last path component; none: all files
   std::vector<std::string> keep;
   std::int64_t older_seconds = 0;
-  enum class Age { kModified, kJournalName } age = Age::kModified;
+  enum class Age { kModified, kJournalName, kTrashRecord } age = Age::kModified;
 };
 struct ToldByTool {
   Words command;

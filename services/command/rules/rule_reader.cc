@@ -107,8 +107,14 @@ std::vector<OneKey> oneKeyEach(FieldReader& fields, const Dictionary& top, std::
   return found;
 }
 
+/// Of a key that names a path.
+Condition::Kind kindOf(const std::string& key) {
+  if (key == "LOCKED") return Condition::Kind::kLocked;
+  return key == "OPEN" ? Condition::Kind::kOpen : Condition::Kind::kPidFile;
+}
+
 void Reader::readConditions(const Dictionary& top) {
-  constexpr std::string_view known[] = {"PROCESS", "LOCKED", "PID_FILE"};
+  constexpr std::string_view known[] = {"PROCESS", "LOCKED", "PID_FILE", "OPEN"};
   for (const OneKey& each : oneKeyEach(fields_, top, "NOT_WHILE", known)) {
     Condition condition;
     if (each.key == "PROCESS") {
@@ -118,7 +124,7 @@ void Reader::readConditions(const Dictionary& top) {
                      "give the executable's name without its directory");
       }
     } else {
-      condition.kind = each.key == "LOCKED" ? Condition::Kind::kLocked : Condition::Kind::kPidFile;
+      condition.kind = kindOf(each.key);
       condition.subject = fields_.path(each.text, each.where);
     }
     rule_.not_while.push_back(std::move(condition));

@@ -75,7 +75,7 @@ const std::map<std::string, std::string> kBadContents = {
      "FILE: CLEAN 1 AMOUNT: not told where the amount stands in the output; give one of AFTER, "
      "COLUMN and PATHS (PATHS may go with AFTER)"},
     {stepOf(kCommand + "<key>AMOUNT</key><dict><key>AGE</key><string>OLD</string></dict>"),
-     "FILE: CLEAN 1 AMOUNT AGE: unknown age \"OLD\"; use MODIFIED or JOURNAL_NAME"},
+     "FILE: CLEAN 1 AMOUNT AGE: unknown age \"OLD\"; use MODIFIED, JOURNAL_NAME or TRASH_RECORD"},
     {stepOf(kCommand +
             "<key>AMOUNT</key><dict><key>OLDER_THAN_DAYS</key><integer>-1</integer></dict>"),
      "FILE: CLEAN 1 AMOUNT OLDER_THAN_DAYS: not a number of days from 0 to 36500; give one"},

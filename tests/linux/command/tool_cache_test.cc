@@ -7,6 +7,7 @@
 
 #include <fstream>
 
+#include "services/command/engine/file_age.h"
 #include "services/command/engine/in_use.h"
 #include "services/command/engine/measure.h"
 #include "support/runtime/runtime.h"
@@ -217,6 +218,38 @@ TEST_F(ToolCacheTest, PlaceholdersStandForTheAmountAndForWhatMayStay) {
   std::string words;
   std::getline(stream, words);
   EXPECT_EQ(words, "2097152 --size=3145728");
+}
+
+TEST_F(ToolCacheTest, WhileAnyFileInItIsOpenNothingIsTakenIfTheRuleSaysSo) {
+  const auto kept = cache(tool_, "<key>NOT_WHILE</key><array><dict><key>OPEN</key><string>" +
+                                     cache_ + "</string></dict></array>");
+  {
+    const cachedir::Holder holder(
+        [this] { return ::open((cache_ + "/new1").c_str(), O_RDONLY) >= 0; });
+    EXPECT_EQ(freeAsForetold(*kept, request(4)).result.note, "a file in " + cache_ + " is open");
+  }
+  EXPECT_EQ(freeAsForetold(*kept, request(4)).result.bytes, 5 * kMiB);
+}
+
+TEST(TrashTime, WhatWasThrownAwayIsAsOldAsItsRecordSays) {
+  const std::string record = "[Trash Info]\nPath=/home/a/b\nDeletionDate=2024-01-15T12:00:00\n";
+  EXPECT_EQ(deletionTimeNs(record).value_or(0) / 1'000'000'000 / 86400, 19737);
+  for (const char* bad : {"", "[Trash Info]\nPath=/x\n", "\nDeletionDate=yesterday\n",
+                          "\nDeletionDate=2024-1-31T23:59:59\n", "\nDeletionDate=2024-01-31\n"}) {
+    EXPECT_EQ(deletionTimeNs(bad), std::nullopt) << bad;
+  }
+  const std::string trash = temporaryDirectory();
+  writeFile(trash + "/files/a/deep/file", 1);
+  writeFile(trash + "/files/orphan", 1);
+  cachedir::run("mkdir " + trash + "/info");
+  std::ofstream(trash + "/info/a.trashinfo") << record;
+  std::ofstream(trash + "/info/bad.trashinfo") << "nothing";
+  const cachedir::UniqueFd fd(::open(trash.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  EXPECT_EQ(trashTimeNs(fd.get(), "files/a/deep/file"), deletionTimeNs(record));
+  EXPECT_EQ(trashTimeNs(fd.get(), "info/a.trashinfo"), deletionTimeNs(record));
+  EXPECT_EQ(trashTimeNs(fd.get(), "files/orphan"), INT64_MIN);
+  EXPECT_EQ(trashTimeNs(fd.get(), "files/bad"), std::nullopt);
+  EXPECT_EQ(trashTimeNs(fd.get(), "directorysizes"), std::nullopt);
 }
 
 TEST(JournalTime, ArchivedFilesAreAsOldAsTheirFirstEntryOrTheirLastWrite) {

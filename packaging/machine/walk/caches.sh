@@ -28,7 +28,7 @@ walk_caches() {
     'for rule in $(grep -L ENABLED /usr/lib/spacekeep/rules/system/*.plist); do
        name=${rule##*/}; systemctl -q is-active "spacekeep-service@${name%.plist}.socket" || { echo "$name"; exit 1; }
      done'
-  check "no service runs when nobody asks" until_true 60 inside_sh '! pgrep spacekeep-comm'
+  check "no service runs when nobody asks" until_true 90 inside_sh '! pgrep spacekeep-comm'
   show /usr/libexec/spacekeep/spacekeep-command --rules-dir /usr/lib/spacekeep/rules/system --estimate
   # What was asked for at a lower urgency must not answer from memory.
   inside spacekeepctl state unset SPACEKEEP_RECENT_SERVICE_STATS >/dev/null

@@ -16,6 +16,8 @@ inline constexpr const char* kAsync = "SPACEKEEP_ASYNC";  ///< boolean, read by 
 inline constexpr const char* kToken = "SPACEKEEP_TOKEN";  ///< names one purge request
 inline constexpr const char* kFinishEarly =
     "SPACEKEEP_FINISH_EARLY";  ///< boolean, end when reached
+inline constexpr const char* kExactUrgency =
+    "SPACEKEEP_EXACT_URGENCY";  ///< boolean, count from memory only answers for the same urgency
 
 // The outcome of a purge.
 inline constexpr const char* kFreespaceBegin = "SPACEKEEP_FREESPACE_BEGIN";  ///< bytes
@@ -38,6 +40,9 @@ inline constexpr const char* kServicesToCount = "SPACEKEEP_SERVICES_TO_COUNT";  
 inline constexpr const char* kUserDefaults = "SPACEKEEP_USER_DEFAULTS";
 inline constexpr const char* kCacheEnabled = "SPACEKEEP_CACHE_ENABLED";               ///< boolean
 inline constexpr const char* kRecentServiceStats = "SPACEKEEP_RECENT_SERVICE_STATS";  ///< bytes
+/// Followed by the urgency: the same for queries with SPACEKEEP_EXACT_URGENCY.
+inline constexpr const char* kRecentServiceStatsAtUrgency =
+    "SPACEKEEP_RECENT_SERVICE_STATS_URGENCY_";
 
 // Service descriptors and check-in.
 inline constexpr const char* kServiceId = "SPACEKEEP_ID";

@@ -55,13 +55,22 @@ Value listOf(const std::set<std::string>& service_ids) {
   return Array(service_ids.begin(), service_ids.end());
 }
 
+// The one memory does not tell at which urgency somebody answered. Whoever compares urgencies asks
+// for one that does, and leaves the answers of everybody else alone.
+std::string memoryKeyFor(const Dictionary& info, std::int32_t urgency) {
+  if (!truthAt(info, keys::kExactUrgency)) return keys::kRecentServiceStats;
+  return keys::kRecentServiceStatsAtUrgency + std::to_string(urgency);
+}
+
 }  // namespace
 
 bool SpacekeepPurgeableOperation::initWithInfo(const Value& request, ServiceSnapshot snapshot) {
   const bool all_queried =
       std::ranges::all_of(*snapshot, [](const auto& entry) { return isQueried(*entry.second); });
   if (!all_queried) snapshot = queriedServices(snapshot);
-  return SpacekeepOperation::initWithInfo(request, std::move(snapshot));
+  if (!SpacekeepOperation::initWithInfo(request, std::move(snapshot))) return false;
+  memory_key_ = memoryKeyFor(info(), urgencyLimit());
+  return true;
 }
 
 SpacekeepPurgeableOperation::Self SpacekeepPurgeableOperation::self() {

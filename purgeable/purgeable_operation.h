@@ -89,6 +89,8 @@ class SpacekeepPurgeableOperation : public SpacekeepOperation {
   [[nodiscard]] Array servicesNotIn(const Dictionary& known) const;
 
   const std::shared_ptr<Spacekeep> daemon_;
+  /// Key of the client state under which the memory stands; constant once initWithInfo is back.
+  std::string memory_key_;
   /// When each service opted out. It lives no longer than this one request, on purpose. Confined to
   /// collection_queue().
   std::map<std::string, Date> opt_outs_;

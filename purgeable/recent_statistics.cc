@@ -102,11 +102,11 @@ void SpacekeepPurgeableOperation::writeStatistics(const std::string& service_id,
   static_cast<void>(validate(*record, [&](const std::string& other) {
     return other == path ? freespace_bytes : freespaceOf(other);
   }));
-  daemon_->clientSetStateSync(record, keys::kRecentServiceStats);
+  daemon_->clientSetStateSync(record, memory_key_);
 }
 
 SpacekeepPurgeableOperation::Record SpacekeepPurgeableOperation::storedRecord() const {
-  const StateObject stored = daemon_->clientGetStateSync(keys::kRecentServiceStats);
+  const StateObject stored = daemon_->clientGetStateSync(memory_key_);
   const auto* record = std::get_if<Record>(&stored);
   return record == nullptr ? nullptr : *record;
 }
@@ -114,13 +114,13 @@ SpacekeepPurgeableOperation::Record SpacekeepPurgeableOperation::storedRecord() 
 void SpacekeepPurgeableOperation::storeValidated(std::int32_t code, const Record& record) {
   if (code == SpacekeepRecentInfo::kInvalid) {
     logTrace("%s Recent Info is invalid, deleting...", "cachedInfo");
-    daemon_->clientSetStateSync({}, keys::kRecentServiceStats);
+    daemon_->clientSetStateSync({}, memory_key_);
   } else if (code == SpacekeepRecentInfo::kChanged) {
     if (shouldLogTrace(getLogHandle())) {
       const Value text = textForm(record);
       logTrace("%s Recent Info need syncing. New values: %@", "cachedInfo", text);
     }
-    daemon_->clientSetStateSync(record, keys::kRecentServiceStats);
+    daemon_->clientSetStateSync(record, memory_key_);
   }
 }
 

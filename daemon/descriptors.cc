@@ -42,42 +42,38 @@ void setRoles(SKService& service, const Value* roles) {
   service.setDoesPurge(holds(*roles, keys::kRolePurge));
 }
 
-void logParseFailure(const std::string* reason) {
-  if (reason != nullptr) {
-    logProblem("%s property list parse failed: %@", "scanPlistsAtPath", *reason);
+void logParseFailure(const DescriptorError& error) {
+  if (error.reason) {
+    logProblem("%s property list parse failed: %@", "scanPlistsAtPath", *error.reason);
   } else {
     const Value* no_error = nullptr;
     logProblem("%s property list parse failed: %@", "scanPlistsAtPath", no_error);
   }
 }
 
-/// None when the entry is no document with a dictionary at the top; says so in the log.
-std::optional<Dictionary> readDescriptor(DirectoryReader& files, const std::string& path) {
-  const auto file = files.readWholeFile(path);
-  if (const auto* error = std::get_if<FileError>(&file)) {
-    logParseFailure(&error->reason);
-    return std::nullopt;
-  }
-  const auto document = parsePlist(std::get<std::vector<std::uint8_t>>(file));
-  if (const auto* error = std::get_if<PlistError>(&document)) {
-    logParseFailure(&error->reason);
-    return std::nullopt;
-  }
-  const Dictionary* top = std::get<Value>(document).dictionary();
-  if (top != nullptr) return *top;
-  logParseFailure(nullptr);
-  return std::nullopt;
-}
-
 }  // namespace
+
+std::variant<Dictionary, DescriptorError> readDescriptor(DirectoryReader& files,
+                                                         const std::string& path) {
+  const auto file = files.readWholeFile(path);
+  if (const auto* error = std::get_if<FileError>(&file)) return DescriptorError{error->reason};
+  const auto document = parsePlist(std::get<std::vector<std::uint8_t>>(file));
+  if (const auto* error = std::get_if<PlistError>(&document)) return DescriptorError{error->reason};
+  const Dictionary* top = std::get<Value>(document).dictionary();
+  if (top == nullptr) return DescriptorError{};
+  return *top;
+}
 
 void Spacekeep::scanPlistsAtPath(const std::string& path,
                                  const std::function<void(const Dictionary&)>& execBlock) const {
   for (const std::string& entry : platform_.files.entriesBelow(path)) {
     const std::string full_path = path + "/" + entry;
     logTrace("%s looking at: %@", "scanPlistsAtPath", full_path);
-    if (const auto descriptor = readDescriptor(platform_.files, full_path)) {
-      execBlock(*descriptor);
+    const auto descriptor = readDescriptor(platform_.files, full_path);
+    if (const auto* error = std::get_if<DescriptorError>(&descriptor)) {
+      logParseFailure(*error);
+    } else {
+      execBlock(std::get<Dictionary>(descriptor));
     }
   }
 }

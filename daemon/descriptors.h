@@ -3,13 +3,24 @@
 // Service descriptor files: property-list documents that declare the services of the system.
 #pragma once
 
+#include <optional>
 #include <string>
+#include <variant>
 #include <vector>
 
 #include "registry/service.h"
+#include "support/files/directory_reader.h"
 #include "support/values/value.h"
 
 namespace spacekeep {
+
+struct DescriptorError {
+  std::optional<std::string> reason;  ///< none: a document, but no dictionary
+};
+
+/// The dictionary of the file at `path`.
+[[nodiscard]] std::variant<Dictionary, DescriptorError> readDescriptor(DirectoryReader& files,
+                                                                       const std::string& path);
 
 /// What a scan has found so far. A later descriptor of the same ID wins.
 struct DescribedServices {

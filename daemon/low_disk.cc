@@ -1,4 +1,6 @@
 // What the daemon does when the file system reports that space is low.
+#include "daemon/low_disk.h"
+
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -12,10 +14,6 @@
 
 namespace spacekeep {
 namespace {
-
-// The same for both thresholds: a volume that is very short gets no more and no faster.
-constexpr std::uint64_t kLowDiskAmountBytes = 262'144'000;
-constexpr int kLowDiskTimeoutSeconds = 300;
 
 /// Logs the event. None for an event without a known flag, which is handled all the same.
 std::optional<std::string_view> statisticOf(std::uint64_t flags) {

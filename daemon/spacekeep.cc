@@ -6,17 +6,11 @@
 #include "client/client_adaptor.h"
 #include "client/entitlements.h"
 #include "daemon/descriptors.h"
+#include "daemon/names.h"
 #include "operations/info_keys.h"
 #include "support/logging/log.h"
 
 namespace spacekeep {
-namespace {
-
-constexpr const char* kSystemDescriptors = "/System/Library/Spacekeep/";
-constexpr const char* kInternalDescriptors = "/QuorvelInternal/Library/Spacekeep/";
-constexpr const char* kSuiteName = "com.quorvel.spacekeep";
-
-}  // namespace
 
 std::shared_ptr<Spacekeep> Spacekeep::create(Platform& platform, std::string root_path) {
   auto daemon = std::make_shared<Spacekeep>(Key{}, platform, std::move(root_path));

@@ -5,6 +5,7 @@
 #include <memory>
 #include <utility>
 
+#include "daemon/names.h"
 #include "daemon/spacekeep.h"
 #include "operations/info_keys.h"
 #include "support/logging/log.h"
@@ -14,7 +15,6 @@
 namespace spacekeep {
 namespace {
 
-constexpr const char* kDailyActivity = "com.quorvel.Spacekeep.daily";
 constexpr const char* kFileSystemStream = "com.quorvel.dispatch.vfs";
 constexpr const char* kLaunchedNotification = "com.quorvel.spacekeep.launched";
 

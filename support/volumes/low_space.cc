@@ -6,12 +6,6 @@
 namespace spacekeep {
 namespace {
 
-/// One and a half times, saturating.
-std::uint64_t exitThreshold(std::uint64_t threshold) {
-  const std::uint64_t half = threshold / 2 + threshold % 2;
-  return threshold > UINT64_MAX - half ? UINT64_MAX : threshold + half;
-}
-
 constexpr std::uint64_t kMillion = 1'000'000;
 
 /// Parts per million: a product of floating numbers would be off by bytes that tests can see. What
@@ -36,6 +30,11 @@ SpaceLevel levelOf(std::uint64_t available, std::uint64_t low, std::uint64_t ver
 }
 
 }  // namespace
+
+std::uint64_t exitThreshold(std::uint64_t threshold) {
+  const std::uint64_t half = threshold / 2 + threshold % 2;
+  return threshold > UINT64_MAX - half ? UINT64_MAX : threshold + half;
+}
 
 SpaceThresholds spaceThresholds(const VolumeSpace& space, const LowSpaceSettings& settings) {
   const std::uint64_t low_bytes =

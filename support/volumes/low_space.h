@@ -37,6 +37,9 @@ struct SpaceThresholds {
 [[nodiscard]] SpaceThresholds spaceThresholds(const VolumeSpace& space,
                                               const LowSpaceSettings& settings);
 
+/// Where a volume that was below the threshold leaves it upwards: 1.5 times, saturating.
+[[nodiscard]] std::uint64_t exitThreshold(std::uint64_t threshold);
+
 /// A volume that was at `previous` leaves it upwards only at 1.5 times its threshold, so that one
 /// which hovers at the threshold does not set off one purge after another.
 [[nodiscard]] SpaceLevel spaceLevel(const VolumeSpace& space, const SpaceThresholds& thresholds,

@@ -29,8 +29,8 @@ using OrReason = std::variant<T, RuleError>;
 RuleError systemError(int error) { return {std::generic_category().message(error)}; }
 
 /// Why somebody else could have written this, none when nobody could.
-std::optional<RuleError> distrust(const struct stat& status) {
-  if (status.st_uid != 0 && status.st_uid != ::geteuid()) {
+std::optional<RuleError> distrust(const struct stat& status, uid_t own_user) {
+  if (status.st_uid != 0 && status.st_uid != own_user) {
     return RuleError{fmt::format("is owned by user {}, must be root's", status.st_uid)};
   }
   if ((status.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
@@ -39,12 +39,12 @@ std::optional<RuleError> distrust(const struct stat& status) {
   return std::nullopt;
 }
 
-std::optional<RuleError> refuseFile(const struct stat& status) {
+std::optional<RuleError> refuseFile(const struct stat& status, uid_t own_user) {
   if (!S_ISREG(status.st_mode)) return RuleError{"is no regular file"};
   if (static_cast<std::uint64_t>(status.st_size) > kMaxRuleFileBytes) {
     return RuleError{fmt::format("is larger than {} bytes", kMaxRuleFileBytes)};
   }
-  return distrust(status);
+  return distrust(status, own_user);
 }
 
 OrReason<Bytes> readAll(int fd) {
@@ -63,22 +63,14 @@ OrReason<Bytes> readAll(int fd) {
 }
 
 /// The checks look at the file that is open, so nobody can swap it after them.
-OrReason<Bytes> readRuleFile(int directory, const std::string& name) {
+OrReason<Bytes> readRuleFile(int directory, const std::string& name, uid_t own_user) {
   const int fd = ::openat(directory, name.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
   if (fd < 0) return systemError(errno);
   const ipc::Descriptor file(fd);
   struct stat status {};
   if (::fstat(fd, &status) < 0) return systemError(errno);
-  if (auto refusal = refuseFile(status)) return *refusal;
+  if (auto refusal = refuseFile(status, own_user)) return *refusal;
   return readAll(fd);
-}
-
-OrReason<ParsedRule> readRule(int directory, const std::string& name, const NameLookup& lookup) {
-  const auto bytes = readRuleFile(directory, name);
-  if (const auto* error = std::get_if<RuleError>(&bytes)) return *error;
-  const auto document = parsePlist(std::get<Bytes>(bytes));
-  if (const auto* error = std::get_if<PlistError>(&document)) return RuleError{error->reason};
-  return ruleFromDocument(name, std::get<Value>(document), lookup);
 }
 
 /// The names of the rule files in an open directory, sorted. Takes over `fd`.
@@ -100,50 +92,100 @@ OrReason<std::set<std::string>> ruleFileNames(int fd) {
   return names;
 }
 
-void readInto(std::map<std::string, Rule>& rules, const std::string& path, int directory,
-              const std::string& name, const NameLookup& lookup) {
-  auto parsed = readRule(directory, name, lookup);
-  if (const auto* error = std::get_if<RuleError>(&parsed)) {
-    logProblem("%s rule file %s/%s grants nothing: %s", kOperation, path, name, error->reason);
-    rules.erase(name);
-    return;
-  }
-  auto& [rule, remarks] = std::get<ParsedRule>(parsed);
-  for (const std::string& remark : remarks) {
-    logProblem("%s rule file %s/%s: %s", kOperation, path, name, remark);
-  }
-  rules.insert_or_assign(name, std::move(rule));
-}
+/// The walk over the two directories, with what it has found so far.
+class Reading {
+ public:
+  Reading(const NameLookup& lookup, uid_t own_user) : lookup_(lookup), own_user_(own_user) {}
 
-void readDirectory(std::map<std::string, Rule>& rules, const std::string& path,
-                   const NameLookup& lookup) {
-  const int fd = ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-  if (fd < 0 && errno == ENOENT) return;
-  const auto complain = [&path](const RuleError& error) {
-    logProblem("%s rule directory %s is not used: %s", kOperation, path, error.reason);
-  };
-  if (fd < 0) return complain(systemError(errno));
-  const ipc::Descriptor directory(fd);
-  struct stat status {};
-  if (::fstat(fd, &status) < 0) return complain(systemError(errno));
-  if (const auto reason = distrust(status)) return complain(*reason);
-  const auto names = ruleFileNames(::fcntl(fd, F_DUPFD_CLOEXEC, 0));
-  if (const auto* error = std::get_if<RuleError>(&names)) return complain(*error);
-  for (const std::string& name : std::get<std::set<std::string>>(names)) {
-    readInto(rules, path, fd, name, lookup);
+  void readDirectory(const std::string& path) {
+    const int fd = ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (fd < 0 && errno == ENOENT) return;
+    if (fd < 0) return unused(path, systemError(errno));
+    const ipc::Descriptor directory(fd);
+    struct stat status {};
+    if (::fstat(fd, &status) < 0) return unused(path, systemError(errno));
+    if (const auto reason = distrust(status, own_user_)) return unused(path, *reason);
+    const auto names = ruleFileNames(::fcntl(fd, F_DUPFD_CLOEXEC, 0));
+    if (const auto* error = std::get_if<RuleError>(&names)) return unused(path, *error);
+    for (const std::string& name : std::get<std::set<std::string>>(names)) {
+      readFile(path, fd, name);
+    }
+  }
+
+  ReadRules takeResult() {
+    ReadRules result{.rules = {}, .findings = std::move(findings_)};
+    for (auto& [name, rule] : rules_) result.rules.push_back(std::move(rule));
+    return result;
+  }
+
+ private:
+  using Kind = RuleFileFinding::Kind;
+
+  void readFile(const std::string& directory_path, int directory, const std::string& name) {
+    const std::string path = directory_path + "/" + name;
+    const auto [earlier, first] = seen_.try_emplace(name, path);
+    if (!first) findings_.push_back({Kind::kReplaces, path, earlier->second});
+    auto parsed = readRule(directory, name);
+    if (const auto* error = std::get_if<RuleError>(&parsed)) {
+      findings_.push_back({Kind::kGrantsNothing, path, error->reason});
+      rules_.erase(name);
+      return;
+    }
+    auto& [rule, remarks] = std::get<ParsedRule>(parsed);
+    for (std::string& remark : remarks) findings_.push_back({Kind::kRemark, path, remark});
+    rules_.insert_or_assign(name, std::move(rule));
+  }
+
+  OrReason<ParsedRule> readRule(int directory, const std::string& name) const {
+    const auto bytes = readRuleFile(directory, name, own_user_);
+    if (const auto* error = std::get_if<RuleError>(&bytes)) return *error;
+    const auto document = parsePlist(std::get<Bytes>(bytes));
+    if (const auto* error = std::get_if<PlistError>(&document)) return RuleError{error->reason};
+    return ruleFromDocument(name, std::get<Value>(document), lookup_);
+  }
+
+  void unused(const std::string& path, const RuleError& error) {
+    findings_.push_back({Kind::kDirectoryNotUsed, path, error.reason});
+  }
+
+  const NameLookup& lookup_;
+  const uid_t own_user_;
+  std::map<std::string, Rule> rules_;
+  std::map<std::string, std::string> seen_;  // name, first path
+  std::vector<RuleFileFinding> findings_;
+};
+
+void logFinding(const RuleFileFinding& finding) {
+  switch (finding.kind) {
+    case RuleFileFinding::Kind::kDirectoryNotUsed:
+      logProblem("%s rule directory %s is not used: %s", kOperation, finding.path, finding.text);
+      break;
+    case RuleFileFinding::Kind::kGrantsNothing:
+      logProblem("%s rule file %s grants nothing: %s", kOperation, finding.path, finding.text);
+      break;
+    case RuleFileFinding::Kind::kRemark:
+      logProblem("%s rule file %s: %s", kOperation, finding.path, finding.text);
+      break;
+    case RuleFileFinding::Kind::kReplaces:
+      break;
   }
 }
 
 }  // namespace
 
+ReadRules readRules(const std::string& vendor_directory, const std::string& administrator_directory,
+                    const NameLookup& lookup, uid_t own_user) {
+  Reading reading(lookup, own_user);
+  reading.readDirectory(vendor_directory);
+  reading.readDirectory(administrator_directory);
+  return reading.takeResult();
+}
+
 std::vector<Rule> loadRules(const std::string& vendor_directory,
                             const std::string& administrator_directory, const NameLookup& lookup) {
-  std::map<std::string, Rule> by_name;
-  readDirectory(by_name, vendor_directory, lookup);
-  readDirectory(by_name, administrator_directory, lookup);
-  std::vector<Rule> rules;
-  for (auto& [name, rule] : by_name) rules.push_back(std::move(rule));
-  return rules;
+  ReadRules read = readRules(vendor_directory, administrator_directory, lookup, ::geteuid());
+  for (const auto& finding : read.findings) logFinding(finding);
+  return std::move(read.rules);
 }
 
 }  // namespace spacekeep::access

@@ -24,27 +24,35 @@ std::variant<Value, std::string> readDocument(const std::string& path) {
   return std::get<Value>(document);
 }
 
+}  // namespace
+
+std::optional<std::string> findLaunchFile(const std::vector<std::string>& directories,
+                                          const std::string& name) {
+  for (const std::string& directory : directories) {
+    std::string path = directory + "/" + name + ".plist";
+    if (exists(path)) return path;
+  }
+  return std::nullopt;
+}
+
 std::variant<DailySchedule, LaunchFileError> readSchedule(const std::string& path) {
   const auto document = readDocument(path);
   if (const auto* reason = std::get_if<std::string>(&document)) return LaunchFileError{*reason};
   return scheduleFromDocument(std::get<Value>(document));
 }
 
-}  // namespace
-
 std::optional<DailySchedule> loadSchedule(const std::vector<std::string>& directories,
                                           const std::string& name) {
-  for (const std::string& directory : directories) {
-    const std::string path = directory + "/" + name + ".plist";
-    if (!exists(path)) continue;
-    const auto schedule = readSchedule(path);
-    if (const auto* found = std::get_if<DailySchedule>(&schedule)) return *found;
-    logProblem("%s launch file %s is not used, the activity %s will not run: %s", "loadSchedule",
-               path, name, std::get<LaunchFileError>(schedule).reason);
+  const auto path = findLaunchFile(directories, name);
+  if (!path) {
+    logProblem("%s there is no launch file %s.plist, the activity will not run", "loadSchedule",
+               name);
     return std::nullopt;
   }
-  logProblem("%s there is no launch file %s.plist, the activity will not run", "loadSchedule",
-             name);
+  const auto schedule = readSchedule(*path);
+  if (const auto* found = std::get_if<DailySchedule>(&schedule)) return *found;
+  logProblem("%s launch file %s is not used, the activity %s will not run: %s", "loadSchedule",
+             *path, name, std::get<LaunchFileError>(schedule).reason);
   return std::nullopt;
 }
 

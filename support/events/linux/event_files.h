@@ -5,11 +5,19 @@
 
 #include <optional>
 #include <string>
+#include <variant>
 #include <vector>
 
 #include "support/events/launch_file.h"
 
 namespace spacekeep {
+
+/// The launch file of the activity `name`: "<directory>/<name>.plist" of the first directory that
+/// has such a file. None when there is none.
+[[nodiscard]] std::optional<std::string> findLaunchFile(const std::vector<std::string>& directories,
+                                                        const std::string& name);
+/// What stands in a launch file.
+[[nodiscard]] std::variant<DailySchedule, LaunchFileError> readSchedule(const std::string& path);
 
 /// The schedule from "<directory>/<name>.plist" of the first directory that has such a file. None
 /// when there is none or it is broken, which is logged; a broken file hides those behind it.

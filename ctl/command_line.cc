@@ -27,6 +27,8 @@ struct Options {
   QueryOptions query;
   StateOptions state;
   VolumesOptions volumes;
+  OneVolumeOptions one_volume;
+  DoctorOptions doctor;
   std::string token;
   CheckServiceOptions check;
 };
@@ -175,6 +177,41 @@ void addVolumes(CLI::App& app, const SharedOptions& options, Command& chosen) {
   volumes.add_flag("--names", options->volumes.names, "Only the mount points, one per line");
 }
 
+void addStatus(CLI::App& app, const SharedOptions& options, Command& chosen) {
+  auto& status = addCommand(
+      app, "status",
+      "Show how the volumes are, and who could give how much\n"
+      "Nothing is freed. The services are asked at each urgency by itself; what the daemon has in "
+      "memory for it counts.",
+      options, chosen, [](const Options& o) { return runStatus(o.common, o.one_volume); });
+  status.add_option("--volume", options->one_volume.volume, "Only this volume")
+      ->option_text("PATH");
+}
+
+void addExplain(CLI::App& app, const SharedOptions& options, Command& chosen) {
+  auto& explain = addCommand(
+      app, "explain",
+      "Say in words why a volume is short of space or not, and what could be done\n"
+      "Nothing is freed. Names those who could give something, and those who give nothing with "
+      "the reason.",
+      options, chosen, [](const Options& o) { return runExplain(o.common, o.one_volume); });
+  explain.add_option("VOLUME", options->one_volume.volume,
+                     std::string(kVolumeMeaning) + " (default: all of them)");
+}
+
+void addDoctor(CLI::App& app, const SharedOptions& options, Command& chosen) {
+  auto& doctor = addCommand(
+      app, "doctor",
+      "Find what is wrong with the daemon's surroundings, and say what to do\n"
+      "Changes nothing, and works without a daemon. Root sees more than others. The exit status "
+      "is 7 when there is a problem; advice alone does not change it.",
+      options, chosen, [](const Options& o) { return runDoctor(o.common, o.doctor); });
+  doctor
+      .add_option("--root", options->doctor.root, "Look at the system whose root directory this is")
+      ->option_text("DIR")
+      ->check(CLI::ExistingDirectory);
+}
+
 void addCancel(CLI::App& app, const SharedOptions& options, Command& chosen) {
   auto& cancel =
       addCommand(app, "cancel", "Send a cancel request; the daemon takes it and stops nothing",
@@ -241,7 +278,8 @@ int commandMissing(const CLI::App& app) {
   const bool in_state = app.got_subcommand("state");
   std::fprintf(stderr, "A command is required: %s\nRun with --help for more information.\n",
                in_state ? "state get, state set, state unset or state list"
-                        : "purge, query, state, volumes, cancel or check-service");
+                        : "status, explain, doctor, purge, query, state, volumes, cancel or "
+                          "check-service");
   return static_cast<int>(ExitCode::kUsage);
 }
 
@@ -254,6 +292,9 @@ std::variant<Command, int> parseCommandLine(int argc, const char* const* argv,
   Command chosen;
   std::string type_text;
   addCommonOptions(app, options->common, version);
+  addStatus(app, options, chosen);
+  addExplain(app, options, chosen);
+  addDoctor(app, options, chosen);
   addPurge(app, options, chosen);
   addQuery(app, options, chosen);
   addState(app, options, chosen, type_text);

@@ -40,6 +40,15 @@ struct VolumesOptions {
   bool names = false;  ///< only the mount points
 };
 
+/// status, explain
+struct OneVolumeOptions {
+  std::string volume;  ///< empty: all
+};
+
+struct DoctorOptions {
+  std::string root;  ///< of the system to look at; empty: this one
+};
+
 [[nodiscard]] ExitCode runPurge(const CommonOptions& common, const PurgeOptions& options);
 [[nodiscard]] ExitCode runCancel(const CommonOptions& common, const std::string& token);
 [[nodiscard]] ExitCode runQuery(const CommonOptions& common, const QueryOptions& options);
@@ -48,5 +57,8 @@ struct VolumesOptions {
 [[nodiscard]] ExitCode runStateUnset(const CommonOptions& common, const StateOptions& options);
 [[nodiscard]] ExitCode runStateList(const CommonOptions& common, const StateOptions& options);
 [[nodiscard]] ExitCode runVolumes(const CommonOptions& common, const VolumesOptions& options);
+[[nodiscard]] ExitCode runStatus(const CommonOptions& common, const OneVolumeOptions& options);
+[[nodiscard]] ExitCode runExplain(const CommonOptions& common, const OneVolumeOptions& options);
+[[nodiscard]] ExitCode runDoctor(const CommonOptions& common, const DoctorOptions& options);
 
 }  // namespace spacekeep::ctl

@@ -7,6 +7,7 @@
 
 #include "ctl/size_text.h"
 #include "ctl/state_value.h"
+#include "operations/info_keys.h"
 #include "support/volumes/low_space_settings.h"
 
 namespace spacekeep::ctl {
@@ -28,6 +29,14 @@ constexpr std::array kSettable = {
 
 constexpr KnownKey kRecentStats{
     kRecentStatsKey, "the daemon's memory of answers; unset, the next query asks everybody", ""};
+/// The urgency follows the name.
+constexpr KnownKey kRecentStatsAtUrgency{
+    keys::kRecentServiceStatsAtUrgency,
+    "the same for one urgency, for status and whoever else compares urgencies", ""};
+
+bool isDaemonsOwn(std::string_view key) {
+  return key == kRecentStats.name || key.starts_with(kRecentStatsAtUrgency.name);
+}
 
 std::optional<std::string> objectionToBoolean(std::string_view key, const Value& value) {
   if (value.boolean() != nullptr) return std::nullopt;
@@ -50,13 +59,14 @@ std::span<const KnownKey> settableKeys() { return kSettable; }
 
 const KnownKey* knownKey(std::string_view name) {
   if (name == kRecentStats.name) return &kRecentStats;
+  if (isDaemonsOwn(name)) return &kRecentStatsAtUrgency;
   const auto* found = std::ranges::find(kSettable, name, &KnownKey::name);
   return found == kSettable.end() ? nullptr : found;
 }
 
 std::optional<std::string> objectionTo(std::string_view key, const Value& value) {
   if (key == kCacheEnabled || key == kFinishEarly) return objectionToBoolean(key, value);
-  if (key == kRecentStatsKey) {
+  if (isDaemonsOwn(key)) {
     return fmt::format("{} is the daemon's own record of recent answers", key);
   }
   if (key == kWholeStateKey) {

@@ -11,12 +11,12 @@ namespace {
 
 constexpr std::uint64_t kRenewNs = 200'000'000;
 
+}  // namespace
+
 double secondsSince(std::uint64_t start_ticks) {
   const auto base = rt::timebase().value_or(rt::Timebase{1, 1});
   return static_cast<double>(rt::ticks() - start_ticks) * base.numerator / base.denominator / 1e9;
 }
-
-}  // namespace
 
 sdk::Reply callShowing(const std::function<void(sdk::Client::ReplyHandler)>& start,
                        const std::function<void(double elapsed_seconds)>& show) {

@@ -5,9 +5,13 @@
 
 #include <spacekeep/client.h>
 
+#include <cstdint>
 #include <functional>
 
 namespace spacekeep::ctl {
+
+/// From a reading of rt::ticks() to now.
+[[nodiscard]] double secondsSince(std::uint64_t start_ticks);
 
 /// Starts a call with the handler it is given, and until the reply is there calls `show` five times
 /// a second, from this thread, with the seconds since the start.

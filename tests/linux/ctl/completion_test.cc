@@ -76,8 +76,8 @@ class Completion : public ToolTest {
 };
 
 TEST_F(Completion, BashOffersCommands) {
-  EXPECT_THAT(inBash("\"\""),
-              ElementsAre("purge", "query", "state", "volumes", "cancel", "check-service"));
+  EXPECT_THAT(inBash("\"\""), ElementsAre("status", "explain", "doctor", "purge", "query", "state",
+                                          "volumes", "cancel", "check-service"));
   EXPECT_THAT(inBash("q"), ElementsAre("query"));
   EXPECT_THAT(inBash("--json q"), ElementsAre("query"));
   EXPECT_THAT(inBash("state \"\""), ElementsAre("get", "set", "unset", "list"));
@@ -88,6 +88,8 @@ TEST_F(Completion, BashOffersTheOptionsOfTheCommand) {
   EXPECT_THAT(inBash("-"), ElementsAre("--version", "--json", "--socket", "--help"));
   EXPECT_THAT(inBash("query /data --"),
               ElementsAre("--itemized", "--urgency", "--json", "--socket", "--help"));
+  EXPECT_THAT(inBash("status --"), ElementsAre("--volume", "--json", "--socket", "--help"));
+  EXPECT_THAT(inBash("doctor --r"), ElementsAre("--root"));
   EXPECT_THAT(inBash("purge --w"), ElementsAre("--wait-all"));
   EXPECT_THAT(inBash("state set --f"), ElementsAre("--force"));
   EXPECT_THAT(inBash("state get --f"), IsEmpty());
@@ -108,6 +110,8 @@ TEST_F(Completion, BashOffersTheVolumesOfThisMachine) {
   const auto volumes = linesOf(ctl("volumes --names").out);
   ASSERT_THAT(volumes, Not(IsEmpty()));
   EXPECT_EQ(inBash("purge \"\""), volumes);
+  EXPECT_EQ(inBash("explain \"\""), volumes);
+  EXPECT_EQ(inBash("status --volume \"\""), volumes);
   EXPECT_EQ(inBash("query --urgency 4 \"\""), volumes);
   EXPECT_THAT(inBash("query /no/such/volume"), IsEmpty());
   EXPECT_THAT(inBash("purge /data \"\""), IsEmpty());
@@ -141,8 +145,9 @@ TEST_F(Completion, BashOffersFilesAndVolumesForACheckAndProgramsForItsCommand) {
 
 /// Every option that bash offers is one that the tool knows for that command.
 TEST_F(Completion, EveryOptionThatIsOfferedStandsInTheHelp) {
-  for (const std::string command : {"purge", "query", "state set", "state list", "state get",
-                                    "volumes", "cancel", "check-service"}) {
+  for (const std::string command :
+       {"status", "explain", "doctor", "purge", "query", "state set", "state list", "state get",
+        "volumes", "cancel", "check-service"}) {
     const std::string help = ctl(command + " --help").out;
     for (const auto& option : inBash(command + " --")) {
       EXPECT_NE(help.find(option), std::string::npos) << command << " " << option;
@@ -154,6 +159,8 @@ TEST_F(Completion, ZshCompletesCommandsOptionsAndKeys) {
   serveState();
   EXPECT_EQ(inZsh("spacekeepctl q", "spacekeepctl query "), "");
   EXPECT_EQ(inZsh("spacekeepctl query --it", "--itemized"), "");
+  EXPECT_EQ(inZsh("spacekeepctl doc", "spacekeepctl doctor "), "");
+  EXPECT_EQ(inZsh("spacekeepctl status --v", "--volume"), "");
   EXPECT_EQ(inZsh("spacekeepctl check-service --no", "--no-purge"), "");
   EXPECT_EQ(inZsh("spacekeepctl state set SPACEKEEP_C", "SPACEKEEP_CACHE_ENABLED "), "");
   EXPECT_EQ(inZsh("spacekeepctl state set SPACEKEEP_FINISH_EARLY t", "SPACEKEEP_FINISH_EARLY true"),

@@ -1,0 +1,127 @@
+#include <fmt/core.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <memory>
+
+#include "ctl/doctor/groups.h"
+#include "ctl/text_layout.h"
+#include "support/access/entitlements.h"
+#include "support/access/linux/capture_peer_identity.h"
+#include "support/access/linux/load_rules.h"
+#include "support/files/linux/descriptor.h"
+
+namespace spacekeep::ctl::doctor {
+namespace {
+
+constexpr const char* kMend =
+    "mend it, then have the rules read again: systemctl restart spacekeepd";
+
+/// This process as the daemon would see it, found out in the same way.
+std::shared_ptr<const access::PeerIdentity> ownIdentity() {
+  int ends[2] = {-1, -1};
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return nullptr;
+  const FileDescriptor one(ends[0]);
+  const FileDescriptor other(ends[1]);
+  return access::capturePeerIdentity(one.get());
+}
+
+bool isForbidden(const std::string& path) {
+  return ::access(path.c_str(), R_OK) != 0 && errno == EACCES;
+}
+
+void tell(const access::RuleFileFinding& finding, Group& group) {
+  using Kind = access::RuleFileFinding::Kind;
+  const std::string path = harmless(finding.path);
+  if (finding.kind != Kind::kReplaces && isForbidden(finding.path)) {
+    return group.unseen("rules", fmt::format("{} cannot be read by this user", path));
+  }
+  switch (finding.kind) {
+    case Kind::kDirectoryNotUsed:
+      return group.problem(
+          "rule-directory",
+          fmt::format("{} is not used ({}), so no rule in it holds", path, harmless(finding.text)),
+          kMend);
+    case Kind::kGrantsNothing:
+      return group.problem(
+          "rule-file", fmt::format("{} grants nothing: {}", path, harmless(finding.text)), kMend);
+    case Kind::kRemark:
+      return group.advice("rule-remark", fmt::format("{}: {}", path, harmless(finding.text)),
+                          kMend);
+    case Kind::kReplaces:
+      return group.ok("rule-replaced",
+                      fmt::format("{} takes the place of {}", path, harmless(finding.text)));
+  }
+}
+
+bool grantsToSomebody(const std::vector<access::Rule>& rules, std::string_view entitlement) {
+  return std::ranges::any_of(rules, [&](const access::Rule& rule) {
+    return std::ranges::find(rule.grants, entitlement) != rule.grants.end();
+  });
+}
+
+/// "CLIENT_ENTITLEMENT (20-spacekeep.plist), ..."
+std::string heldBy(const access::PeerIdentity& identity, const std::vector<access::Rule>& rules) {
+  std::string text;
+  for (const auto entitlement : access::kAllEntitlements) {
+    const access::Verdict verdict = judge(rules, identity, entitlement);
+    if (!verdict.granted()) continue;
+    text += fmt::format("{}{} ({})", text.empty() ? "" : ", ", entitlement, verdict.rule);
+  }
+  return text;
+}
+
+void checkUser(const access::PeerIdentity& identity, const std::vector<access::Rule>& rules,
+               Group& group) {
+  const std::string user = userText(identity.uid());
+  const access::Verdict verdict = judge(rules, identity, access::kClientEntitlement);
+  if (verdict.granted()) {
+    group.ok("user", fmt::format("this user ({}) holds {}", user, heldBy(identity, rules)));
+    return;
+  }
+  const std::string reason = verdict.decision == access::Decision::kDenied
+                                 ? fmt::format("{} denies", verdict.rule)
+                                 : "no rule grants";
+  group.advice("user",
+               fmt::format("this user ({}) may not connect to the daemon: {} CLIENT_ENTITLEMENT",
+                           user, reason),
+               fmt::format("as root: adduser {} spacekeep, then log in anew", user));
+}
+
+/// The daemon reads its rules once, when it starts.
+void compare(const access::PeerIdentity& identity, const std::vector<access::Rule>& rules,
+             const Contact& contact, Group& group) {
+  const bool granted = judge(rules, identity, access::kClientEntitlement).granted();
+  const bool refused = contact.outcome == Contact::Outcome::kRefused;
+  const bool as_the_rules_say = refused ? !granted : !contact.answers() || granted;
+  if (as_the_rules_say) return;
+  group.advice("rules-not-loaded",
+               fmt::format("the daemon {} this user, and the rules say otherwise: they have "
+                           "changed since it started, or it cannot read them",
+                           refused ? "turns away" : "lets in"),
+               "systemctl restart spacekeepd; journalctl -u spacekeepd names rules it cannot use");
+}
+
+}  // namespace
+
+Group rightsGroup(const Place& place, const Contact& contact) {
+  Group group{.name = "rights"};
+  const auto read = access::readRules(place.paths.vendor_directory + "/entitlements.d",
+                                      place.paths.administrator_directory + "/entitlements.d",
+                                      access::systemNameLookup(), place.own_user);
+  for (const auto& finding : read.findings) tell(finding, group);
+  if (!grantsToSomebody(read.rules, access::kClientEntitlement)) {
+    group.problem("nobody", "no rule grants CLIENT_ENTITLEMENT, so nobody may connect",
+                  fmt::format("the shipped rules belong into {}/entitlements.d",
+                              place.paths.vendor_directory));
+  }
+  const auto identity = ownIdentity();
+  if (identity == nullptr) return group;
+  checkUser(*identity, read.rules, group);
+  if (place.isThisSystem()) compare(*identity, read.rules, contact, group);
+  return group;
+}
+
+}  // namespace spacekeep::ctl::doctor

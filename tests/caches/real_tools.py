@@ -21,6 +21,7 @@ import sys
 import tempfile
 import threading
 import time
+import zipfile
 
 DAY = 86400
 SOURCE = pathlib.Path(__file__).resolve().parents[2]
@@ -239,21 +240,55 @@ def npm(world):
     return result
 
 
+class Cacheable(http.server.SimpleHTTPRequestHandler):
+    """Says of everything that it may be kept."""
+
+    def end_headers(self):
+        self.send_header("Cache-Control", "max-age=86400")
+        super().end_headers()
+
+    def log_message(self, *_):
+        pass
+
+
+def serve_folder(folder):
+    """Its address and its server."""
+    server = http.server.ThreadingHTTPServer(("127.0.0.1", 0), functools.partial(Cacheable, directory=str(folder)))
+    threading.Thread(target=server.serve_forever, daemon=True).start()
+    return f"http://127.0.0.1:{server.server_port}", server
+
+
 @case
 def pip(world):
-    python = "/usr/bin/python3"
+    served = world.tools / "index"
+    packages = [f"package{i}" for i in range(8)]
+    for name in packages:
+        folder = served / "simple" / name
+        folder.mkdir(parents=True)
+        with zipfile.ZipFile(folder / f"{name}-1.0-py3-none-any.whl", "w") as wheel:
+            about = f"{name}-1.0.dist-info"
+            wheel.writestr(f"{name}.py", os.urandom(100_000))
+            wheel.writestr(f"{about}/METADATA", f"Metadata-Version: 2.1\nName: {name}\nVersion: 1.0\n")
+            wheel.writestr(f"{about}/WHEEL", "Wheel-Version: 1.0\nGenerator: x\nRoot-Is-Purelib: true\nTag: py3-none-any\n")
+            wheel.writestr(f"{about}/RECORD", "")
+        (folder / "index.html").write_text(f'<a href="{name}-1.0-py3-none-any.whl">{name}-1.0-py3-none-any.whl</a>')
+    address, server = serve_folder(served)
+    environment = dict(world.environment, PIP_CONFIG_FILE="/dev/null", no_proxy="127.0.0.1", NO_PROXY="127.0.0.1")
+    environment.pop("PIP_INDEX_URL", None)
 
     def fill():
         target = world.tools / "downloads"
         shutil.rmtree(target, ignore_errors=True)
-        for package in ("six", "idna", "certifi", "toml"):
-            world.tool(python, "-m", "pip", "download", "--quiet", "--disable-pip-version-check", "--no-deps",
-                       "--dest", target, package)
+        # Only of a host that it trusts pip keeps what came without encryption.
+        world.tool("/usr/bin/python3", "-m", "pip", "download", "--quiet", "--disable-pip-version-check", "--no-deps",
+                   "--index-url", f"{address}/simple", "--trusted-host", "127.0.0.1", "--dest", target, *packages,
+                   env=environment)
 
     cache = world.home / ".cache/pip"
     result = play(world, "user", "pip", fill, cache, (100, 40, 10, 2),
                   keep=lambda path: not path.startswith((f"{cache}/http/", f"{cache}/http-v2/", f"{cache}/wheels/")))
     fill()
+    server.shutdown()
     return result
 
 
@@ -273,12 +308,8 @@ def crates_served(world, environment, names):
         entry.write_text(f'{{"name":"{name}","vers":"1.0.0","deps":[],"cksum":"'
                          f'{hashlib.sha256(archive.read_bytes()).hexdigest()}","features":{{}},"yanked":false}}\n')
         shutil.copy(archive, served / archive.name)
-    handler = functools.partial(http.server.SimpleHTTPRequestHandler, directory=str(served))
-    handler.func.log_message = lambda *_: None
-    server = http.server.ThreadingHTTPServer(("127.0.0.1", 0), handler)
-    address = f"http://127.0.0.1:{server.server_port}"
+    address, server = serve_folder(served)
     (served / "config.json").write_text(f'{{"dl": "{address}/{{crate}}-{{version}}.crate"}}')
-    threading.Thread(target=server.serve_forever, daemon=True).start()
     return address, server
 
 

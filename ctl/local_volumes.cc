@@ -3,7 +3,6 @@
 #include <fmt/core.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <cstdio>
 #include <vector>
 

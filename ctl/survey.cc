@@ -2,7 +2,6 @@
 
 #include <fmt/core.h>
 
-#include <chrono>
 #include <cmath>
 #include <cstdint>
 #include <utility>

@@ -1,7 +1,6 @@
 #include "ctl/doctor/asked_services.h"
 
 #include <algorithm>
-#include <chrono>
 
 #include "ctl/daemon_link.h"
 #include "ctl/offers.h"

@@ -2,7 +2,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <chrono>
 #include <string>
 #include <system_error>
 #include <utility>

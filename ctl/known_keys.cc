@@ -32,7 +32,7 @@ constexpr KnownKey kRecentStats{
 /// The urgency follows the name.
 constexpr KnownKey kRecentStatsAtUrgency{
     keys::kRecentServiceStatsAtUrgency,
-    "the same for one urgency, for status and whoever else compares urgencies", ""};
+    "the memory for one urgency, for status and whoever else compares urgencies", ""};
 
 bool isDaemonsOwn(std::string_view key) {
   return key == kRecentStats.name || key.starts_with(kRecentStatsAtUrgency.name);

@@ -232,7 +232,7 @@ TEST_F(ToolCacheTest, WhileAnyFileInItIsOpenNothingIsTakenIfTheRuleSaysSo) {
 }
 
 TEST(TrashTime, WhatWasThrownAwayIsAsOldAsItsRecordSays) {
-  const std::string record = "[Trash Info]\nPath=/home/a/b\nDeletionDate=2024-01-15T12:00:00\n";
+  const std::string record = "[Trash Info]\nPath=/srv/a/b\nDeletionDate=2024-01-15T12:00:00\n";
   EXPECT_EQ(deletionTimeNs(record).value_or(0) / 1'000'000'000 / 86400, 19737);
   for (const char* bad : {"", "[Trash Info]\nPath=/x\n", "\nDeletionDate=yesterday\n",
                           "\nDeletionDate=2024-1-31T23:59:59\n", "\nDeletionDate=2024-01-31\n"}) {

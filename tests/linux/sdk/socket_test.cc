@@ -17,7 +17,6 @@
 #include <cstring>
 #include <memory>
 #include <string>
-#include <thread>
 
 #include "sdk/daemon_account.h"
 #include "sdk/socket_loop.h"
@@ -150,7 +149,7 @@ TEST_F(SocketTest, AConnectionThatHasNotAskedYetKeepsTheHostForAFullIdleTime) {
     const auto started = Clock::now();
     auto host = ServiceHost::serveSocket(std::make_shared<TestService>(), options);
     ASSERT_TRUE(host) << host.error().text;
-    std::this_thread::sleep_for(kIdle / 2);
+    rt::sleepNs(150'000'000);  // half of it
     const auto connecting = Clock::now();
     const int fd = admittedConnection(directory_.serviceSocket());
     const bool counts = fd >= 0 && Clock::now() - started < kIdle;

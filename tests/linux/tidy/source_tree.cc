@@ -34,7 +34,8 @@ std::string contentOf(const fs::path& path) {
 
 /// What was built, and what the version control keeps for itself, is not the project's text.
 bool isOutside(const std::string& path) {
-  return path.starts_with("build") || path.starts_with(".git/") || path.starts_with(".cache");
+  return path.starts_with("build") || path.starts_with("out/") || path.starts_with(".git/") ||
+         path.starts_with(".cache");
 }
 
 template <typename Wanted>

@@ -71,21 +71,21 @@ class Value {
 
   // Conversions from the kinds themselves are implicit on purpose: dictionaries are written as
   // { {"KEY", 1}, {"OTHER", "text"} }.
-  Value(std::string text) : storage_(std::move(text)) {}                  // NOLINT
-  Value(std::string_view text) : storage_(std::string(text)) {}           // NOLINT
-  Value(const char* text) : storage_(std::string(text)) {}                // NOLINT
-  Value(bool truth) : storage_(truth) {}                                  // NOLINT
-  Value(int number) : storage_(std::int64_t{number}) {}                   // NOLINT
-  Value(long number) : storage_(std::int64_t{number}) {}                  // NOLINT
-  Value(long long number) : storage_(std::int64_t{number}) {}             // NOLINT
-  Value(unsigned number) : storage_(std::uint64_t{number}) {}             // NOLINT
-  Value(unsigned long number) : storage_(std::uint64_t{number}) {}        // NOLINT
-  Value(unsigned long long number) : storage_(std::uint64_t{number}) {}   // NOLINT
-  Value(double number) : storage_(number) {}                              // NOLINT
-  Value(Data data) : storage_(std::move(data)) {}                         // NOLINT
-  Value(Date date) : storage_(date) {}                                    // NOLINT
-  Value(Array array) : storage_(std::move(array)) {}                      // NOLINT
-  Value(Dictionary dictionary) : storage_(std::move(dictionary)) {}       // NOLINT
+  Value(std::string text) : storage_(std::move(text)) {}                 // NOLINT
+  Value(std::string_view text) : storage_(std::string(text)) {}          // NOLINT
+  Value(const char* text) : storage_(std::string(text)) {}               // NOLINT
+  Value(bool truth) : storage_(truth) {}                                 // NOLINT
+  Value(int number) : storage_(std::int64_t{number}) {}                  // NOLINT
+  Value(long number) : storage_(std::int64_t{number}) {}                 // NOLINT
+  Value(long long number) : storage_(std::int64_t{number}) {}            // NOLINT
+  Value(unsigned number) : storage_(std::uint64_t{number}) {}            // NOLINT
+  Value(unsigned long number) : storage_(std::uint64_t{number}) {}       // NOLINT
+  Value(unsigned long long number) : storage_(std::uint64_t{number}) {}  // NOLINT
+  Value(double number) : storage_(number) {}                             // NOLINT
+  Value(Data data) : storage_(std::move(data)) {}                        // NOLINT
+  Value(Date date) : storage_(date) {}                                   // NOLINT
+  Value(Array array) : storage_(std::move(array)) {}                     // NOLINT
+  Value(Dictionary dictionary) : storage_(std::move(dictionary)) {}      // NOLINT
 
   [[nodiscard]] const Storage& storage() const { return storage_; }
 

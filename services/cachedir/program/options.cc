@@ -4,7 +4,7 @@
 
 #include <CLI/CLI.hpp>
 
-#include "ctl/size_text.h"
+#include "services/cachedir/program/size_option.h"
 
 namespace spacekeep::cachedir {
 namespace {
@@ -14,16 +14,6 @@ constexpr const char* kDescription =
     "Without a mode it serves at the socket that the service manager hands over.\n"
     "Exit status: 0 done, 1 less could be freed than asked, 2 usage, 3 the rule file is bad,\n"
     "4 cannot serve.";
-
-CLI::Validator sizeInto(std::uint64_t& amount) {
-  return {[&amount](std::string& text) -> std::string {
-            const auto size = ctl::parseSize(text);
-            if (const auto* error = std::get_if<ctl::SizeError>(&size)) return error->text;
-            amount = std::get<std::uint64_t>(size);
-            return "";
-          },
-          "SIZE", "size"};
-}
 
 struct Flags {
   bool check_in = false;

@@ -4,7 +4,7 @@
 
 #include <CLI/CLI.hpp>
 
-#include "ctl/size_text.h"
+#include "services/cachedir/program/size_option.h"
 
 namespace spacekeep::command {
 namespace {
@@ -14,16 +14,6 @@ constexpr const char* kDescription =
     "Without a mode it serves at the socket that the service manager hands over.\n"
     "Exit status: 0 done, 1 less could be freed than asked, 2 usage, 3 a rule file is bad,\n"
     "4 cannot serve.";
-
-CLI::Validator sizeInto(std::uint64_t& amount) {
-  return {[&amount](std::string& text) -> std::string {
-            const auto size = ctl::parseSize(text);
-            if (const auto* error = std::get_if<ctl::SizeError>(&size)) return error->text;
-            amount = std::get<std::uint64_t>(size);
-            return "";
-          },
-          "SIZE", "size"};
-}
 
 struct Flags {
   bool check_in = false;
@@ -84,7 +74,7 @@ std::variant<Options, int> readCommandLine(int argc, char** argv) {
   addModes(app, flags);
   auto* amount = app.add_option("--amount", amount_text,
                                 "With --once or --dry-run: what to free, as 1000000, 500M, 1.5GiB");
-  amount->check(sizeInto(options.amount));
+  amount->check(cachedir::sizeInto(options.amount));
   app.add_option("--urgency", options.urgency,
                  "With --once or --dry-run: 1, what nobody will miss, to 4, all that is not in use")
       ->check(CLI::Range(1, 4))

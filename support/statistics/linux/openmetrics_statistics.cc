@@ -68,11 +68,16 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
   }
 
  private:
-  [[nodiscard]] bool full() const { return counters_.size() + histograms_.size() >= kMaxKeys; }
+  [[nodiscard]] bool fullOfPercentages() const { return percent_keys_ >= kMaxPercentKeys; }
+  [[nodiscard]] bool full() const {
+    return counters_.size() - percent_keys_ + histograms_.size() >= kMaxKeys;
+  }
 
   prometheus::Counter* counterOf(const Key& key) {
     if (const auto found = counters_.find(key); found != counters_.end()) return found->second;
-    if (full()) return nullptr;
+    const bool is_percentage = key.second.ends_with(kPercentEnd);
+    if (is_percentage ? fullOfPercentages() : full()) return nullptr;
+    if (is_percentage) ++percent_keys_;
     prometheus::Counter& counter = reports_.Add(labelsOf(key));
     counters_.emplace(key, &counter);
     return &counter;
@@ -126,6 +131,7 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
           .Help("Observations of the daemon, in bytes or nanoseconds as the key says.")
           .Register(registry_);
   std::map<Key, prometheus::Counter*> counters_;
+  std::size_t percent_keys_ = 0;  // among the counters
   std::map<Key, prometheus::Histogram*> histograms_;
 };
 

@@ -16,6 +16,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <utility>
 
 #include "support/runtime/runtime.h"
@@ -31,8 +32,12 @@ class OpenMetricsStatistics : public Statistics {
   /// Between a change and the file that shows it, and so between two files.
   static constexpr std::uint64_t kWriteDelayNs = 10'000'000'000;
   /// Distinct pairs of domain and key, counters and distributions together; further ones are
-  /// dropped.
-  static constexpr std::size_t kMaxKeys = 4096;
+  /// dropped. Room for a sum of each of the 4,096 services, and for the daemon's own.
+  static constexpr std::size_t kMaxKeys = 4608;
+  /// Counters of how often a percentage came, which end so, have a bound of their own: each service
+  /// may bring any number of them, and would soon leave no room for a sum.
+  static constexpr std::string_view kPercentEnd = ".percent";
+  static constexpr std::size_t kMaxPercentKeys = 2048;
   /// A longer domain or key is dropped.
   static constexpr std::size_t kMaxNameBytes = 256;
 

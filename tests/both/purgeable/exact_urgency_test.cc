@@ -18,17 +18,26 @@ sim::ServiceBehaviour givesMoreAtThree() {
   return behaviour;
 }
 
+/// Queries until the answer is `expected`: on real threads a busy machine may miss the 150 ms of a
+/// query, and what the service says then is in the answer of a later one.
+void expectInTheEnd(QueryWorld& world, const Dictionary& info, const Dictionary& expected) {
+  Dictionary last;
+  const bool came = world.eventually([&] { return (last = world.query(info)) == expected; });
+  EXPECT_TRUE(came) << "the last answer was " << describe(Value(last));
+}
+
 TEST(ExactUrgency, EachUrgencyIsAskedForAndRememberedByItself) {
   inEverySchedule(kSchedules, [] {
     QueryWorld world;
     const auto cache = world.world.declareService("cache", givesMoreAtThree());
     world.start();
+    expectInTheEnd(world, exactly(1), resultOf({{"cache", 1}}, 1));
+    expectInTheEnd(world, exactly(3), resultOf({{"cache", 11}}, 11));
+    if (!onRealThreads()) EXPECT_EQ(cache->calls().size(), 2U);
+    const std::size_t asked = cache->calls().size();
     EXPECT_EQ(world.query(exactly(1)), resultOf({{"cache", 1}}, 1));
     EXPECT_EQ(world.query(exactly(3)), resultOf({{"cache", 11}}, 11));
-    EXPECT_EQ(cache->calls().size(), 2U);
-    EXPECT_EQ(world.query(exactly(1)), resultOf({{"cache", 1}}, 1));
-    EXPECT_EQ(world.query(exactly(3)), resultOf({{"cache", 11}}, 11));
-    EXPECT_EQ(cache->calls().size(), 2U);
+    EXPECT_EQ(cache->calls().size(), asked);
   });
 }
 
@@ -37,10 +46,10 @@ TEST(ExactUrgency, OtherQueriesNeitherSeeItsAnswersNorGiveItTheirs) {
     QueryWorld world;
     world.world.declareService("cache", givesMoreAtThree());
     world.start();
-    static_cast<void>(world.query(exactly(1)));
+    expectInTheEnd(world, exactly(1), resultOf({{"cache", 1}}, 1));
     EXPECT_EQ(world.record(), std::nullopt);
-    EXPECT_EQ(world.query(), resultOf({{"cache", 11}}, 11));
-    EXPECT_EQ(world.query(exactly(2)), resultOf({{"cache", 1}}, 1));
+    expectInTheEnd(world, {}, resultOf({{"cache", 11}}, 11));
+    expectInTheEnd(world, exactly(2), resultOf({{"cache", 1}}, 1));
     EXPECT_EQ(world.remembered(), (Dictionary{{"cache", 11}}));
   });
 }
@@ -50,10 +59,12 @@ TEST(ExactUrgency, TheMemoryStandsInTheStateUnderTheUrgency) {
     QueryWorld world;
     world.world.declareService("cache", givesMoreAtThree());
     world.start();
-    static_cast<void>(world.query(exactly(4)));
-    const auto record = world.recordAt("SPACEKEEP_RECENT_SERVICE_STATS_URGENCY_4");
-    ASSERT_TRUE(record.has_value());
-    EXPECT_EQ(record->volume("/")->services.at("cache").amount, Value(11));
+    expectInTheEnd(world, exactly(4), resultOf({{"cache", 11}}, 11));
+    const auto entry = [&world] {
+      return world.recordAt("SPACEKEEP_RECENT_SERVICE_STATS_URGENCY_4");
+    };
+    ASSERT_TRUE(world.eventually([&] { return entry().has_value(); }));
+    EXPECT_EQ(entry()->volume("/")->services.at("cache").amount, Value(11));
     EXPECT_EQ(world.recordAt("SPACEKEEP_RECENT_SERVICE_STATS_URGENCY_3"), std::nullopt);
   });
 }
@@ -63,8 +74,9 @@ TEST(ExactUrgency, FalseIsAsIfItWereNotThere) {
     QueryWorld world;
     world.world.declareService("cache", givesMoreAtThree());
     world.start();
-    static_cast<void>(world.query({{keys::kUrgency, 1}, {keys::kExactUrgency, false}}));
-    EXPECT_EQ(world.remembered(), (Dictionary{{"cache", 1}}));
+    expectInTheEnd(world, {{keys::kUrgency, 1}, {keys::kExactUrgency, false}},
+                   resultOf({{"cache", 1}}, 1));
+    EXPECT_TRUE(world.eventually([&] { return world.remembered() == Dictionary{{"cache", 1}}; }));
     EXPECT_EQ(world.query(), resultOf({{"cache", 1}}, 1));
   });
 }

@@ -129,6 +129,24 @@ TEST_F(Statistic, DistinctKeysAreBounded) {
       hasLine(file, "spacekeep_report_total{domain=\"com.quorvel.spacekeep\",key=\"k0\"} 2"));
 }
 
+TEST_F(Statistic, PercentagesWithoutEndLeaveRoomForSumsAndDistributions) {
+  constexpr std::size_t kMost = OpenMetricsStatistics::kMaxPercentKeys;
+  for (std::size_t i = 0; i < kMost + 10; ++i)
+    report("cache.purged." + std::to_string(10 * i) + ".percent", 1);
+  for (std::size_t i = 0; i < 4096; ++i) report("service" + std::to_string(i) + ".purged", 1);
+  observe("SpacekeepPurgeDeficit", 1);
+  report("cache.purged.10.percent", 1);
+  const std::string file = text();
+  EXPECT_EQ(linesWith(file, ".percent\"} "), kMost);
+  EXPECT_EQ(linesWith(file, ".purged\"} "), 4096U);
+  EXPECT_TRUE(hasLine(file,
+                      "spacekeep_distribution_count{domain=\"com.quorvel.spacekeep\",key="
+                      "\"SpacekeepPurgeDeficit\"} 1"));
+  EXPECT_TRUE(hasLine(file,
+                      "spacekeep_report_total{domain=\"com.quorvel.spacekeep\",key="
+                      "\"cache.purged.10.percent\"} 2"));
+}
+
 TEST_F(Statistic, NothingIsScheduledOrWrittenWhileNothingChanges) {
   EXPECT_TRUE(schedule_.tasks.empty());
   EXPECT_FALSE(std::filesystem::exists(path_));

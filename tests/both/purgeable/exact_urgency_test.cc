@@ -1,6 +1,7 @@
 // Queries that count from memory only what was answered for their own urgency.
 #include <gtest/gtest.h>
 
+#include "support/values/text.h"
 #include "tests/both/purgeable/query_world.h"
 #include "tests/helpers/schedules.h"
 
@@ -23,7 +24,7 @@ sim::ServiceBehaviour givesMoreAtThree() {
 void expectInTheEnd(QueryWorld& world, const Dictionary& info, const Dictionary& expected) {
   Dictionary last;
   const bool came = world.eventually([&] { return (last = world.query(info)) == expected; });
-  EXPECT_TRUE(came) << "the last answer was " << describe(Value(last));
+  EXPECT_TRUE(came) << "the last answer was " << textOf(last);
 }
 
 TEST(ExactUrgency, EachUrgencyIsAskedForAndRememberedByItself) {
@@ -33,8 +34,8 @@ TEST(ExactUrgency, EachUrgencyIsAskedForAndRememberedByItself) {
     world.start();
     expectInTheEnd(world, exactly(1), resultOf({{"cache", 1}}, 1));
     expectInTheEnd(world, exactly(3), resultOf({{"cache", 11}}, 11));
-    if (!onRealThreads()) EXPECT_EQ(cache->calls().size(), 2U);
     const std::size_t asked = cache->calls().size();
+    EXPECT_TRUE(asked == 2 || onRealThreads()) << asked;
     EXPECT_EQ(world.query(exactly(1)), resultOf({{"cache", 1}}, 1));
     EXPECT_EQ(world.query(exactly(3)), resultOf({{"cache", 11}}, 11));
     EXPECT_EQ(cache->calls().size(), asked);

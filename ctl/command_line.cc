@@ -11,8 +11,10 @@
 #include "ctl/check_service/check_service.h"
 #include "ctl/commands.h"
 #include "ctl/help_layout.h"
+#include "ctl/report/since.h"
 #include "ctl/size_text.h"
 #include "ctl/style.h"
+#include "support/runtime/runtime.h"
 
 namespace spacekeep::ctl {
 namespace {
@@ -29,6 +31,8 @@ struct Options {
   VolumesOptions volumes;
   OneVolumeOptions one_volume;
   DoctorOptions doctor;
+  ReportOptions report;
+  std::string since_text;
   std::string token;
   CheckServiceOptions check;
 };
@@ -199,6 +203,37 @@ void addExplain(CLI::App& app, const SharedOptions& options, Command& chosen) {
                      std::string(kVolumeMeaning) + " (default: all of them)");
 }
 
+/// Checks a moment and puts it into `since_ns`.
+CLI::Validator sinceInto(std::optional<std::int64_t>& since_ns) {
+  return {[&since_ns](std::string& text) -> std::string {
+            const auto since = parseSince(text, rt::wallClockNs());
+            if (const auto* error = std::get_if<SinceError>(&since)) return error->text;
+            since_ns = std::get<std::int64_t>(since);
+            return "";
+          },
+          "WHEN", "since"};
+}
+
+void addReport(CLI::App& app, const SharedOptions& options, Command& chosen) {
+  auto& report = addCommand(
+      app, "report",
+      "Write a page with what was freed, by whom, and what could be freed now\n"
+      "Nothing is freed. The page is one file for any browser; it loads nothing and can be mailed. "
+      "What was freed is shown to those who may ask for it, which is root unless a rule says "
+      "otherwise.",
+      options, chosen, [](const Options& o) { return runReport(o.common, o.report); });
+  report
+      .add_option("--html", options->report.file, "File to make or replace; - for standard output")
+      ->option_text("FILE")
+      ->required();
+  report.add_option("--volume", options->report.volume, "Only this volume")->option_text("PATH");
+  report
+      .add_option("--since", options->since_text,
+                  "Leave out what is older: 12h, 7d, 4w, 2026-11-01, \"2026-11-01 14:30\"")
+      ->option_text("WHEN")
+      ->check(sinceInto(options->report.since_ns));
+}
+
 void addDoctor(CLI::App& app, const SharedOptions& options, Command& chosen) {
   auto& doctor = addCommand(
       app, "doctor",
@@ -278,8 +313,8 @@ int commandMissing(const CLI::App& app) {
   const bool in_state = app.got_subcommand("state");
   std::fprintf(stderr, "A command is required: %s\nRun with --help for more information.\n",
                in_state ? "state get, state set, state unset or state list"
-                        : "status, explain, doctor, purge, query, state, volumes, cancel or "
-                          "check-service");
+                        : "status, explain, report, doctor, purge, query, state, volumes, cancel "
+                          "or check-service");
   return static_cast<int>(ExitCode::kUsage);
 }
 
@@ -294,6 +329,7 @@ std::variant<Command, int> parseCommandLine(int argc, const char* const* argv,
   addCommonOptions(app, options->common, version);
   addStatus(app, options, chosen);
   addExplain(app, options, chosen);
+  addReport(app, options, chosen);
   addDoctor(app, options, chosen);
   addPurge(app, options, chosen);
   addQuery(app, options, chosen);

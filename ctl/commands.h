@@ -45,6 +45,12 @@ struct OneVolumeOptions {
   std::string volume;  ///< empty: all
 };
 
+struct ReportOptions {
+  std::string file;                      ///< "-": standard output
+  std::string volume;                    ///< empty: all
+  std::optional<std::int64_t> since_ns;  ///< wall clock; none: as far back as is known
+};
+
 struct DoctorOptions {
   std::string root;  ///< of the system to look at; empty: this one
 };
@@ -59,6 +65,7 @@ struct DoctorOptions {
 [[nodiscard]] ExitCode runVolumes(const CommonOptions& common, const VolumesOptions& options);
 [[nodiscard]] ExitCode runStatus(const CommonOptions& common, const OneVolumeOptions& options);
 [[nodiscard]] ExitCode runExplain(const CommonOptions& common, const OneVolumeOptions& options);
+[[nodiscard]] ExitCode runReport(const CommonOptions& common, const ReportOptions& options);
 [[nodiscard]] ExitCode runDoctor(const CommonOptions& common, const DoctorOptions& options);
 
 }  // namespace spacekeep::ctl

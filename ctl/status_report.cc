@@ -161,7 +161,7 @@ std::string textOf(const StatusReport& report, const Style& style) {
   return text;
 }
 
-std::string jsonOf(const StatusReport& report) {
+Array volumesValueOf(const StatusReport& report) {
   Array volumes;
   for (const auto& sample : report.volumes.volumes) {
     Dictionary members = jsonMembersOf(sample);
@@ -170,7 +170,11 @@ std::string jsonOf(const StatusReport& report) {
     members.set("offers", offers == nullptr ? valueOf(VolumeOffers{}) : valueOf(*offers));
     volumes.emplace_back(std::move(members));
   }
-  Dictionary object{{"volumes", std::move(volumes)},
+  return volumes;
+}
+
+std::string jsonOf(const StatusReport& report) {
+  Dictionary object{{"volumes", volumesValueOf(report)},
                     {"default_thresholds", report.volumes.default_thresholds}};
   if (report.survey.problem) object.set("why_incomplete", report.survey.problem->text);
   return jsonOf(Value(std::move(object)));

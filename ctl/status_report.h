@@ -30,6 +30,8 @@ struct StatusReport {
 [[nodiscard]] std::string textOf(const StatusReport& report, const Style& style);
 /// The lines of one volume on who could give how much.
 [[nodiscard]] std::string offersText(const VolumeOffers& offers, const Style& style);
+/// An object per volume with its numbers and its offers; the man page of the tool describes them.
+[[nodiscard]] Array volumesValueOf(const StatusReport& report);
 /// One object; the man page of the tool describes its members.
 [[nodiscard]] std::string jsonOf(const StatusReport& report);
 

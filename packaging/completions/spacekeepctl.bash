@@ -14,6 +14,7 @@ _spacekeepctl_matches() {
 _spacekeepctl_options() {
   case $1 in
     status) printf '%s\n' --volume ;;
+    report) printf '%s\n' --html --volume --since ;;
     doctor) printf '%s\n' --root ;;
     purge) printf '%s\n' --urgency --timeout --token --wait-all ;;
     query) printf '%s\n' --itemized --urgency ;;
@@ -32,14 +33,14 @@ _spacekeepctl_option_value() {
   case $1 in
     --urgency) _spacekeepctl_matches "$2" <<<$'1\n2\n3\n4' ;;
     --type) _spacekeepctl_matches "$2" <<<$'string\nnumber\nbool\nsize\njson' ;;
-    --socket | --endpoint | --data | --in-use | --root)
+    --socket | --endpoint | --data | --in-use | --root | --html)
       compopt -o filenames 2>/dev/null
       mapfile -t COMPREPLY < <(compgen -f -- "$2")
       ;;
     --volume)
       _spacekeepctl_matches "$2" < <("$tool" volumes --names 2>/dev/null)
       ;;
-    --timeout | --token | --patience) COMPREPLY=() ;;
+    --timeout | --token | --patience | --since) COMPREPLY=() ;;
     *) return 1 ;;
   esac
 }
@@ -68,7 +69,7 @@ _spacekeepctl() {
         return
         ;;
       --socket | --urgency | --timeout | --token | --type | --volume | --endpoint | --data | \
-        --in-use | --patience | --root)
+        --in-use | --patience | --root | --html | --since)
         local option=${COMP_WORDS[i]}
         [[ ${COMP_WORDS[i + 1]} == = ]] && ((i++))
         ((i++))
@@ -85,7 +86,7 @@ _spacekeepctl() {
     return
   fi
   case "${#words[@]} $command" in
-    '0 ') _spacekeepctl_matches "$current" <<<$'status\nexplain\ndoctor\npurge\nquery\nstate\nvolumes\ncancel\ncheck-service' ;;
+    '0 ') _spacekeepctl_matches "$current" <<<$'status\nexplain\nreport\ndoctor\npurge\nquery\nstate\nvolumes\ncancel\ncheck-service' ;;
     '1 explain' | '1 purge' | '1 query')
       _spacekeepctl_matches "$current" < <("$tool" "${socket[@]}" volumes --names 2>/dev/null)
       ;;

@@ -116,8 +116,9 @@ struct UsageCase {
 TEST_F(CommandTest, AWrongCommandLineExitsWithTwoAndSaysWhatIsWrong) {
   const UsageCase cases[] = {
       {"",
-       "A command is required: status, explain, doctor, purge, query, state, volumes, cancel or "
-       "check-service"},
+       "A command is required: status, explain, report, doctor, purge, query, state, volumes, "
+       "cancel "
+       "or check-service"},
       {"eat", "eat"},
       {"purge", "VOLUME"},
       {"purge /data", "AMOUNT"},

@@ -76,8 +76,8 @@ class Completion : public ToolTest {
 };
 
 TEST_F(Completion, BashOffersCommands) {
-  EXPECT_THAT(inBash("\"\""), ElementsAre("status", "explain", "doctor", "purge", "query", "state",
-                                          "volumes", "cancel", "check-service"));
+  EXPECT_THAT(inBash("\"\""), ElementsAre("status", "explain", "report", "doctor", "purge", "query",
+                                          "state", "volumes", "cancel", "check-service"));
   EXPECT_THAT(inBash("q"), ElementsAre("query"));
   EXPECT_THAT(inBash("--json q"), ElementsAre("query"));
   EXPECT_THAT(inBash("state \"\""), ElementsAre("get", "set", "unset", "list"));
@@ -90,6 +90,7 @@ TEST_F(Completion, BashOffersTheOptionsOfTheCommand) {
               ElementsAre("--itemized", "--urgency", "--json", "--socket", "--help"));
   EXPECT_THAT(inBash("status --"), ElementsAre("--volume", "--json", "--socket", "--help"));
   EXPECT_THAT(inBash("doctor --r"), ElementsAre("--root"));
+  EXPECT_THAT(inBash("report --html x --s"), ElementsAre("--since", "--socket"));
   EXPECT_THAT(inBash("purge --w"), ElementsAre("--wait-all"));
   EXPECT_THAT(inBash("state set --f"), ElementsAre("--force"));
   EXPECT_THAT(inBash("state get --f"), IsEmpty());
@@ -104,6 +105,7 @@ TEST_F(Completion, BashOffersValuesOfOptions) {
   EXPECT_THAT(inBash("state set k v --type n"), ElementsAre("number"));
   EXPECT_THAT(inBash("purge --timeout \"\""), IsEmpty());
   EXPECT_THAT(inBash("--socket /etc/passw"), IsSupersetOf({"/etc/passwd"}));
+  EXPECT_THAT(inBash("report --html /etc/passw"), IsSupersetOf({"/etc/passwd"}));
 }
 
 TEST_F(Completion, BashOffersTheVolumesOfThisMachine) {
@@ -146,8 +148,8 @@ TEST_F(Completion, BashOffersFilesAndVolumesForACheckAndProgramsForItsCommand) {
 /// Every option that bash offers is one that the tool knows for that command.
 TEST_F(Completion, EveryOptionThatIsOfferedStandsInTheHelp) {
   for (const std::string command :
-       {"status", "explain", "doctor", "purge", "query", "state set", "state list", "state get",
-        "volumes", "cancel", "check-service"}) {
+       {"status", "explain", "report", "doctor", "purge", "query", "state set", "state list",
+        "state get", "volumes", "cancel", "check-service"}) {
     const std::string help = ctl(command + " --help").out;
     for (const auto& option : inBash(command + " --")) {
       EXPECT_NE(help.find(option), std::string::npos) << command << " " << option;
@@ -161,6 +163,7 @@ TEST_F(Completion, ZshCompletesCommandsOptionsAndKeys) {
   EXPECT_EQ(inZsh("spacekeepctl query --it", "--itemized"), "");
   EXPECT_EQ(inZsh("spacekeepctl doc", "spacekeepctl doctor "), "");
   EXPECT_EQ(inZsh("spacekeepctl status --v", "--volume"), "");
+  EXPECT_EQ(inZsh("spacekeepctl report --ht", "--html"), "");
   EXPECT_EQ(inZsh("spacekeepctl check-service --no", "--no-purge"), "");
   EXPECT_EQ(inZsh("spacekeepctl state set SPACEKEEP_C", "SPACEKEEP_CACHE_ENABLED "), "");
   EXPECT_EQ(inZsh("spacekeepctl state set SPACEKEEP_FINISH_EARLY t", "SPACEKEEP_FINISH_EARLY true"),

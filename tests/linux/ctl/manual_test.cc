@@ -17,9 +17,9 @@ using testing::ContainsRegex;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-constexpr const char* kCommands[] = {"status",     "explain",   "doctor",    "purge",
-                                     "query",      "state get", "state set", "state unset",
-                                     "state list", "volumes",   "cancel",    "check-service"};
+constexpr const char* kCommands[] = {
+    "status",    "explain",     "report",     "doctor",  "purge",  "query",        "state get",
+    "state set", "state unset", "state list", "volumes", "cancel", "check-service"};
 
 class Manual : public ToolTest {
  protected:

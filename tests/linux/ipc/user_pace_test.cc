@@ -177,7 +177,9 @@ TEST(UserPace, APeerThatLeavesWhileItWaitsIsForgottenInTime) {
     ASSERT_GE(sd_bus_flush(client.bus()), 0);
   }
   EXPECT_TRUE(eventually([&server] { return server.server().connections() == 0; }));
-  EXPECT_EQ(server.numbers(), (std::vector<std::int32_t>{1, 2})) << "the call came before the end";
+  // The call came before the end; a worker of the server's serves it.
+  const std::vector<std::int32_t> both = {1, 2};
+  EXPECT_TRUE(eventually([&] { return server.numbers() == both; }));
 }
 
 TEST(UserPace, AServerThatStopsWhileConnectionsWaitLeavesNothingBehind) {

@@ -15,6 +15,7 @@
 #include "support/events/linux/linux_activity_host.h"
 #include "support/events/linux/system_bus.h"
 #include "support/logging/log.h"
+#include "support/queues/waiting.h"
 
 namespace spacekeep {
 namespace {
@@ -53,7 +54,14 @@ LinuxEventSources::LinuxEventSources(std::shared_ptr<EventLoop> loop, Concurrent
                     return inhibitSleep(socket, "Freeing storage space");
                   }),
       mount_table_(::open(options_.mount_table_path.c_str(), O_RDONLY | O_CLOEXEC)) {
-  loop_->post([this] { watchMountTable(); });
+  // Before any stream looks. What changed before the watch is told once, to epoll_ctl(), and not by
+  // epoll_wait(), so a mount between a first look and a later watch would go unnoticed.
+  CountingSemaphore watched(0);
+  loop_->post([this, &watched] {
+    watchMountTable();
+    watched.signal();
+  });
+  watched.wait();
   space_.setThresholdsChangedHandler([this] { lookAtVolumesNow(); });
 }
 

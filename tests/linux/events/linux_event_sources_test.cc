@@ -46,9 +46,10 @@ class Space final : public SpaceSource {
 
 class EventSourcesOnLinux : public ::testing::Test {
  protected:
-  std::unique_ptr<LinuxEventSources> make() {
+  std::unique_ptr<LinuxEventSources> make(
+      std::shared_ptr<EventLoop> loop = std::make_shared<EventLoop>()) {
     return std::make_unique<LinuxEventSources>(
-        std::make_shared<EventLoop>(), global_, space_,
+        std::move(loop), global_, space_,
         LinuxEventSources::Options{.launch_directories = {directory_.path() + "/launch.d"},
                                    .state_directory = directory_.path(),
                                    .power_supply_directory = directory_.path() + "/power",
@@ -98,6 +99,26 @@ TEST_F(EventSourcesOnLinux, AMountMakesTheStreamLookAtOnce) {
   ASSERT_EQ(::mount("none", directory_.path().c_str(), "tmpfs", 0, nullptr), 0);
   handled.wait();  // the next look of its own would be hours away
   EXPECT_EQ(event, (Dictionary{{"_Flags", 4}}));
+  ASSERT_EQ(::umount2(directory_.path().c_str(), MNT_DETACH), 0);
+}
+
+TEST_F(EventSourcesOnLinux, AMountIsNoticedThoughTheEventThreadWasBusyWhenTheStreamBegan) {
+  ASSERT_EQ(::geteuid(), 0U) << "this test mounts and has to run as root";
+  ASSERT_EQ(::unshare(CLONE_NEWNS), 0);
+  ASSERT_EQ(::mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr), 0);
+  const auto loop = std::make_shared<EventLoop>();
+  // Held up until a mount has followed a look, or a fifth of a second if no look comes before.
+  CountingSemaphore mounted(0);
+  loop->post([&] { static_cast<void>(mounted.waitForNs(200'000'000)); });
+  const auto events = make(loop);
+  std::atomic<bool> handled = false;
+  events->setStreamHandler("com.quorvel.dispatch.vfs", global_,
+                           [&](const Dictionary&) { handled = true; });
+  ASSERT_TRUE(comesTrue([&] { return space_.looks == 1; }));
+  space_.is_low = true;
+  ASSERT_EQ(::mount("none", directory_.path().c_str(), "tmpfs", 0, nullptr), 0);
+  mounted.signal();
+  EXPECT_TRUE(comesTrue([&] { return handled.load(); }));
   ASSERT_EQ(::umount2(directory_.path().c_str(), MNT_DETACH), 0);
 }
 

@@ -3,6 +3,8 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <signal.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <systemd/sd-bus.h>
 #include <unistd.h>
@@ -35,7 +37,7 @@ class PrivateBus {
                ("--config-file=" + config).c_str(), nullptr);
       ::_exit(127);
     }
-    EXPECT_TRUE(comesTrue([&] { return ::access(socket.c_str(), F_OK) == 0; }));
+    EXPECT_TRUE(comesTrue([this] { return listens(); }));
   }
   ~PrivateBus() {
     ::kill(pid_, SIGKILL);
@@ -51,6 +53,17 @@ class PrivateBus {
   }
 
  private:
+  /// The socket is there a moment before it is listened at.
+  [[nodiscard]] bool listens() const {
+    sockaddr_un address{.sun_family = AF_UNIX, .sun_path = {}};
+    socket.copy(address.sun_path, sizeof(address.sun_path) - 1);
+    const int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    const bool connected =
+        ::connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+    ::close(fd);
+    return connected;
+  }
+
   ScratchDirectory directory_;
   pid_t pid_ = -1;
 

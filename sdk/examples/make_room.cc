@@ -13,9 +13,9 @@ int main() {
 
   PurgeRequest request;
   request.volume = "/data";
-  request.amount = 500'000'000;  // bytes
-  request.urgency = 2;           // do not go further than this
-  request.finish_early = true;   // answer as soon as the amount is there
+  request.amount = 20'000'000;  // bytes
+  request.urgency = 2;          // do not go further than this
+  request.finish_early = true;  // answer as soon as the amount is there
   const auto reply = client->purge(request, std::chrono::seconds(30));
 
   if (reply.error) return std::fprintf(stderr, "%s\n", reply.error->text.c_str()), 1;

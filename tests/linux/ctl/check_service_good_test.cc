@@ -80,8 +80,11 @@ TEST_F(CheckServiceGood, AServiceThatListensAlreadyIsReachedAtItsSocket) {
   EXPECT_THAT(checksThatWere("not applicable", run.out), ElementsAre("upkeep"));
 }
 
-/// The example is about /data, which this machine need not have.
-TEST_F(CheckServiceGood, TheServiceOfTheDocumentationPasses) {
+/// The examples are about /data, which this machine need not have.
+class DocumentedService : public CheckServiceGood,
+                          public testing::WithParamInterface<const char*> {};
+
+TEST_P(DocumentedService, Passes) {
   const std::string root = directory_.path() + "/root";
   const Finished run = runShell(
       std::string(SPACEKEEP_SOURCE_DIR) + "/tests/sandbox/enter " + root + " " +
@@ -90,7 +93,7 @@ TEST_F(CheckServiceGood, TheServiceOfTheDocumentationPasses) {
           "&& " +
           "head -c 81920000 /dev/zero | split -b 20480 -a 4 -d - /data/thumbnails/item- && " +
           "/programs/ctl/spacekeepctl check-service --yes --volume /data --data /data/thumbnails " +
-          "-- /programs/sdk/example_thumbnail_cache\"",
+          "-- " + GetParam() + "\"",
       errFile());
   runShell("rm -rf " + root, errFile());
   EXPECT_EQ(run.exit_code, 0) << run.out << run.err;
@@ -101,6 +104,12 @@ TEST_F(CheckServiceGood, TheServiceOfTheDocumentationPasses) {
                             "answers", "answers-once", "honest-amounts"}))
       << run.out;
 }
+
+INSTANTIATE_TEST_SUITE_P(On, DocumentedService,
+                         testing::Values("/programs/sdk/example_thumbnail_cache",
+                                         "/programs/sdk/example_thumbnails",
+                                         "env PYTHONPATH=/source/sdk/python /usr/bin/python3 -B "
+                                         "/source/sdk/examples/thumbnails.py"));
 
 TEST_F(CheckServiceGood, AServiceWithNothingToGiveIsToldWhatCouldNotBeSeen) {
   const Finished run = onVolume(0, checking("--yes") + "-- " + program("sdk/example_on_demand"));

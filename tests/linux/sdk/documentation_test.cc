@@ -1,6 +1,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <fstream>
 #include <sstream>
 #include <string>
@@ -14,13 +15,40 @@ std::string contentOf(const std::string& path) {
   return text.str();
 }
 
+struct Shown {
+  const char* document;
+  const char* language;
+  const char* example;
+};
+
+constexpr Shown kShort[] = {{"docs/write-a-client.md", "cpp", "make_room.cc"},
+                            {"docs/write-a-client.md", "python", "make_room.py"},
+                            {"docs/write-a-service.md", "cpp", "thumbnails.cc"},
+                            {"docs/write-a-service.md", "python", "thumbnails.py"}};
+constexpr Shown kLong[] = {{"docs/sdk.md", "cpp", "thumbnail_cache.cc"},
+                           {"docs/sdk.md", "cpp", "on_demand.cc"}};
+
+std::string exampleOf(const Shown& shown) {
+  return contentOf(std::string("sdk/examples/") + shown.example);
+}
+
+void expectShown(const Shown& shown) {
+  const std::string source = exampleOf(shown);
+  ASSERT_GT(source.size(), 400U) << shown.example;
+  const std::string block = std::string("```") + shown.language + "\n" + source + "```";
+  EXPECT_NE(contentOf(shown.document).find(block), std::string::npos)
+      << shown.document << " does not show sdk/examples/" << shown.example << " as it is";
+}
+
 TEST(SdkDocumentation, ShowsTheExamplesThatAreBuiltAsTheyAre) {
-  const std::string document = contentOf("docs/sdk.md");
-  for (const auto* example : {"make_room", "thumbnail_cache", "on_demand"}) {
-    const std::string source = contentOf(std::string("sdk/examples/") + example + ".cc");
-    ASSERT_GT(source.size(), 500U) << example;
-    EXPECT_NE(document.find("```cpp\n" + source + "```"), std::string::npos)
-        << "docs/sdk.md does not show sdk/examples/" << example << ".cc as it is";
+  for (const auto& shown : kShort) expectShown(shown);
+  for (const auto& shown : kLong) expectShown(shown);
+}
+
+TEST(SdkDocumentation, ThirtyLinesAreEnoughForAClientAndForAService) {
+  for (const auto& shown : kShort) {
+    const std::string source = exampleOf(shown);
+    EXPECT_LE(std::count(source.begin(), source.end(), '\n'), 30) << shown.example;
   }
 }
 

@@ -1,0 +1,211 @@
+"""Two ends of a connection, and a host in front of a daemon of the test's making."""
+
+import os
+import socket
+import tempfile
+import threading
+import unittest
+
+import spacekeep
+from spacekeep import client, connection, wire
+
+PATIENCE_SECONDS = 20
+
+
+def pair(on_call=None):
+    """The end that calls, and the end that serves."""
+    one, other = socket.socketpair()
+    served = []
+    thread = threading.Thread(
+        target=lambda: served.append(connection.Connection(other, serves=True, on_call=on_call)))
+    thread.start()
+    calling = connection.Connection(one)
+    thread.join(PATIENCE_SECONDS)
+    return calling, served[0]
+
+
+class Calls(unittest.TestCase):
+    def setUp(self):
+        self.calling, self.served = pair(self._serve)
+        self.addCleanup(self.calling.close)
+        self.addCleanup(self.served.close)
+        self.kept = []
+
+    def _serve(self, call):
+        if call.member == "echo":
+            call.reply(call.signature, *call.arguments)
+        elif call.member == "fail":
+            call.fail("com.example.Error", "in words")
+        elif call.member == "raise":
+            raise RuntimeError("broken")
+        elif call.member == "keep":
+            self.kept.append(call)
+        else:
+            return False
+        return True
+
+    def call(self, member, *values, signature="", timeout=PATIENCE_SECONDS):
+        return self.calling.call("com.example", member, signature, values, timeout)
+
+    def test_are_answered(self):
+        self.assertEqual(self.call("echo", {"a": 1}, "b", signature="a{sv}s"), [{"a": 1}, "b"])
+
+    def test_fail_in_words(self):
+        with self.assertRaisesRegex(spacekeep.Failed, "in words"):
+            self.call("fail")
+
+    def test_of_what_is_not_there_are_told_so(self):
+        with self.assertRaisesRegex(spacekeep.NotSupported, "no com.example.nothing here"):
+            self.call("nothing")
+
+    def test_after_a_broken_handler_are_answered_too(self):
+        with self.assertRaisesRegex(spacekeep.Failed, "broken"):
+            self.call("raise")
+        self.assertEqual(self.call("echo"), [])
+
+    def test_may_be_answered_late_and_in_any_order(self):
+        answers = {}
+        done = threading.Semaphore(0)
+
+        def ask(number):
+            answers[number] = self.call("keep", number, signature="u")
+            done.release()
+
+        for number in range(8):
+            threading.Thread(target=ask, args=(number,)).start()
+        while len(self.kept) < 8:
+            self.call("echo")
+        for call in reversed(self.kept):
+            call.reply("u", *call.arguments)
+        for _ in range(8):
+            self.assertTrue(done.acquire(timeout=PATIENCE_SECONDS))
+        self.assertEqual(answers, {number: [number] for number in range(8)})
+
+    def test_end_with_the_callers_patience_and_an_answer_after_that_harms_nobody(self):
+        with self.assertRaises(spacekeep.TimedOut):
+            self.call("keep", timeout=0.05)
+        self.kept[0].reply()
+        self.assertEqual(self.call("echo"), [])
+
+    def test_end_with_the_connection(self):
+        failure = []
+
+        def ask():
+            try:
+                self.call("keep", timeout=None)
+            except spacekeep.Error as error:
+                failure.append(error)
+
+        asking = threading.Thread(target=ask)
+        asking.start()
+        while not self.kept:
+            self.call("echo")
+        self.served.close()
+        asking.join(PATIENCE_SECONDS)
+        self.assertIsInstance(failure[0], spacekeep.Disconnected)
+        with self.assertRaises(spacekeep.Disconnected):
+            self.call("echo")
+
+
+class FirstWords(unittest.TestCase):
+    def talk(self, said):
+        """What the serving end answers to these bytes."""
+        one, other = socket.socketpair()
+        with one:
+            one.settimeout(PATIENCE_SECONDS)
+            one.sendall(said)
+            one.shutdown(socket.SHUT_WR)
+            try:
+                connection.Connection(other, serves=True).close()
+            except (OSError, wire.WireError):
+                pass
+            answer = b""
+            try:
+                while part := one.recv(4096):
+                    answer += part
+            except ConnectionResetError:
+                pass  # it did not read everything, which is an end too
+            return answer
+
+    def test_may_all_come_at_once(self):
+        answer = self.talk(b"\0AUTH EXTERNAL 30\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n")
+        self.assertRegex(answer, rb"^OK [0-9a-f]{32}\r\nAGREE_UNIX_FD\r\n$")
+
+    def test_may_be_said_in_two_steps(self):
+        self.assertRegex(self.talk(b"\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n"), rb"^DATA\r\nOK ")
+
+    def test_of_another_kind_are_turned_down(self):
+        self.assertEqual(self.talk(b"\0AUTH ANONYMOUS\r\nHELLO\r\n"), b"REJECTED EXTERNAL\r\nERROR\r\n")
+
+    def test_without_end_are_cut_off(self):
+        self.assertEqual(self.talk(b"\0" + b"x" * 100000), b"")
+        self.assertEqual(self.talk(b"\0" + b"HELLO\r\n" * 1000).count(b"ERROR"), 16)
+
+
+class NoDaemon(unittest.TestCase):
+    def test_is_said(self):
+        with self.assertRaisesRegex(spacekeep.Unreachable, "nobody listens at /nowhere/x"):
+            spacekeep.Client("/nowhere/x")
+
+    def test_that_closes_at_once_is_a_missing_right(self):
+        with tempfile.TemporaryDirectory() as folder:
+            path = os.path.join(folder, "socket")
+            with socket.create_server(path, family=socket.AF_UNIX) as server:
+                threading.Thread(target=lambda: server.accept()[0].close()).start()
+                with self.assertRaisesRegex(spacekeep.NotAllowed, "CLIENT_ENTITLEMENT"):
+                    spacekeep.Client(path)
+
+    def test_that_says_nothing_is_not_waited_for(self):
+        patience, connection._AUTHENTICATION_SECONDS = connection._AUTHENTICATION_SECONDS, 0.1
+        self.addCleanup(setattr, connection, "_AUTHENTICATION_SECONDS", patience)
+        with tempfile.TemporaryDirectory() as folder:
+            path = os.path.join(folder, "socket")
+            with socket.create_server(path, family=socket.AF_UNIX):
+                with self.assertRaises(spacekeep.Error):
+                    spacekeep.Client(path)
+
+
+class Jobs(unittest.TestCase):
+    def test_take_what_is_missing_or_of_another_kind_as_absent(self):
+        for amount, wanted in ((5, 5), (5.9, 5), (-5, 0), (True, 0), ("5", 0), (None, 0), (float("nan"), 0),
+                               (float("inf"), (1 << 64) - 1)):
+            with self.subTest(amount=amount):
+                self.assertEqual(spacekeep.Job(1, {"SPACEKEEP_AMOUNT": amount}).amount, wanted)
+        self.assertEqual(spacekeep.Job(1, {"SPACEKEEP_VOLUME": 5}).volume, "")
+
+    def test_know_when_they_are_not_wanted_any_more(self):
+        job = spacekeep.Job(1, {})
+        self.assertFalse(job.cancelled())
+        job.cancel()
+        self.assertTrue(job.wait(PATIENCE_SECONDS))
+
+
+class Hosts(unittest.TestCase):
+    def test_try_again_until_they_are_stopped(self):
+        states = []
+        host = spacekeep.Host("a.b", spacekeep.Service(), socket_path="/nowhere/x",
+                              on_status=lambda state, text: states.append(state))
+        running = threading.Thread(target=host.run)
+        running.start()
+        while states.count("waiting") < 3:
+            running.join(0.01)
+        host.stop()
+        running.join(PATIENCE_SECONDS)
+        self.assertFalse(running.is_alive())
+        self.assertEqual(states[:2], ["connecting", "waiting"])
+        self.assertEqual(states[-1], "stopped")
+
+    def test_need_an_id(self):
+        with self.assertRaisesRegex(ValueError, "ID"):
+            spacekeep.Host("", spacekeep.Service())
+
+
+class Surface(unittest.TestCase):
+    def test_what_is_offered_is_there(self):
+        for name in spacekeep.__all__:
+            self.assertTrue(hasattr(spacekeep, name), name)
+        self.assertEqual(client.INTERFACE, "com.quorvel.SpacekeepClientProtocol")
+
+
+if __name__ == "__main__":
+    unittest.main()

@@ -200,6 +200,146 @@ class Hosts(unittest.TestCase):
             spacekeep.Host("", spacekeep.Service())
 
 
+class OneDaemon:
+    """Takes connections and treats each check-in as the test says."""
+
+    def __init__(self, folder, check_in):
+        self.path = os.path.join(folder, "socket")
+        self.connections = []
+        self._check_in = check_in
+        self._server = socket.create_server(self.path, family=socket.AF_UNIX)
+        threading.Thread(target=self._accept, daemon=True).start()
+
+    def _accept(self):
+        while True:
+            try:
+                plain = self._server.accept()[0]
+            except OSError:
+                return
+            self.connections.append(connection.Connection(plain, serves=True, on_call=self._serve))
+
+    def _serve(self, call):
+        self._check_in(call)
+        return True
+
+    def close(self):
+        self._server.shutdown(socket.SHUT_RDWR)
+        self._server.close()
+        for one in self.connections:
+            one.close()
+
+
+class CheckIns(unittest.TestCase):
+    def states_when(self, check_in, enough, **options):
+        """What a host tells in front of a daemon that checks in like this, until that is enough."""
+        states = []
+        told = threading.Condition()
+
+        def tell(*state):
+            with told:
+                states.append(state)
+                told.notify()
+
+        with tempfile.TemporaryDirectory() as folder:
+            daemon = OneDaemon(folder, check_in)
+            host = spacekeep.Host("a.b", spacekeep.Service(), socket_path=daemon.path, on_status=tell,
+                                  **options)
+            running = threading.Thread(target=host.run)
+            running.start()
+            with told:
+                self.assertTrue(told.wait_for(lambda: enough(states), PATIENCE_SECONDS), states)
+            host.stop()
+            running.join(PATIENCE_SECONDS)
+            self.assertFalse(running.is_alive())
+            daemon.close()
+        return states
+
+    def test_say_who_they_are_and_what_they_want(self):
+        asked = []
+
+        def check_in(call):
+            asked.append((call.interface, call.member, call.signature, call.arguments))
+            call.reply("aa{sv}as", [], [])
+
+        self.states_when(check_in, lambda states: len(states) == 3, does_periodic=True,
+                         notifications=["SPACEKEEP_CACHE_ENABLED"])
+        info = {"PURGE": True, "PERIODIC": True, "SPACEKEEP_NOTIFICATIONS": ["SPACEKEEP_CACHE_ENABLED"]}
+        self.assertEqual(asked, [(client.INTERFACE, "clientCheckin", "sha{sv}", ["a.b", 0, info])])
+
+    def test_of_a_declared_service_wait_for_another_daemon(self):
+        states = self.states_when(lambda call: call.reply("aa{sv}as", [], []),
+                                  lambda states: len(states) == 3)
+        self.assertEqual([state for state, _ in states],
+                         ["connecting", "checking in", "refused", "stopped"])
+
+    def test_that_fail_are_tried_again(self):
+        states = self.states_when(lambda call: call.reply("aa{sv}as", [], ["too many"]),
+                                  lambda states: [one[0] for one in states].count("waiting") == 2)
+        self.assertTrue(states[2][1].startswith("too many; next try in "), states)
+
+    def test_without_an_answer_say_which_right_may_be_missing(self):
+        states = self.states_when(lambda call: None, lambda states: states[-1][0] == "waiting",
+                                  patience_seconds=0.1)
+        self.assertIn("SERVICE_ENTITLEMENT", states[2][1])
+        self.assertEqual([state for state, _ in states[:4]],
+                         ["connecting", "checking in", "checking in", "waiting"])
+
+
+class Requests(unittest.TestCase):
+    """What a client sends, and what it makes of the answers."""
+
+    def setUp(self):
+        self.asked = []
+        self.answer = [{"SPACEKEEP_AMOUNT": 5}]
+        folder = tempfile.TemporaryDirectory()
+        self.addCleanup(folder.cleanup)
+        daemon = OneDaemon(folder.name, self._serve)
+        self.addCleanup(daemon.close)
+        self.client = spacekeep.Client(daemon.path)
+        self.addCleanup(self.client.close)
+
+    def _serve(self, call):
+        self.asked.append((call.interface, call.member, *call.arguments))
+        if call.member in ("clientSetState", "clientCancelPurge"):
+            call.reply()
+        else:
+            call.reply("av" if call.member == "clientGetState" else "aa{sv}", self.answer)
+
+    def test_say_only_what_the_caller_said(self):
+        self.client.purge("/data", 7)
+        self.client.purge("/data", 1 << 63, urgency=2, timeout_seconds=3, token="t", finish_early=False)
+        self.client.purgeable("/data", itemized=True)
+        self.client.history(before=9, limit=2, volume="/data")
+        self.client.cancel("t")
+        interface = client.INTERFACE
+        self.assertEqual(self.asked, [
+            (interface, "clientPurge", {"SPACEKEEP_VOLUME": "/data", "SPACEKEEP_AMOUNT": 7}),
+            (interface, "clientPurge", {
+                "SPACEKEEP_VOLUME": "/data", "SPACEKEEP_AMOUNT": 1 << 63, "SPACEKEEP_URGENCY": 2,
+                "SPACEKEEP_PURGE_TIMEOUT": 3, "SPACEKEEP_TOKEN": "t", "SPACEKEEP_FINISH_EARLY": False}),
+            (interface, "clientItemizedPurgeableSpace", {"SPACEKEEP_VOLUME": "/data"}),
+            (client.HISTORY_INTERFACE, "clientHistory", {
+                "SPACEKEEP_BEFORE": 9, "SPACEKEEP_LIMIT": 2, "SPACEKEEP_VOLUME": "/data"}),
+            (interface, "clientCancelPurge", {"SPACEKEEP_TOKEN": "t"})])
+
+    def test_are_refused_with_no_dictionary_and_not_with_an_empty_one(self):
+        self.answer = [{}]
+        self.assertEqual(self.client.purge("/data", 7), {})
+        self.answer = []
+        with self.assertRaisesRegex(spacekeep.Refused, "clientPurge"):
+            self.client.purge("/data", 7)
+
+    def test_for_a_state_that_is_not_there_give_none(self):
+        self.answer = []
+        self.assertIsNone(self.client.state("mine"))
+        self.answer = [{"a": 1}]
+        self.assertEqual(self.client.state("mine"), {"a": 1})
+        self.client.set_state("mine", None)
+        self.client.set_state("mine", [1])
+        self.assertEqual(self.asked[2:], [(client.INTERFACE, "clientSetState", [], "mine"),
+                                          (client.INTERFACE, "clientSetState", [[1]], "mine")])
+
+
 class Surface(unittest.TestCase):
     def test_what_is_offered_is_there(self):
         for name in spacekeep.__all__:

@@ -5,6 +5,7 @@ from .errors import Disconnected, Refused
 from .wire import WireError
 
 INTERFACE = "com.quorvel.SpacekeepClientProtocol"
+HISTORY_INTERFACE = "com.quorvel.SpacekeepHistoryProtocol"
 
 
 class Client:
@@ -53,17 +54,24 @@ class Client:
         """None removes the key. When this is back, the change is on the disk."""
         self._call("clientSetState", "avs", ([] if value is None else [value], key))
 
-    def call(self, member, info, deadline_seconds=None):
+    def history(self, *, before=None, limit=None, volume=None, deadline_seconds=None):
+        """What the daemon has done: "SPACEKEEP_ENTRIES", newest first, and "SPACEKEEP_NEXT", the
+        `before` of the older ones, when there are more. An older daemon raises NotSupported."""
+        return self.call("clientHistory", {
+            "SPACEKEEP_BEFORE": before, "SPACEKEEP_LIMIT": limit, "SPACEKEEP_VOLUME": volume},
+            deadline_seconds, HISTORY_INTERFACE)
+
+    def call(self, member, info, deadline_seconds=None, interface=INTERFACE):
         """Any operation that takes a request dictionary and answers with one."""
-        (answers,) = self._call(member, "a{sv}", (info,), deadline_seconds)
+        (answers,) = self._call(member, "a{sv}", (info,), deadline_seconds, interface)
         if not answers:
             raise Refused(f"the daemon refused {member}: this user has not the right, or the request "
                           "names no local volume")
         return answers[0]
 
-    def _call(self, member, signature, values, deadline_seconds=None):
+    def _call(self, member, signature, values, deadline_seconds=None, interface=INTERFACE):
         try:
-            answer = self._connection.call(INTERFACE, member, signature, values, deadline_seconds)
+            answer = self._connection.call(interface, member, signature, values, deadline_seconds)
         except Disconnected:
             # The daemon looks at rights when it knows who is there, and then just closes.
             if self._answered:

@@ -7,6 +7,7 @@ import random
 import signal
 import socket
 import threading
+import time
 
 from .client import INTERFACE as CLIENT_INTERFACE
 from .client import open_connection
@@ -20,6 +21,8 @@ log = logging.getLogger("spacekeep")
 
 _FIRST_PAUSE_SECONDS = 0.1
 _LONGEST_PAUSE_SECONDS = 30.0
+_NO_ANSWER = ("the check-in is not answered: does this user hold \"SERVICE_ENTITLEMENT\"? The daemon's "
+              "log tells")
 
 
 _MOST_BYTES = (1 << 64) - 1
@@ -144,9 +147,10 @@ class Host:
     from 0.1 to 30 seconds and is drawn at random."""
 
     def __init__(self, service_id, service, *, socket_path=None, does_purge=True, does_periodic=False,
-                 notifications=(), on_status=None):
+                 notifications=(), on_status=None, patience_seconds=10):
         """`on_status` gets each change as two texts: "connecting", "checking in", "serving", "refused",
-        "waiting" or "stopped", and why."""
+        "waiting" or "stopped", and why. After `patience_seconds` without an answer to the check-in it is
+        told so, and the host goes on waiting."""
         if not service_id:
             raise ValueError("a service needs an ID")
         self._id = service_id
@@ -159,6 +163,7 @@ class Host:
         self._stopped = threading.Event()
         self._changed = threading.Event()  # something for run() to look at
         self._failures = 0
+        self._patience_seconds = patience_seconds
 
     def run(self):
         """Serves until stop(). Once."""
@@ -173,7 +178,7 @@ class Host:
         self._on_status("stopped", "")
 
     def stop(self):
-        """From any thread, and from signal handlers: cancels what runs, and lets run() return."""
+        """From any other thread: cancels what runs, and lets run() return."""
         self._stopped.set()
         self._worker.cancel_all()
         self._changed.set()
@@ -216,33 +221,42 @@ class Host:
             attempt.ended()
 
     def _wait_for_end(self, attempt):
-        told = False
+        answered = stays = reminded = False
+        deadline = time.monotonic() + self._patience_seconds
         while not self._stopped.is_set():
-            self._changed.wait()
+            is_patient = not (answered or reminded)
+            self._changed.wait(max(0.0, deadline - time.monotonic()) if is_patient else None)
             self._changed.clear()
-            if attempt.over or attempt.daemon.closed:
+            if attempt.daemon.closed:
                 return "the daemon has closed the connection"
-            if attempt.answers and not told:
-                told = True
-                problem = self._tell(attempt.answers[0])
+            if attempt.answers and not answered:
+                answered = True
+                problem, stays = self._tell(attempt.answers[0])
                 if problem:
                     return problem
+            if attempt.over and (reminded or answered and not stays):
+                return _NO_ANSWER if reminded else "the daemon has let the service go"
+            if not answered and not reminded and time.monotonic() >= deadline:
+                reminded = True
+                self._changed.set()  # what is over already is looked at once more
+                self._on_status("checking in", _NO_ANSWER)
         return "stopped"
 
     def _tell(self, message):
-        """Answers what is wrong, if the service cannot stay."""
+        """Answers what is wrong, if the service cannot stay, and whether it stays without being
+        called: a declared service waits for another daemon."""
         try:
             registered, problems = contents_of(message)
         except (Error, ValueError) as error:
-            return f"the check-in failed: {error}"
+            return f"the check-in failed: {error}", False
+        if problems:
+            return problems[0], False
         if registered:
             self._failures = 0
             self._on_status("serving", "")
-        elif problems:
-            return problems[0]
-        else:
-            self._on_status("refused", f"a descriptor file declares {self._id}, so it cannot check in")
-        return None
+            return None, False
+        self._on_status("refused", f"a descriptor file declares {self._id}, so it cannot check in")
+        return None, True
 
     def _called(self, invocation):
         """Answers whether there is such a method."""
@@ -332,6 +346,11 @@ def _socket_from_environment():
 def serve(service_id, service, **options):
     """Serves until SIGTERM or SIGINT; options as of Host. From the main thread."""
     host = Host(service_id, service, **options)
+
+    def stop(*_):
+        # The signal may have come while this very thread held a lock that stop() needs.
+        threading.Thread(target=host.stop, daemon=True).start()
+
     for number in (signal.SIGTERM, signal.SIGINT):
-        signal.signal(number, lambda *_: host.stop())
+        signal.signal(number, stop)
     host.run()

@@ -31,6 +31,7 @@ std::vector<LineRule> aboutTheSeam() {
   clocks.words = {"_clock"};
   clocks.planted = {"auto t = std::chrono::steady_clock::now();"};
   clocks.harmless = {"my_clock::now();"};
+  clocks.exceptions = {{"sdk/examples/", "a program of a user of the library"}};
 
   LineRule hashes = rule("OrderOfAHash", Where::kDaemonRooms, Look::kCode,
                          "unordered_(map|set|multimap|multiset)|std::hash\\b",

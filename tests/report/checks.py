@@ -170,6 +170,10 @@ def every_entry_can_be_reached_and_found(browser, world):
     status = "document.querySelector('.pager [role=status]').textContent"
     click = "[...document.querySelectorAll('.pager button')].find((one) => one.textContent === '%s').click()"
     same(browser.value(status), "1 to 50 of 400 entries", "page")
+    lines = browser.value("Math.max(...[...document.querySelectorAll('tbody .number')].map((cell) => {"
+                          "const range = document.createRange(); range.selectNodeContents(cell);"
+                          "return new Set([...range.getClientRects()].map((one) => one.top)).size;}))")
+    same(lines, 1, "lines that a number takes")
     seen = 50
     while browser.value("!document.querySelectorAll('.pager button')[2].disabled"):
         browser.value(click % "Older")

@@ -27,7 +27,7 @@ function detailOf(entry) {
 
 const kColumns = [
   {title: 'When', class: 'when'},
-  {title: 'What', text: (entry) => entry.kind},
+  {title: 'What', class: 'when', text: (entry) => entry.kind},
   {title: 'Volume', text: (entry) => entry.volume},
   {title: 'For', text: askerOf},
   {title: 'Asked', class: 'number', text: (entry) => sizeText(entry.asked)},
@@ -43,7 +43,7 @@ function rowOf(entry) {
   const cells = kColumns.slice(1).map((column) => {
     const text = column.text(entry);
     const cell = element('td', {class: column.class, 'data-label': column.title});
-    if (text !== undefined && text !== '') cell.append(nameOf(text));
+    if (text !== undefined && text !== '') cell.append(column.class === 'number' ? String(text) : nameOf(text));
     return cell;
   });
   if (entry.why !== undefined) cells[cells.length - 1].classList.add('low');

@@ -156,8 +156,8 @@ class NoDaemon(unittest.TestCase):
                     spacekeep.Client(path)
 
     def test_that_says_nothing_is_not_waited_for(self):
-        patience, connection._AUTHENTICATION_SECONDS = connection._AUTHENTICATION_SECONDS, 0.1
-        self.addCleanup(setattr, connection, "_AUTHENTICATION_SECONDS", patience)
+        patience, connection.AUTHENTICATION_SECONDS = connection.AUTHENTICATION_SECONDS, 0.1
+        self.addCleanup(setattr, connection, "AUTHENTICATION_SECONDS", patience)
         with tempfile.TemporaryDirectory() as folder:
             path = os.path.join(folder, "socket")
             with socket.create_server(path, family=socket.AF_UNIX):

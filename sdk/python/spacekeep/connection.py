@@ -14,7 +14,7 @@ SOCKET = "/run/spacekeep/spacekeep.sock"
 OBJECT = "/com/quorvel/Spacekeep"
 DAEMON_ACCOUNT = "_spacekeep"
 
-_AUTHENTICATION_SECONDS = 5
+AUTHENTICATION_SECONDS = 5
 _SENDING_SECONDS = 30
 _MOST_LINE_BYTES = 4096
 _ID = b"73706163656b6565702d707974686f6e"
@@ -27,27 +27,27 @@ _KINDS = {"org.freedesktop.DBus.Error.UnknownMethod": NotSupported,
 def connect(path):
     """A socket that is connected to the daemon, and to nobody else. Raises Unreachable."""
     plain = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
-    plain.settimeout(_AUTHENTICATION_SECONDS)
+    plain.settimeout(AUTHENTICATION_SECONDS)
     try:
         plain.connect(path)
-        uid = _peer_of(plain)
+        uid = peer_of(plain)
     except OSError as error:
         plain.close()
         raise Unreachable(f"nobody listens at {path}: {error.strerror or error}; does the daemon "
                           "run?") from None
-    if uid in _daemon_users():
+    if uid in daemon_users():
         return plain
     plain.close()
     raise Unreachable(f"{path} is served by user {uid}, who is not the daemon")
 
 
-def _peer_of(plain):
+def peer_of(plain):
     form = "3i"
     facts = plain.getsockopt(socket.SOL_SOCKET, socket.SO_PEERCRED, struct.calcsize(form))
     return struct.unpack(form, facts)[1]
 
 
-def _daemon_users():
+def daemon_users():
     users = {0, os.geteuid()}
     try:
         users.add(pwd.getpwnam(DAEMON_ACCOUNT).pw_uid)

@@ -109,7 +109,9 @@ INSTANTIATE_TEST_SUITE_P(On, DocumentedService,
                          testing::Values("/programs/sdk/example_thumbnail_cache",
                                          "/programs/sdk/example_thumbnails",
                                          "env PYTHONPATH=/source/sdk/python /usr/bin/python3 -B "
-                                         "/source/sdk/examples/thumbnails.py"));
+                                         "/source/sdk/examples/thumbnails.py",
+                                         "env PYTHONPATH=/source/sdk/python /usr/bin/python3 -B "
+                                         "/source/tests/programs/listening_thumbnails.py"));
 
 TEST_F(CheckServiceGood, AServiceWithNothingToGiveIsToldWhatCouldNotBeSeen) {
   const Finished run = onVolume(0, checking("--yes") + "-- " + program("sdk/example_on_demand"));

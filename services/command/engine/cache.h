@@ -41,8 +41,9 @@ struct Result {
   std::vector<std::string> problems;
 };
 
-/// Told of each file, directory or command as it goes or runs (or would), with its bytes.
-using Visitor = std::function<void(const std::string& what, std::uint64_t bytes)>;
+/// Told of each file, directory or command as it goes or runs (or would), with its bytes; without
+/// them where a command would run of which nobody can tell what it frees.
+using Visitor = std::function<void(const std::string& what, std::optional<std::uint64_t> bytes)>;
 
 class Cache {
  public:

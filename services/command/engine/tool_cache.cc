@@ -158,12 +158,11 @@ class CacheOfTool::Cleaning {
   void play(const CleanStep& step) {
     const std::uint64_t missing = request_.amount - result_.bytes;
     const Words words = withAmounts(step.command, missing, occupied_);
-    std::uint64_t freed = 0;
+    std::optional<std::uint64_t> freed;
     if (request_.dry_run) {
-      std::uint64_t all =
-          cache_.wouldFree(step, opened_.roots, cancel_, result_.problems).value_or(0);
-      if (dependsOnAmount(step.command)) all = std::min(all, request_.amount);
-      freed = all - std::min(all, result_.bytes);  // what milder commands took is in it
+      freed = cache_.wouldFree(step, opened_.roots, cancel_, result_.problems);
+      if (freed && dependsOnAmount(step.command)) freed = std::min(*freed, request_.amount);
+      if (freed) *freed -= std::min(*freed, result_.bytes);  // what milder commands took is in it
     } else {
       const ToolRun run = runTool(words, cache_.environment_, step.limit_ns, cancel_);
       if (!run.good() && run.end != ToolEnd::kCancelled && run.end != ToolEnd::kAbsent) {
@@ -174,8 +173,8 @@ class CacheOfTool::Cleaning {
       freed = occupied_ - std::min(occupied_, left);
       occupied_ = left;
     }
-    result_.bytes += freed;
-    if (visit_ && freed > 0) visit_(textOf(words), freed);
+    result_.bytes += freed.value_or(0);
+    if (visit_ && freed != std::uint64_t{0}) visit_(textOf(words), freed);
   }
 
   /// The volume stood still before, so what it did not gain did not come back.

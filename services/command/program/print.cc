@@ -63,14 +63,15 @@ ExitCode freeOnce(std::vector<Rule> rules, const UserFolders* folders, const Opt
   std::atomic<bool> stopped{false};
   const cachedir::StopSignals signals([&stopped] { stopped = true; });
   const bool dry_run = options.mode == Mode::kDryRun;
-  const Result result = set.free({.amount = options.amount,
-                                  .urgency = options.urgency,
-                                  .volume = options.volume,
-                                  .dry_run = dry_run},
-                                 CancelToken([&stopped] { return stopped.load(); }),
-                                 [](const std::string& what, std::uint64_t bytes) {
-                                   fmt::print("{}\t{}\n", bytes, printable(what));
-                                 });
+  const Result result =
+      set.free({.amount = options.amount,
+                .urgency = options.urgency,
+                .volume = options.volume,
+                .dry_run = dry_run},
+               CancelToken([&stopped] { return stopped.load(); }),
+               [](const std::string& what, std::optional<std::uint64_t> bytes) {
+                 fmt::print("{}\t{}\n", bytes ? std::to_string(*bytes) : "?", printable(what));
+               });
   std::fflush(stdout);
   printProblems(result.problems);
   fmt::print(stderr, "{} {} bytes ({}){}\n", dry_run ? "would free" : "freed", result.bytes,

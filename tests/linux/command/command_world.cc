@@ -58,11 +58,11 @@ UserFolders homeAt(const std::string& home) {
 
 Went freeFrom(const Cache& cache, const Request& request) {
   Went went;
-  went.result =
-      cache.free(request, CancelToken(), [&went](const std::string& what, std::uint64_t bytes) {
-        went.what.push_back(what);
-        went.sum += bytes;
-      });
+  went.result = cache.free(request, CancelToken(),
+                           [&went](const std::string& what, std::optional<std::uint64_t> bytes) {
+                             went.what.push_back(what);
+                             went.sum += bytes.value_or(0);
+                           });
   EXPECT_EQ(went.sum, went.result.bytes);
   return went;
 }

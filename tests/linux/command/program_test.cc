@@ -83,6 +83,27 @@ TEST_F(CommandProgram, ARuleThatIsOffIsSwitchedOnByAFileOfTheSameName) {
   EXPECT_TRUE(exists(volume_ / "a/old"));
 }
 
+TEST_F(CommandProgram, ADryRunNamesTheCommandOfWhichNobodyKnowsWhatItFrees) {
+  write("t",
+        "<plist version=\"1.0\"><dict><key>SPACEKEEP_ID</key><string>com.example.t</string>"
+        "<key>MEASURE</key><array><string>" +
+            (volume_ / "b") +
+            "</string></array><key>CLEAN</key><dict><key>3</key><dict><key>COMMAND</key><array>"
+            "<string>rm</string><string>" +
+            (volume_ / "b/old") + "</string></array></dict></dict></dict></plist>");
+  const std::vector<std::string> asked = {"--rules-dir", rules_, "--only", "t", "--urgency", "3"};
+  const auto with = [&](std::vector<std::string> more) {
+    more.insert(more.begin(), asked.begin(), asked.end());
+    return runIt(more);
+  };
+  const Ended dry = with({"--dry-run"});
+  EXPECT_EQ(dry.out, "?\trm " + (volume_ / "b/old") + "\n");
+  EXPECT_EQ(dry.err, "would free 0 bytes (0 B)\n");
+  EXPECT_TRUE(exists(volume_ / "b/old"));
+  EXPECT_EQ(with({"--once", "--amount", "1M"}).out, "1048576\trm " + (volume_ / "b/old") + "\n");
+  EXPECT_FALSE(exists(volume_ / "b/old"));
+}
+
 TEST_F(CommandProgram, EachRuleDescribesItself) {
   EXPECT_EQ(runIt({"--rules-dir", rules_, "--only", "a", "--describe"}).out,
             "a (on): things\n  urgency 1 takes some\n  lost: little\n  source: we do\n");

@@ -7,6 +7,7 @@
 #include <sys/sysmacros.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <csignal>
@@ -63,13 +64,24 @@ bool isOurs(const std::string& process) {
   return ::stat(process.c_str(), &facts) == 0 && (own == 0 || facts.st_uid == own);
 }
 
-bool runs(const std::string& name, const std::string& proc) {
+/// Some tools leave a process behind that only holds a name space open.
+bool isIdle(const std::string& process, const std::vector<std::string>& idle) {
+  if (idle.empty()) return false;
+  const std::string comm = commOf(process);
+  return std::ranges::any_of(
+      idle, [&](const std::string& name) { return comm == name.substr(0, kCommBytes); });
+}
+
+bool runs(const Condition& condition, const std::string& proc) {
   const std::unique_ptr<DIR, DirectoryCloser> processes(::opendir(proc.c_str()));
   if (!processes) return true;  // nobody can tell
   while (const dirent* entry = ::readdir(processes.get())) {
     if (entry->d_name[0] < '0' || entry->d_name[0] > '9') continue;
     const std::string process = proc + "/" + entry->d_name;
-    if (isOurs(process) && isCalled(process, name)) return true;
+    if (isOurs(process) && isCalled(process, condition.subject) &&
+        !isIdle(process, condition.idle)) {
+      return true;
+    }
   }
   return false;
 }
@@ -105,7 +117,7 @@ bool isAnyOpenBelow(const std::string& pattern) {
 std::string whyNot(const Condition& condition, const std::string& proc) {
   switch (condition.kind) {
     case Condition::Kind::kProcess:
-      return runs(condition.subject, proc) ? condition.subject + " is running" : "";
+      return runs(condition, proc) ? condition.subject + " is running" : "";
     case Condition::Kind::kLocked:
       return isLocked(condition.subject, proc) ? condition.subject + " is locked" : "";
     case Condition::Kind::kPidFile:

@@ -32,6 +32,7 @@ struct Condition {
   };
   Kind kind = Kind::kProcess;
   std::string subject;
+  std::vector<std::string> idle;  // processes that go by one of these names do not count
 };
 
 /// A lock that the cache's owner takes to work on it, taken the same way while something goes.

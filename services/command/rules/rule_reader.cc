@@ -22,6 +22,7 @@ constexpr std::string_view kKeys[] = {"SPACEKEEP_ID",
                                       "LOSES",
                                       "SOURCE",
                                       "NOT_WHILE",
+                                      "IDLE_PROCESSES",
                                       "OWNERS_LOCKS",
                                       "DIRECTORIES",
                                       "MEASURE",
@@ -115,10 +116,12 @@ Condition::Kind kindOf(const std::string& key) {
 
 void Reader::readConditions(const Dictionary& top) {
   constexpr std::string_view known[] = {"PROCESS", "LOCKED", "PID_FILE", "OPEN"};
+  const auto idle = fields_.texts(top, "IDLE_PROCESSES", kMaxConditions, "");
   for (const OneKey& each : oneKeyEach(fields_, top, "NOT_WHILE", known)) {
     Condition condition;
     if (each.key == "PROCESS") {
       condition.subject = each.text;
+      condition.idle = idle;
       if (each.text.find('/') != std::string::npos) {
         fields_.fail(each.where, "\"" + each.text + "\" holds a slash",
                      "give the executable's name without its directory");

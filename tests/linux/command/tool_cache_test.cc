@@ -3,8 +3,10 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
+#include <filesystem>
 #include <fstream>
 
 #include "services/command/engine/file_age.h"
@@ -157,6 +159,40 @@ TEST_F(ToolCacheTest, WhileItsOwnerRunsNothingIsTaken) {
   std::ofstream(pid_file) << "not a number";
   const auto free = cache(tool_, condition("PID_FILE", pid_file));
   EXPECT_EQ(freeAsForetold(*free, request(4)).result.bytes, 5 * kMiB);
+}
+
+/// A shell that goes by another name than its executable, as rootless podman's does.
+TEST_F(ToolCacheTest, AProcessThatOnlyWaitsUnderANameOfItsOwnDoesNotKeepTheCache) {
+  const std::string tool = volume_ / "busy-tool";
+  std::filesystem::copy_file("/bin/sh", tool);
+  int to_it[2];
+  int from_it[2];
+  ASSERT_EQ(::pipe(to_it), 0);
+  ASSERT_EQ(::pipe(from_it), 0);
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::dup2(to_it[0], 0);
+    ::dup2(from_it[1], 1);
+    for (const int fd : {to_it[0], to_it[1], from_it[0], from_it[1]}) ::close(fd);
+    ::execl(tool.c_str(), tool.c_str(), "-c",
+            "echo 'busy-tool wait' >/proc/$$/comm; echo; read end", nullptr);
+    ::_exit(1);
+  }
+  ::close(to_it[0]);
+  ::close(from_it[1]);
+  char ready = 0;
+  ASSERT_EQ(::read(from_it[0], &ready, 1), 1);
+  const std::string runs =
+      "<key>NOT_WHILE</key><array><dict><key>PROCESS</key><string>busy-tool</string></dict>"
+      "</array>";
+  EXPECT_EQ(freeAsForetold(*cache(tool_, runs), request(4)).result.note, "busy-tool is running");
+  const std::string other = "<key>IDLE_PROCESSES</key>" + arrayOf({"busy-tool"});
+  EXPECT_EQ(freeAsForetold(*cache(tool_, runs + other), request(4)).result.bytes, 0U);
+  const std::string idle = "<key>IDLE_PROCESSES</key>" + arrayOf({"busy-tool wait"});
+  EXPECT_EQ(freeAsForetold(*cache(tool_, runs + idle), request(4)).result.bytes, 5 * kMiB);
+  ::close(to_it[1]);
+  ::close(from_it[0]);
+  ::waitpid(child, nullptr, 0);
 }
 
 TEST_F(ToolCacheTest, WhatTheToolsOwnDryRunTellsIsPromised) {

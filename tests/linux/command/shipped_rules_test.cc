@@ -113,6 +113,9 @@ const Layout kLayouts[] = {
     {"crash-reports",
      {{".mozilla/firefox/Crash Reports/pending/a.dmp", 40, 1},
       {".mozilla/firefox/Crash Reports/submitted/bp-a.txt", 20, 2},
+      {".config/mozilla/firefox/Crash Reports/pending/b.dmp", 10, 3},
+      {".config/mozilla/firefox/Crash Reports/submitted/bp-b.txt", 4, 4},
+      {".config/mozilla/firefox/Crash Reports/submit.log", 400, kNever},
       {".cache/drkonqi/crash/a", 4, 4},
       {".mozilla/firefox/Crash Reports/InstallTime2024", 400, kNever}}},
     {"user-caches",
@@ -286,6 +289,7 @@ TEST_F(ShippedRules, TheSystemsDirectoriesGiveByAgeWhatIsDescribed) {
        {{"/var/crash/_usr_bin_x.0.crash", 40, 1},
         {"/var/crash/202401010000/dump.202401010000", 20, 2},
         {"/var/crash/_usr_bin_y.0.crash", 4, 4},
+        {"/var/crash/kdump_lock", 400, kNever},
         {"/var/crash/kexec_cmd", 400, kNever}}},
       {"snap-downloads",
        {{"/var/lib/snapd/cache/" + kHash, 40, 1}, {"/var/lib/snapd/snaps/x_1.snap", 400, kNever}}}};

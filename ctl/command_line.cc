@@ -26,6 +26,7 @@ struct Options {
   CommonOptions common{.socket_path = sdk::kDefaultSocketPath, .json = false};
   PurgeOptions purge;
   std::string amount_text;
+  std::string item_text;
   QueryOptions query;
   StateOptions state;
   VolumesOptions volumes;
@@ -280,6 +281,11 @@ void addCheckService(CLI::App& app, const SharedOptions& options, Command& chose
       .add_option("--in-use", wanted.in_use,
                   "File to hold open, locked and mapped during purges, or directory of such")
       ->option_text("PATH");
+  check
+      .add_option("--item", options->item_text,
+                  "Size of the largest item, where more than a single file goes at a time")
+      ->option_text("SIZE")
+      ->check(sizeInto(wanted.item_bytes));
   check
       .add_option("--patience", wanted.patience_seconds,
                   "Seconds after which an answer counts as missing, 1 to 600 (default 20)")

@@ -20,7 +20,8 @@ inline constexpr int kHighestUrgency = 4;
 struct Bench {
   Subject& subject;
   SpaceMeter& space;
-  std::string in_use;  ///< a file or directory to use during purges; may be empty
+  std::string in_use;            ///< a file or directory to use during purges; may be empty
+  std::uint64_t item_bytes = 0;  ///< the largest item, where items are more than single files
   std::optional<HeldFiles> held;
   /// What the service said it could free, by urgency 1 to 4. None until it was asked.
   std::optional<std::array<std::uint64_t, kHighestUrgency>> offered;

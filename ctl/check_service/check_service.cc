@@ -126,6 +126,7 @@ class CheckRun {
     Bench bench{.subject = subject_,
                 .space = space,
                 .in_use = options_.in_use,
+                .item_bytes = options_.item_bytes,
                 .held = {},
                 .offered = {},
                 .share_limit = {}};

@@ -29,14 +29,16 @@ double milliseconds(std::uint64_t duration_ns) { return static_cast<double>(dura
 /// The share and the size of one item, beyond which a purge has taken too much.
 Finding limitOf(const Bench& bench, const SpaceReading& before, std::uint64_t share,
                 std::uint64_t freed) {
-  const std::uint64_t item = before.files ? largestOf(*before.files) : share;
+  const std::uint64_t file = before.files ? largestOf(*before.files) : share;
+  const std::uint64_t item = std::max(file, bench.item_bytes);
   if (freed <= share + item + bench.space.slackFor(0)) {
     return fine(fmt::format("{} for {}", printSize(freed), printSize(share)));
   }
   const std::string allowance =
-      before.files ? "its largest file has " + exactSize(item)
-                   : "twice the amount is taken for too much, since the size of its items is not "
-                     "known without --data";
+      item > file    ? "its largest item has " + exactSize(item)
+      : before.files ? "its largest file has " + exactSize(item)
+                     : "twice the amount is taken for too much, since the size of its items is not "
+                       "known without --data";
   return failed(fmt::format(
       "Asked for {}, it gave up {} ({}). Stop at the first item with which the amount is reached: "
       "what goes beyond is lost for nothing.",

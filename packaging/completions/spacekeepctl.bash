@@ -20,7 +20,7 @@ _spacekeepctl_options() {
     query) printf '%s\n' --itemized --urgency ;;
     'state set') printf '%s\n' --type --force ;;
     check-service)
-      printf '%s\n' --volume --endpoint --data --in-use --patience --yes --no-purge
+      printf '%s\n' --volume --endpoint --data --in-use --item --patience --yes --no-purge
       ;;
     'state list' | volumes) printf '%s\n' --names ;;
     '') printf '%s\n' --version ;;
@@ -40,7 +40,7 @@ _spacekeepctl_option_value() {
     --volume)
       _spacekeepctl_matches "$2" < <("$tool" volumes --names 2>/dev/null)
       ;;
-    --timeout | --token | --patience | --since) COMPREPLY=() ;;
+    --timeout | --token | --patience | --item | --since) COMPREPLY=() ;;
     *) return 1 ;;
   esac
 }
@@ -69,7 +69,7 @@ _spacekeepctl() {
         return
         ;;
       --socket | --urgency | --timeout | --token | --type | --volume | --endpoint | --data | \
-        --in-use | --patience | --root | --html | --since)
+        --in-use | --item | --patience | --root | --html | --since)
         local option=${COMP_WORDS[i]}
         [[ ${COMP_WORDS[i + 1]} == = ]] && ((i++))
         ((i++))

@@ -54,6 +54,23 @@ TEST_F(CheckServiceOfRules, WholeDirectories) {
                         "<dict><key>4</key><integer>0</integer></dict></dict></array>")));
 }
 
+/// A tool that takes all or nothing.
+TEST_F(CheckServiceOfRules, AToolThatGivesAllAtOncePassesWhenTheItemIsToldToBeSoLarge) {
+  const std::string tool = volume() + "/tool";
+  const std::string write =
+      "printf '#!/bin/sh\\nrm -f " + cache() + "/*\\n' >" + tool + "\nchmod +x " + tool + "\n";
+  const std::string rule =
+      "<key>MEASURE</key><array><string>" + cache() +
+      "</string></array><key>CLEAN</key><dict><key>4</key><dict><key>COMMAND</key><array><string>" +
+      tool + "</string></array><key>AMOUNT</key><dict/></dict></dict>";
+  const std::string files = "--yes --data " + cache();
+  const Finished untold = onVolume(300, write + checking(files) + service(rule));
+  EXPECT_THAT(checksThatWere("FAILED", untold.out), testing::ElementsAre("purge-limit"))
+      << untold.out;
+  const Finished told = onVolume(300, write + checking(files + " --item 10M") + service(rule));
+  EXPECT_EQ(told.exit_code, 0) << told.out << told.err;
+}
+
 /// A tool that removes item after item until only so many bytes are left.
 TEST_F(CheckServiceOfRules, AToolThatIsToldHowMuchMayStay) {
   const std::string tool = volume() + "/tool";

@@ -18,17 +18,32 @@ bool hasCondition(const Rule& rule) {
   return rule.users || rule.groups || rule.units || rule.labels;
 }
 
+/// What is left open counts as if it fitted, where anything would.
+template <class Alternatives>
+bool holds(const std::optional<Alternatives>& alternatives, bool left_open, bool fits) {
+  return !alternatives || fits || (left_open && !alternatives->empty());
+}
+
+bool matches(const Rule& rule, const PeerIdentity& identity, const UnclearFacts& left_open) {
+  if (!hasCondition(rule)) return rule.matches_anybody;
+  const auto is_peer = [&identity](std::uint32_t user) { return identity.uid() == user; };
+  const auto is_member = [&identity](std::uint32_t group) { return identity.isMemberOf(group); };
+  return holds(rule.users, false, rule.users && std::ranges::any_of(*rule.users, is_peer)) &&
+         holds(rule.groups, left_open.groups,
+               rule.groups && std::ranges::any_of(*rule.groups, is_member)) &&
+         holds(rule.units, left_open.unit, rule.units && holdsText(*rule.units, identity.unit())) &&
+         holds(rule.labels, left_open.label,
+               rule.labels && holdsText(*rule.labels, identity.label()));
+}
+
 }  // namespace
 
 bool matches(const Rule& rule, const PeerIdentity& identity) {
-  if (!hasCondition(rule)) return rule.matches_anybody;
-  if (rule.users && std::ranges::find(*rule.users, identity.uid()) == rule.users->end()) {
-    return false;
-  }
-  const auto is_member = [&identity](std::uint32_t group) { return identity.isMemberOf(group); };
-  if (rule.groups && std::ranges::none_of(*rule.groups, is_member)) return false;
-  if (rule.units && !holdsText(*rule.units, identity.unit())) return false;
-  return !rule.labels || holdsText(*rule.labels, identity.label());
+  return matches(rule, identity, UnclearFacts{});
+}
+
+bool mayMatch(const Rule& rule, const PeerIdentity& identity) {
+  return matches(rule, identity, identity.unclear());
 }
 
 Verdict judge(std::span<const Rule> rules, const PeerIdentity& identity,
@@ -37,8 +52,8 @@ Verdict judge(std::span<const Rule> rules, const PeerIdentity& identity,
   for (const Rule& rule : rules) {
     const bool denies = names(rule.denies, entitlement);
     const bool grants = verdict.decision == Decision::kSilent && names(rule.grants, entitlement);
-    if ((!denies && !grants) || !matches(rule, identity)) continue;
-    if (denies) return {Decision::kDenied, rule.name};
+    if (denies && mayMatch(rule, identity)) return {Decision::kDenied, rule.name};
+    if (!grants || !matches(rule, identity)) continue;
     verdict = {Decision::kGranted, rule.name};
   }
   return verdict;

@@ -28,7 +28,10 @@ struct Rule {
   std::vector<std::string> denies;
 };
 
+/// By what is known for certain: what counts for grants.
 [[nodiscard]] bool matches(const Rule& rule, const PeerIdentity& identity);
+/// The same, or it cannot be ruled out: what counts for denials.
+[[nodiscard]] bool mayMatch(const Rule& rule, const PeerIdentity& identity);
 
 enum class Decision {
   kGranted,

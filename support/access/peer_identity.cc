@@ -27,8 +27,9 @@ bool PeerIdentity::isMemberOf(std::uint32_t group) const {
 }
 
 std::string PeerIdentity::describe() const {
-  std::string text = "uid " + std::to_string(facts_.uid) + " gid " + std::to_string(facts_.gid) +
-                     " pid " + std::to_string(facts_.pid);
+  const std::string gid = facts_.gid == kNoGroup ? "unknown" : std::to_string(facts_.gid);
+  std::string text =
+      "uid " + std::to_string(facts_.uid) + " gid " + gid + " pid " + std::to_string(facts_.pid);
   if (facts_.unit) text += " unit " + *facts_.unit;
   return text;
 }

@@ -1,7 +1,7 @@
 // Thread safety: immutable after construction; may be read from any thread.
 //
 // Who stands at the other end of an accepted connection, as the kernel vouched for it when the
-// connection was accepted. Taken once and never looked up again: a process number may belong to
+// connection was accepted (for a caller over a bus: as the bus had it from the kernel). Taken once and never looked up again: a process number may belong to
 // somebody else by the time a call arrives.
 #pragma once
 
@@ -14,11 +14,22 @@
 
 namespace spacekeep::access {
 
+/// Stands where there is no group; no rule can name it.
+inline constexpr std::uint32_t kNoGroup = UINT32_MAX;
+
+/// What nobody told of a peer, so that it may or may not be so. Nothing is granted on account of it,
+/// and what is denied on account of it is denied.
+struct UnclearFacts {
+  bool groups = false;
+  bool label = false;
+  bool unit = false;
+};
+
 /// What an identity is made of. An absent member means that the kernel gave no clear answer, and an
-/// absent member matches no rule.
+/// absent member matches no rule that grants.
 struct PeerFacts {
   std::uint32_t uid = 0;
-  std::uint32_t gid = 0;
+  std::uint32_t gid = 0;  ///< kNoGroup when it is not known which of the groups is the primary one
   std::vector<std::uint32_t> groups = {};  ///< supplementary groups
   std::optional<std::string> label =
       {};                ///< security label (SELinux context, AppArmor profile, ...)
@@ -27,6 +38,7 @@ struct PeerFacts {
   /// The system service that the process belongs to ("cache.service"). Only set together with
   /// `pidfd`, because a unit looked up by process number alone could be somebody else's.
   std::optional<std::string> unit = {};
+  UnclearFacts unclear = {};
 };
 
 class PeerIdentity {
@@ -42,6 +54,8 @@ class PeerIdentity {
   [[nodiscard]] std::int32_t pid() const { return facts_.pid; }
   [[nodiscard]] const ipc::SharedDescriptor& pidfd() const { return facts_.pidfd; }
   [[nodiscard]] const std::optional<std::string>& unit() const { return facts_.unit; }
+
+  [[nodiscard]] const UnclearFacts& unclear() const { return facts_.unclear; }
 
   /// Primary or supplementary.
   [[nodiscard]] bool isMemberOf(std::uint32_t group) const;

@@ -17,6 +17,9 @@ namespace {
 /// say.
 constexpr mode_t kSocketMode = 0666;
 
+/// Where programs find it that look on the system bus.
+constexpr const char* kBusName = "com.quorvel.Spacekeep";
+
 /// Stands in where there is no socket: the daemon goes on with what needs no clients.
 class DeafListener final : public ipc::Listener {
  public:
@@ -113,8 +116,10 @@ std::unique_ptr<ipc::Listener> LinuxPlatform::makeListener(ipc::ServedInterface 
                why);
     return std::make_unique<DeafListener>();
   }
+  ipc::ServerOptions options;
+  options.bus = {.socket = paths_.system_bus_socket, .name = kBusName};
   return std::make_unique<ipc::BusListener>(ipc_loop_, global_, access_, std::move(listening),
-                                            std::move(interface));
+                                            std::move(interface), std::move(options));
 }
 
 void LinuxPlatform::watchQueues(std::vector<std::shared_ptr<SerialQueue>> queues) {

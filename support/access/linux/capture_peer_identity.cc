@@ -96,16 +96,6 @@ bool stillRuns(int pidfd) {
   return ::poll(&exit_of_process, 1, 0) == 0;
 }
 
-/// The number is read from the pidfd, and the pidfd is asked afterwards whether its process still
-/// runs: only then cannot the number have passed on to another process while /proc was read.
-std::optional<std::string> unitOf(int pidfd) {
-  const auto pid = pidOf(pidfd);
-  if (!pid) return std::nullopt;
-  const auto cgroup = readProcFile("/proc/" + std::to_string(*pid) + "/cgroup");
-  if (!cgroup || !stillRuns(pidfd)) return std::nullopt;
-  return systemUnitFromCgroup(*cgroup);
-}
-
 std::optional<ucred> readCredentials(int fd) {
   ucred credentials{};
   socklen_t bytes = sizeof(credentials);
@@ -119,6 +109,17 @@ std::optional<ucred> readCredentials(int fd) {
 }
 
 }  // namespace
+
+/// The number is read from the pidfd, and the pidfd is asked afterwards whether its process still
+/// runs: only then cannot the number have passed on to another process while /proc was read.
+bool addFactsOfProcess(PeerFacts& facts) {
+  const auto pid = facts.pidfd == nullptr ? std::nullopt : pidOf(facts.pidfd->fd());
+  if (!pid) return false;
+  const auto cgroup = readProcFile("/proc/" + std::to_string(*pid) + "/cgroup");
+  if (!cgroup || !stillRuns(facts.pidfd->fd())) return false;
+  facts.unit = systemUnitFromCgroup(*cgroup);
+  return true;
+}
 
 std::optional<uid_t> peerUid(int fd) {
   const auto credentials = readCredentials(fd);
@@ -135,7 +136,7 @@ std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd) {
                   .pid = credentials->pid,
                   .pidfd = readPidfd(fd),
                   .unit = std::nullopt};
-  if (facts.pidfd != nullptr) facts.unit = unitOf(facts.pidfd->fd());
+  addFactsOfProcess(facts);
   return std::make_shared<const PeerIdentity>(std::move(facts));
 }
 

@@ -17,6 +17,9 @@ namespace spacekeep::access {
 /// be refused. Whatever else is unclear is left out of the identity. Does not take over `fd`.
 [[nodiscard]] std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd);
 
+/// Adds what /proc tells of the process behind `facts.pidfd`. False when there is none, or it is gone.
+bool addFactsOfProcess(PeerFacts& facts);
+
 /// The user alone, for what must cost little. None as above.
 [[nodiscard]] std::optional<uid_t> peerUid(int fd);
 

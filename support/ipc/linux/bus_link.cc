@@ -21,18 +21,12 @@ namespace spacekeep::ipc {
 
 namespace {
 
-constexpr std::size_t kHeaderBytes = 16;
 constexpr int kMessagesPerTurn = 8;  // then other connections have their turn
+constexpr std::size_t kLeftOutPerTurn = 64 * 1024;
 
-/// A 32-bit number of the header in the byte order that the header states.
-std::uint64_t numberAt(const unsigned char* header, std::size_t offset) {
-  std::uint64_t number = 0;
-  for (std::size_t i = 0; i < 4; ++i) {
-    const std::size_t place = header[0] == 'l' ? 3 - i : i;
-    number = number << 8U | header[offset + place];
-  }
-  return number;
-}
+// Over a bus. Headers that anybody has a use for are much shorter.
+constexpr std::uint64_t kMaxBusHeaderBytes = 8 * 1024;
+constexpr std::size_t kMaxBusMessageBytes = 128 * 1024 * 1024;  // of D-Bus itself
 
 std::size_t bytesAvailable(int fd) {
   int bytes = 0;
@@ -41,8 +35,9 @@ std::size_t bytesAvailable(int fd) {
 
 }  // namespace
 
-BusLink::BusLink(IpcLoop& loop, Owner& owner, Authentication::Role role, const LinkLimits& limits)
-    : loop_(loop), owner_(owner), role_(role), limits_(limits) {}
+BusLink::BusLink(IpcLoop& loop, Owner& owner, Authentication::Role role, const LinkLimits& limits,
+                 Traffic traffic)
+    : loop_(loop), owner_(owner), role_(role), limits_(limits), traffic_(traffic) {}
 
 BusLink::~BusLink() { close(); }
 
@@ -79,11 +74,14 @@ bool BusLink::watch() {
   return true;
 }
 
+bool BusLink::bringsCalls() const {
+  return role_ == Authentication::Role::kServer || traffic_ == Traffic::kOfABus;
+}
+
 /// Two hundred services may answer at the same moment, so who only asks now and then comes before
 /// them. How much one user can ask is limited by the server.
 int BusLink::quietPriority() const {
-  return role_ == Authentication::Role::kServer ? SD_EVENT_PRIORITY_NORMAL - 10
-                                                : SD_EVENT_PRIORITY_NORMAL;
+  return bringsCalls() ? SD_EVENT_PRIORITY_NORMAL - 10 : SD_EVENT_PRIORITY_NORMAL;
 }
 
 /// A peer that keeps its connection busy is served when no quiet one has anything to say, so the
@@ -177,7 +175,7 @@ void BusLink::process() {
   }
   forgetWritten();
   updateEvents();
-  setPriority(turns == kMessagesPerTurn && role_ == Authentication::Role::kServer);
+  setPriority(turns == kMessagesPerTurn && bringsCalls());
   // What is left gets a turn of its own, and so does the end of the stream, so that the calls before
   // it are served: watching again tells at once what is there.
   if (turns == kMessagesPerTurn || peer_hung_up_) sd_event_source_set_io_events(io_, events_);
@@ -187,10 +185,13 @@ void BusLink::process() {
 /// Answers whether there may be more to do.
 bool BusLink::processOnce() {
   bool size_is_known = false;
+  if (left_out_ > 0) return leaveOut();
   if (!in_message_) {
     switch (lookAhead()) {
       case Ahead::kRefused:
         return false;
+      case Ahead::kLeftOut:
+        return leaveOut();
       case Ahead::kDescriptors:
         return readWithDescriptors();
       case Ahead::kMessage:
@@ -205,7 +206,7 @@ bool BusLink::processOnce() {
         // judged: until a message has arrived, its size counts as the largest.
         in_message_ = true;
         message_read_ = 0;
-        message_size_ = limits_.message_bytes;
+        message_size_ = traffic_ == Traffic::kOfABus ? kMaxBusMessageBytes : limits_.message_bytes;
         break;
     }
   }
@@ -226,7 +227,7 @@ bool BusLink::processOnce() {
 }
 
 BusLink::Ahead BusLink::lookAhead() {
-  std::array<unsigned char, kHeaderBytes> header{};
+  std::array<char, kWireFixedBytes> header{};
   iovec part{.iov_base = header.data(), .iov_len = header.size()};
   msghdr message{};
   message.msg_iov = &part;
@@ -240,10 +241,16 @@ BusLink::Ahead BusLink::lookAhead() {
   // A header of which a part has arrived is left in the socket.
   header_is_incomplete_ = static_cast<std::size_t>(seen) < header.size();
   if (header_is_incomplete_) return Ahead::kIncomplete;
-  if (!judgeHeader(header.data())) return Ahead::kRefused;
+  const auto fixed = readWireFixedHeader({header.data(), header.size()});
+  if (!fixed) {
+    end(LinkEnd::kRefused, "it sent something that is no D-Bus message");
+    return Ahead::kRefused;
+  }
   // Without room for them the kernel says that there are descriptors, and leaves them where they
   // are.
   const bool brings_descriptors = (message.msg_flags & MSG_CTRUNC) != 0;
+  if (traffic_ == Traffic::kOfABus) return judgeBusMessage(*fixed, brings_descriptors);
+  if (!judgeHeader(*fixed)) return Ahead::kRefused;
   return brings_descriptors && !sends_descriptors_ ? judgeDescriptors() : Ahead::kMessage;
 }
 
@@ -275,15 +282,12 @@ bool BusLink::readWithDescriptors() {
   return !ended_;
 }
 
-/// The fixed part of a header: byte order, type, flags, version, length of the body, serial, length
-/// of the fields ("Message Format" of the D-Bus specification).
-bool BusLink::judgeHeader(const unsigned char* header) {
-  if ((header[0] != 'l' && header[0] != 'B') || header[1] < 1 || header[1] > 4 || header[3] != 1) {
+bool BusLink::judgeHeader(const WireFixedHeader& header) {
+  if (header.type > kWireSignal) {
     end(LinkEnd::kRefused, "it sent something that is no D-Bus message");
     return false;
   }
-  const std::uint64_t fields = (numberAt(header, 12) + 7) / 8 * 8;
-  const std::uint64_t size = kHeaderBytes + fields + numberAt(header, 4);
+  const std::uint64_t size = header.messageBytes();
   if (size > limits_.message_bytes) {
     end(LinkEnd::kRefused, "it sent a message of " + std::to_string(size) + " bytes, more than " +
                                std::to_string(limits_.message_bytes));
@@ -292,6 +296,61 @@ bool BusLink::judgeHeader(const unsigned char* header) {
   message_size_ = static_cast<std::size_t>(size);
   return true;
 }
+
+/// The broker has checked each message, but sd-bus is stricter here and there (a field that announces
+/// no descriptors is fine with dbus-daemon 1.14). What sd-bus might drop is not shown to it, since it
+/// would read on behind it.
+BusLink::Ahead BusLink::judgeBusMessage(const WireFixedHeader& fixed, bool brings_descriptors) {
+  LeftOut message;
+  message.bytes = fixed.messageBytes();
+  message.brings_descriptors = brings_descriptors;
+  if (fixed.headerBytes() <= kMaxBusHeaderBytes) {
+    const std::string bytes = peek(static_cast<std::size_t>(fixed.headerBytes()));
+    header_is_incomplete_ = bytes.size() < fixed.headerBytes();
+    if (header_is_incomplete_) return Ahead::kIncomplete;
+    message.header = readWireHeader(bytes);
+  }
+  message_size_ = static_cast<std::size_t>(message.bytes);
+  if (brings_descriptors && message.header && fixed.type == kWireReturn &&
+      message.header->sender == kBrokerName) {
+    return Ahead::kDescriptors;
+  }
+  if (message.header && !brings_descriptors && message.bytes <= limits_.message_bytes) {
+    return Ahead::kMessage;
+  }
+  left_out_ = message.bytes;
+  owner_.linkLeftOut(message);
+  return ended_ ? Ahead::kRefused : Ahead::kLeftOut;
+}
+
+/// What is there of the next `size` bytes.
+std::string BusLink::peek(std::size_t size) const {
+  std::string bytes(size, '\0');
+  const ssize_t seen = ::recv(fd_, bytes.data(), size, MSG_PEEK | MSG_DONTWAIT);
+  bytes.resize(seen > 0 ? static_cast<std::size_t>(seen) : 0);
+  return bytes;
+}
+
+/// Reads without room for descriptors, so that the kernel closes them. Answers whether there may be
+/// more to do.
+bool BusLink::leaveOut() {
+  std::array<char, 16 * 1024> unused;  // NOLINT: never read
+  for (std::size_t taken = 0; taken < kLeftOutPerTurn && left_out_ > 0;) {
+    const auto wanted = static_cast<std::size_t>(std::min<std::uint64_t>(left_out_, unused.size()));
+    const ssize_t count = ::recv(fd_, unused.data(), wanted, MSG_DONTWAIT);
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0 && errno == EAGAIN) return false;
+    if (count <= 0) {
+      end(LinkEnd::kPeerLeft, "the peer has left");
+      return false;
+    }
+    left_out_ -= static_cast<std::uint64_t>(count);
+    taken += static_cast<std::size_t>(count);
+  }
+  return true;
+}
+
+std::size_t BusLink::messageBytes() const { return std::min(message_size_, limits_.message_bytes); }
 
 /// sd-bus leaves out what it cannot parse and reads on, past what was judged. `available` bytes
 /// were there before it read, so it has read that many at least.

@@ -18,6 +18,7 @@
 #include "support/ipc/arguments.h"
 #include "support/ipc/linux/authentication.h"
 #include "support/ipc/linux/ipc_loop.h"
+#include "support/ipc/linux/wire_header.h"
 
 namespace spacekeep::ipc {
 
@@ -33,6 +34,23 @@ enum class LinkEnd {
   kRefused,   ///< this side cut it off: authentication, a limit, a broken message
 };
 
+/// Who speaks over the connection.
+enum class Traffic {
+  kOfOnePeer,  ///< what is wrong with its messages costs it the connection
+  /// The broker at the other end passes on what anybody sends. A message that cannot be taken is left
+  /// out, and descriptors are taken from the broker's own answers only.
+  kOfABus,
+};
+
+/// A message of a bus that was left out.
+struct LeftOut {
+  std::optional<WireHeader> header;  ///< none when it makes no sense or is too long
+  std::uint64_t bytes = 0;
+  bool brings_descriptors = false;
+};
+
+inline constexpr const char* kBrokerName = "org.freedesktop.DBus";
+
 class BusLink {
  public:
   class Owner {
@@ -45,11 +63,14 @@ class BusLink {
     virtual bool linkMayRead() { return true; }
     /// The message is good during the call only.
     virtual void linkMessage(sd_bus_message* message) = 0;
+    /// Over a bus only.
+    virtual void linkLeftOut(const LeftOut&) {}
     /// Nothing follows. Never called after close(). The owner may not destroy the link within.
     virtual void linkEnded(LinkEnd end, const std::string& why) = 0;
   };
 
-  BusLink(IpcLoop& loop, Owner& owner, Authentication::Role role, const LinkLimits& limits);
+  BusLink(IpcLoop& loop, Owner& owner, Authentication::Role role, const LinkLimits& limits,
+          Traffic traffic = Traffic::kOfOnePeer);
   ~BusLink();
   BusLink(const BusLink&) = delete;
   BusLink& operator=(const BusLink&) = delete;
@@ -61,7 +82,9 @@ class BusLink {
   [[nodiscard]] bool ready() const { return bus_ != nullptr; }
   [[nodiscard]] bool ended() const { return ended_; }
   /// Within linkMessage: the size of the message, or the most that it can be.
-  [[nodiscard]] std::size_t messageBytes() const { return message_size_; }
+  [[nodiscard]] std::size_t messageBytes() const;
+  /// Sent, and not taken by the other end yet.
+  [[nodiscard]] std::size_t queuedMessages() const { return queued_sizes_.size(); }
   /// For making messages. Null until ready.
   [[nodiscard]] sd_bus* bus() const { return bus_; }
 
@@ -83,13 +106,17 @@ class BusLink {
   bool open();
   void process();
   bool processOnce();
-  enum class Ahead { kNothing, kIncomplete, kMessage, kDescriptors, kRefused };
+  enum class Ahead { kNothing, kIncomplete, kMessage, kDescriptors, kLeftOut, kRefused };
   Ahead lookAhead();
-  bool judgeHeader(const unsigned char* header);
+  bool judgeHeader(const WireFixedHeader& header);
   Ahead judgeDescriptors();
+  Ahead judgeBusMessage(const WireFixedHeader& fixed, bool brings_descriptors);
+  std::string peek(std::size_t size) const;
+  bool leaveOut();
   bool readWithDescriptors();
   bool messageWasDropped(std::size_t available);
   void updateEvents();
+  [[nodiscard]] bool bringsCalls() const;
   [[nodiscard]] int quietPriority() const;
   void setPriority(bool waits_behind_others);
   void forgetWritten();
@@ -100,6 +127,7 @@ class BusLink {
   Owner& owner_;
   const Authentication::Role role_;
   const LinkLimits limits_;
+  const Traffic traffic_;
   SharedDescriptor socket_;  // until the bus owns it
   std::unique_ptr<Authentication> authentication_;
   sd_event_source* io_ = nullptr;
@@ -116,6 +144,7 @@ class BusLink {
   bool in_message_ = false;       // its header was judged, it has not arrived as a whole
   std::size_t message_size_ = 0;  // of that message
   std::size_t message_read_ = 0;  // of it, what sd-bus has read at least
+  std::uint64_t left_out_ = 0;    // bytes that are still to be left out
   std::deque<std::size_t> queued_sizes_;
   std::size_t queued_bytes_ = 0;
 };

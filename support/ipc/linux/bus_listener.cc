@@ -33,6 +33,7 @@ void BusListener::resume() {
   };
   server_ = std::make_unique<BusServer>(loop_, global_, interface_, std::move(options));
   server_->serveListening(listening_);
+  if (options_.bus) server_->serveOnBus(*options_.bus);
 }
 
 std::size_t BusListener::connections() const {

@@ -11,6 +11,7 @@
 
 #include "support/access/linux/capture_peer_identity.h"
 #include "support/ipc/linux/acceptor.h"
+#include "support/ipc/linux/bus_front.h"
 #include "support/ipc/linux/served_connection.h"
 #include "support/ipc/linux/server_context.h"
 #include "support/logging/log.h"
@@ -38,13 +39,13 @@ struct BusServer::State : public std::enable_shared_from_this<BusServer::State> 
   void serve(const SharedDescriptor& connected, std::function<void()> on_end);
   bool mustWait(const SharedDescriptor& connected, std::function<void()>& on_end);
   std::string refusal(const AcceptedPeer& peer) const;
-  std::string admissionRefusal(AcceptedPeer& peer) const;
   void ended(std::uint64_t id, std::uint32_t uid, std::function<void()> on_end);
   void close();
 
   const std::shared_ptr<ServerContext> context;
   std::atomic<std::size_t> open{0};
   std::vector<std::unique_ptr<Acceptor>> acceptors;
+  std::unique_ptr<BusFront> front;
   std::map<std::uint64_t, std::shared_ptr<ServedConnection>> connections;
   std::map<std::uint32_t, std::size_t> open_by_uid;
   std::uint64_t last_id = 0;
@@ -82,7 +83,7 @@ void BusServer::State::serve(const SharedDescriptor& connected, std::function<vo
   const auto peer = std::make_shared<AcceptedPeer>(std::move(identity));
   context->pace.spendOnConnection(peer->identity().uid());
   std::string why = refusal(*peer);
-  if (why.empty()) why = admissionRefusal(*peer);
+  if (why.empty()) why = context->admissionRefusal(*peer);
   if (!why.empty()) {
     context->refusals.write(peer->identity().describe(), why);
     if (on_end) context->global.async(std::move(on_end));
@@ -112,13 +113,6 @@ std::string BusServer::State::refusal(const AcceptedPeer& peer) const {
   return "";
 }
 
-/// Only the answer of `admit` decides; what it wrote counts when it said no.
-std::string BusServer::State::admissionRefusal(AcceptedPeer& peer) const {
-  std::string why;
-  if (!context->options.admit || context->options.admit(peer, why)) return "";
-  return why.empty() ? "it is not admitted" : why;
-}
-
 /// Its place is free at once; the object itself goes later, since it may be on the stack.
 void BusServer::State::ended(std::uint64_t id, std::uint32_t uid, std::function<void()> on_end) {
   open.fetch_sub(1);
@@ -130,6 +124,7 @@ void BusServer::State::ended(std::uint64_t id, std::uint32_t uid, std::function<
 void BusServer::State::close() {
   closed = true;
   acceptors.clear();
+  front.reset();
   for (const auto& [id, connection] : connections) connection->close();
   connections.clear();
   context->turns.clear();
@@ -171,6 +166,14 @@ void BusServer::serveListening(SharedDescriptor listening) {
 void BusServer::serveConnected(SharedDescriptor connected, std::function<void()> on_end) {
   state_->context->loop.post([state = state_, connected = std::move(connected),
                               on_end = std::move(on_end)] { state->serve(connected, on_end); });
+}
+
+void BusServer::serveOnBus(BusOptions options) {
+  state_->context->loop.post([state = state_, options = std::move(options)] {
+    if (state->closed || state->front != nullptr) return;
+    state->front = std::make_unique<BusFront>(state->context, options);
+    state->front->start();
+  });
 }
 
 std::size_t BusServer::connections() const { return state_->open; }

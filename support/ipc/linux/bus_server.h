@@ -1,17 +1,20 @@
 // Thread safety: every member may be called from any thread but the IPC thread. Handlers run on the
 // global concurrent queue.
 //
-// Serves one interface over D-Bus, peer to peer: on every connection of a listening unix socket, or
-// on connected sockets handed to it. The daemon's listener and the services' library stand on it.
+// Serves one interface over D-Bus: peer to peer on every connection of a listening unix socket or on
+// connected sockets handed to it, and on a message bus. The daemon's listener and the services'
+// library stand on it.
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "support/ipc/arguments.h"
+#include "support/ipc/linux/bus_options.h"
 #include "support/ipc/linux/ipc_loop.h"
 #include "support/ipc/linux/user_turns.h"
 #include "support/ipc/served.h"
@@ -43,6 +46,8 @@ struct ServerOptions {
   /// Descriptor arguments whose peer is this very process are refused, since the process would then
   /// wait for itself. Programs that are daemon and service at once (tests) turn it off.
   bool refuse_own_process = true;
+  /// Where a listener also serves, besides its socket.
+  std::optional<BusOptions> bus = {};
 };
 
 class BusServer {
@@ -60,6 +65,9 @@ class BusServer {
   /// Serves one connected AF_UNIX stream socket; the descriptor is duplicated. `on_end` runs once,
   /// on the global queue, when the connection has ended (it may run before this returns).
   void serveConnected(SharedDescriptor connected, std::function<void()> on_end = {});
+
+  /// Serves on a message bus as well, whenever there is one. Once.
+  void serveOnBus(BusOptions options);
 
   [[nodiscard]] std::size_t connections() const;
 

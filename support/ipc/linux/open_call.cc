@@ -4,9 +4,9 @@
 
 namespace spacekeep::ipc {
 
-OpenCall::OpenCall(std::shared_ptr<ServerContext> context,
-                   std::weak_ptr<ServedConnection> connection, const MethodDescription& method,
-                   std::uint64_t serial, bool wants_answer, std::optional<uid_t> turn_of)
+OpenCall::OpenCall(std::shared_ptr<ServerContext> context, std::weak_ptr<CallServer> connection,
+                   const MethodDescription& method, std::uint64_t serial, bool wants_answer,
+                   std::optional<uid_t> turn_of)
     : context_(std::move(context)),
       connection_(std::move(connection)),
       method_(method),
@@ -15,7 +15,7 @@ OpenCall::OpenCall(std::shared_ptr<ServerContext> context,
       turn_of_(turn_of) {}
 
 OpenCall::~OpenCall() {
-  finish([](ServedConnection&) {});
+  finish([](CallServer&) {});
 }
 
 Responder OpenCall::responderFor(const std::shared_ptr<OpenCall>& call) {
@@ -42,13 +42,13 @@ void OpenCall::finish(Act act) {
 
 void OpenCall::reply(Arguments arguments) {
   finish([serial = serial_, method = &method_, wanted = wants_answer_,
-          arguments = std::move(arguments)](ServedConnection& connection) {
+          arguments = std::move(arguments)](CallServer& connection) {
     if (wanted) connection.answer(serial, *method, arguments);
   });
 }
 
 void OpenCall::fail(const Error& error) {
-  finish([serial = serial_, wanted = wants_answer_, error](ServedConnection& connection) {
+  finish([serial = serial_, wanted = wants_answer_, error](CallServer& connection) {
     if (wanted) connection.fail(serial, error);
   });
 }

@@ -9,14 +9,14 @@
 #include <memory>
 #include <optional>
 
-#include "support/ipc/linux/served_connection.h"
+#include "support/ipc/linux/call_server.h"
 #include "support/ipc/linux/server_context.h"
 
 namespace spacekeep::ipc {
 
 class OpenCall {
  public:
-  OpenCall(std::shared_ptr<ServerContext> context, std::weak_ptr<ServedConnection> connection,
+  OpenCall(std::shared_ptr<ServerContext> context, std::weak_ptr<CallServer> connection,
            const MethodDescription& method, std::uint64_t serial, bool wants_answer,
            std::optional<uid_t> turn_of);
   ~OpenCall();
@@ -33,7 +33,7 @@ class OpenCall {
   void finish(Act act);
 
   const std::shared_ptr<ServerContext> context_;
-  const std::weak_ptr<ServedConnection> connection_;
+  const std::weak_ptr<CallServer> connection_;
   const MethodDescription& method_;
   const std::uint64_t serial_;
   const bool wants_answer_;

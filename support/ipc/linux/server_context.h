@@ -33,6 +33,14 @@ struct ServerContext {
     endpoint_rules.refuse_own_process = options.refuse_own_process;
   }
 
+  /// Why the peer is not served, empty when it is. Only the answer of `admit` decides; what it wrote
+  /// counts when it said no.
+  [[nodiscard]] std::string admissionRefusal(PeerConnection& peer) const {
+    std::string why;
+    if (!options.admit || options.admit(peer, why)) return "";
+    return why.empty() ? "it is not admitted" : why;
+  }
+
   IpcLoop& loop;
   ConcurrentQueue& global;
   const ServedInterface interface;

@@ -120,6 +120,59 @@ TEST(EntitlementRules, AnybodyMatchesOnlyWithoutOtherConditions) {
   EXPECT_FALSE(matches(rule, peer()));
 }
 
+PeerIdentity peerOfWhomOnlyTheUserIsClear() {
+  return PeerIdentity(
+      {.uid = 1000, .gid = kNoGroup, .unclear = {.groups = true, .label = true, .unit = true}});
+}
+
+Rule denialBy(void (*condition)(Rule&)) {
+  Rule denial;
+  denial.name = "deny";
+  condition(denial);
+  denial.denies = {"PURGE_ENTITLEMENT"};
+  return denial;
+}
+
+TEST(EntitlementRules, WhatIsUnclearIsDeniedByARuleThatMayFit) {
+  for (const auto condition : {+[](Rule& rule) { rule.groups = {300}; },
+                               +[](Rule& rule) { rule.units = {"cache.service"}; },
+                               +[](Rule& rule) { rule.labels = {"cache_t"}; }}) {
+    const std::vector<Rule> rules{grantTo({1000}), denialBy(condition)};
+    EXPECT_EQ(judge(rules, peerOfWhomOnlyTheUserIsClear(), "PURGE_ENTITLEMENT").decision,
+              Decision::kDenied);
+  }
+}
+
+TEST(EntitlementRules, WhatIsUnclearIsNotDeniedByARuleForAnotherUser) {
+  const std::vector<Rule> rules{grantTo({1000}), denialBy([](Rule& rule) {
+                                  rule.users = {1001};
+                                  rule.units = {"cache.service"};
+                                })};
+  EXPECT_TRUE(judge(rules, peerOfWhomOnlyTheUserIsClear(), "PURGE_ENTITLEMENT").granted());
+}
+
+TEST(EntitlementRules, WhatIsUnclearGrantsNothing) {
+  for (const auto condition : {+[](Rule& rule) { rule.groups = {300}; },
+                               +[](Rule& rule) { rule.units = {"cache.service"}; },
+                               +[](Rule& rule) { rule.labels = {"cache_t"}; }}) {
+    Rule grant = grantTo({1000});
+    condition(grant);
+    EXPECT_EQ(judge(std::vector<Rule>{grant}, peerOfWhomOnlyTheUserIsClear(), "PURGE_ENTITLEMENT")
+                  .decision,
+              Decision::kSilent);
+  }
+}
+
+TEST(EntitlementRules, AConditionWithoutAlternativesFitsNotEvenWhatIsUnclear) {
+  const std::vector<Rule> rules{
+      grantTo({1000}), denialBy([](Rule& rule) { rule.units = std::vector<std::string>{}; })};
+  EXPECT_TRUE(judge(rules, peerOfWhomOnlyTheUserIsClear(), "PURGE_ENTITLEMENT").granted());
+}
+
+TEST(PeerIdentity, WithoutAPrimaryGroupItSaysSo) {
+  EXPECT_EQ(peerOfWhomOnlyTheUserIsClear().describe(), "uid 1000 gid unknown pid 0");
+}
+
 TEST(PeerIdentity, AUnitWithoutAPidfdIsDropped) {
   const PeerIdentity identity({.uid = 1,
                                .gid = 1,

@@ -15,7 +15,7 @@ TEST(Interfaces, TheInstalledDocumentsAreWhatTheDaemonDeclares) {
     EXPECT_EQ(contentOf(file), ipc::introspectionXml(*interface)) << file;
     expected.insert(file);
   }
-  const auto found = filesBelow(kSource / "packaging/dbus");
+  const auto found = filesBelow(kSource / "packaging/dbus", ".xml");
   EXPECT_EQ(std::set<fs::path>(found.begin(), found.end()), expected);
 }
 

@@ -19,6 +19,17 @@ TEST(Interfaces, TheInstalledDocumentsAreWhatTheDaemonDeclares) {
   EXPECT_EQ(std::set<fs::path>(found.begin(), found.end()), expected);
 }
 
+/// Services are called by the daemon, and never over the bus.
+TEST(Interfaces, TheBusLetsEveryInterfaceOfTheDaemonThroughAndNoOtherOfThisSystem) {
+  const std::string policy = contentOf(kSource / "packaging/dbus/com.quorvel.Spacekeep.conf");
+  for (const fs::path& document : filesBelow(kSource / "packaging/dbus", ".xml")) {
+    const std::string interface = document.stem().string();
+    const bool is_served = interface != std::string(spacekeepServiceInterface().name);
+    EXPECT_EQ(policy.find("send_interface=\"" + interface + "\"") != std::string::npos, is_served)
+        << interface;
+  }
+}
+
 TEST(Interfaces, TheManualTellsOfEveryMethod) {
   const std::string page = contentOf(kSource / "packaging/man/spacekeep-protocol.7");
   for (const auto* interface : {&spacekeepClientInterface(), &spacekeepServiceInterface()}) {

@@ -32,6 +32,8 @@ const kMoment = new Intl.DateTimeFormat(undefined, {dateStyle: 'medium', timeSty
 const kDay = new Intl.DateTimeFormat(undefined, {day: 'numeric', month: 'short', year: '2-digit'});
 const kDayAndHour = new Intl.DateTimeFormat(
   undefined, {day: 'numeric', month: 'short', hour: '2-digit', minute: '2-digit'});
+const kSecond = new Intl.DateTimeFormat(
+  undefined, {hour: '2-digit', minute: '2-digit', second: '2-digit'});
 const kHour = new Intl.DateTimeFormat(undefined, {hour: '2-digit', minute: '2-digit'});
 
 function momentText(seconds) {

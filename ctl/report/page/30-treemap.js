@@ -101,6 +101,7 @@ function drawMap(map, data, urgency) {
                    .filter((group) => group.tiles.length > 0)
                    .map((group) => ({...group, bytes: sum(group.tiles.map((tile) => tile.bytes))}))
                    .sort((one, other) => other.bytes - one.bytes);
+  map.classList.toggle('empty', groups.length === 0);
   if (groups.length === 0) {
     map.replaceChildren(element('p', {}, `At urgency ${urgency} nothing could be freed.`));
     return;
@@ -137,6 +138,7 @@ function offersTable(data) {
                         element('td', {}, nameOf(name)), ...cells));
     }
   }
+  if (rows.length === 0) return '';
   const heads = urgencies.map((urgency) => element('th', {scope: 'col', class: 'number'}, `urgency ${urgency}`));
   const head = element('tr', {}, element('th', {scope: 'col'}, 'Volume'),
                        element('th', {scope: 'col'}, 'Service'), ...heads);

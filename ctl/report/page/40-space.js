@@ -85,7 +85,7 @@ function frameOf(scale) {
                      sizeText(top * share)));
   }
   const marks = Math.max(2, Math.min(7, Math.floor((box.right - box.left) / 125)));
-  const format = scale.span > 7 * 24 * 3600 ? kDay : scale.span > 24 * 3600 ? kDayAndHour : kHour;
+  const format = scale.span > 7 * 24 * 3600 ? kDay : scale.span > 24 * 3600 ? kDayAndHour : scale.span > 1200 ? kHour : kSecond;
   for (let mark = 0; mark < marks; mark += 1) {
     const at = scale.first + (scale.span * mark) / (marks - 1);
     const anchor = mark === 0 ? 'start' : mark === marks - 1 ? 'end' : 'middle';
@@ -139,10 +139,6 @@ function chartOf(volume, data) {
   const points = pointsOf(volume, data);
   const now = data.volumes.find((one) => one.volume === volume);
   const figure = element('figure', {class: 'chart'}, element('h3', {}, nameOf(volume)));
-  if (points.length < 2) {
-    figure.append(element('p', {class: 'muted'}, 'Nothing was measured here but the present.'));
-    return figure;
-  }
   const svg = drawn('svg', {
     role: 'img', tabindex: 0,
     'aria-label': `Free space on ${shown(volume)} from ${momentText(points[0].at)} to ` +
@@ -178,8 +174,16 @@ function chartOf(volume, data) {
 function showSpace(data) {
   const mounted = data.volumes.map((volume) => volume.volume);
   const past = data.entries.map((entry) => entry.volume).filter((volume) => volume !== undefined);
-  const figures = [...new Set([...mounted, ...past])].map((volume) => chartOf(volume, data));
+  const volumes = [...new Set([...mounted, ...past])];
+  const hasPast = (volume) => pointsOf(volume, data).length > 1;
+  const figures = volumes.filter(hasPast).map((volume) => chartOf(volume, data));
+  const others = volumes.filter((volume) => !hasPast(volume));
   place('space').append(...figures);
-  if (figures.length === 0) place('space').append(element('p', {}, 'There is nothing to draw yet.'));
-  for (const figure of figures.filter((one) => one.draw !== undefined)) figure.draw();
+  if (others.length > 0) {
+    place('space').append(element(
+      'p', {class: 'muted'}, 'Nothing but the present was measured on ',
+      ...others.flatMap((volume, index) => (index === 0 ? [nameOf(volume)] : [', ', nameOf(volume)])), '.'));
+  }
+  if (volumes.length === 0) place('space').append(element('p', {}, 'There is nothing to draw yet.'));
+  for (const figure of figures) figure.draw();
 }

@@ -20,7 +20,7 @@ constexpr std::uint32_t kDirectoryGoes = IN_DELETE_SELF | IN_MOVE_SELF;
 /// watch is too high and does not see more: so it is looked once more from the top.
 bool SocketWatch::start(std::function<void()> on_change) {
   stop();
-  on_change_ = std::move(on_change);
+  on_change_ = std::make_shared<const std::function<void()>>(std::move(on_change));
   namespace fs = std::filesystem;
   constexpr int kTries = 16;
   for (int i = 0; i < kTries; ++i) {
@@ -63,7 +63,9 @@ int SocketWatch::onEvent(sd_event_source*, const inotify_event* event, void* sel
 /// Posted, since it may replace the source that is being dispatched.
 void SocketWatch::changed() {
   source_ = sd_event_source_disable_unref(source_);
-  if (auto on_change = std::exchange(on_change_, nullptr)) loop_.post(std::move(on_change));
+  loop_.post([weak = std::weak_ptr(on_change_)] {
+    if (const auto on_change = weak.lock()) (*on_change)();
+  });
 }
 
 }  // namespace spacekeep::ipc

@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <string>
 
 #include "support/ipc/linux/ipc_loop.h"
@@ -22,8 +23,9 @@ class SocketWatch {
   SocketWatch& operator=(const SocketWatch&) = delete;
 
   /// Runs `on_change` once, when something on the way to the path has appeared: the path itself, a
-  /// directory above it, or that could not be told any more. Not within this call; it may start
-  /// again. What was there before is not told. False when the kernel has no watch left.
+  /// directory above it, or that could not be told any more. Not within this call, and not after
+  /// stop(); it may start again. What was there before is not told. False when the kernel has no
+  /// watch left.
   bool start(std::function<void()> on_change);
   void stop();
 
@@ -35,7 +37,7 @@ class SocketWatch {
   IpcLoop& loop_;
   const std::string path_;
   std::string awaited_;  // the name that is to appear in the directory that is watched
-  std::function<void()> on_change_;
+  std::shared_ptr<const std::function<void()>> on_change_;
   sd_event_source* source_ = nullptr;
 };
 

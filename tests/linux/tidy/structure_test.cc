@@ -60,6 +60,24 @@ TEST(Tidy, EveryHeaderIsIncludedSomewhere) {
   EXPECT_EQ(headersThatNothingIncludes(codeOf(allRooms()), codeOf(allRooms())), "");
 }
 
+/// ./dev names its commands in its usage, and carries them out in its last lines.
+TEST(Tidy, EveryCommandThatDevOffersIsCarriedOut) {
+  std::ifstream stream(SPACEKEEP_SOURCE_DIR "/dev");
+  const std::string text{std::istreambuf_iterator<char>(stream), {}};
+  const std::size_t begin = text.find("Usage: ./dev");
+  ASSERT_NE(begin, text.npos);
+  const std::string usage = text.substr(begin, text.find("\nTEXT\n") - begin);
+  const std::string dispatch = text.substr(text.rfind("\ncase "));
+  const std::regex command("\n  ([a-z]+) ");
+  std::size_t commands = 0;
+  for (std::sregex_iterator at(usage.begin(), usage.end(), command), end; at != end; ++at) {
+    ++commands;
+    const std::regex branch("\n  " + (*at)[1].str() + "( \\||\\))");
+    EXPECT_TRUE(std::regex_search(dispatch, branch)) << (*at)[1];
+  }
+  EXPECT_GT(commands, 10U);
+}
+
 TEST(Tidy, EverySourceIsBuilt) {
   Files files = production();
   for (const SourceFile& file : codeOf({"tests"})) files.push_back(file);

@@ -1,6 +1,6 @@
 #!/usr/bin/env python3
 """The shipped rules and BleachBit on the same caches of a user: what each frees, how long it takes,
-and what it took that somebody still needed. As root, in a mount namespace of its own.
+and what it took that somebody still needed. As root, in name spaces of its own.
 """
 import argparse
 import os
@@ -11,9 +11,10 @@ import subprocess
 import sys
 import time
 
-import real_tools
+sys.dont_write_bytecode = True
 
-DAY = 86400
+from world import DAY, SOURCE, World, alone, run  # noqa: E402
+
 SIZE = 64 * 1024
 CLEANERS = ["system.cache", "thumbnails.cache", "firefox.cache", "chromium.cache", "google_chrome.cache"]
 HASH = "0123456789abcdef0123456789abcdef"
@@ -53,30 +54,32 @@ def make(home):
         then = time.time() - days * DAY
         os.utime(path, (then, then))
     (home / ".cache/marked-program/.spacekeep-keep").touch()
+    run(["chown", "-R", "keeper:keeper", home])
     os.sync()
 
 
 def at_work(world):
     """A program with a file open, and a browser that runs."""
-    browser = world.tools / "chromium"
+    browser = world.programs / "chromium"
     if not browser.exists():
         shutil.copy("/bin/sleep", browser)
     opened = world.home / ".cache/open-program/7"
-    return [subprocess.Popen(["sleep", "1000"], stdin=open(opened, "rb")), subprocess.Popen([browser, "1000"])]
+    return [subprocess.Popen(world.as_user(["sleep", "1000"]), stdin=open(opened, "rb")),
+            subprocess.Popen(world.as_user([browser, "1000"]))]
 
 
 def one(world, name, words, environment):
     shutil.rmtree(world.home)
-    world.home.mkdir()
+    world.folder_of_user(world.home)
     make(world.home)
     before = {str(p.relative_to(world.home)) for p in world.home.rglob("*") if p.is_file()}
-    free_before = world.free_bytes()
+    free_before = world.free_bytes(world.volume)
     running = at_work(world)
     begin = time.monotonic()
-    done = subprocess.run(words, env=environment, capture_output=True, text=True, cwd="/")
+    done = subprocess.run(world.as_user(words), env=environment, capture_output=True, text=True, cwd="/")
     elapsed = time.monotonic() - begin
     after = {str(p.relative_to(world.home)) for p in world.home.rglob("*") if p.is_file()}
-    gained = world.free_bytes() - free_before
+    gained = world.free_bytes(world.volume) - free_before
     for process in running:
         process.send_signal(signal.SIGKILL)
         process.wait()
@@ -93,12 +96,10 @@ def main():
     parser = argparse.ArgumentParser(description=__doc__.splitlines()[0])
     parser.add_argument("--build", type=pathlib.Path, required=True)
     arguments = parser.parse_args()
-    if os.environ.get("SPACEKEEP_PRIVATE_MOUNTS") != "1":
-        os.environ["SPACEKEEP_PRIVATE_MOUNTS"] = "1"
-        os.execvp("unshare", ["unshare", "--mount", "--propagation", "private", sys.executable, *sys.argv])
-    world = real_tools.World(arguments.build.resolve())
-    program = arguments.build.resolve() / "services/spacekeep-command"
-    rules = real_tools.SOURCE / "services/rules/user"
+    alone()
+    world = World(arguments.build.resolve())
+    program = world.programs / "spacekeep-command"
+    rules = SOURCE / "services/rules/user"
     wrong = 0
     print("| | freed | files | time | taken of what was needed |\n|---|---|---|---|---|")
     for urgency in "1234":
@@ -108,7 +109,7 @@ def main():
     bleachbit = shutil.which("bleachbit")
     if bleachbit:
         environment = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin", "HOME": str(world.home), "LC_ALL": "C.UTF-8",
-                       "USER": "root", "XDG_CACHE_HOME": str(world.home / ".cache")}
+                       "USER": "keeper", "XDG_CACHE_HOME": str(world.home / ".cache")}
         one(world, "BleachBit", [bleachbit, "--clean", *CLEANERS], environment)
     else:
         print("BleachBit is not installed (apt install bleachbit)", file=sys.stderr)

@@ -148,7 +148,7 @@ def user_caches(world):
 
     rule = Rule(world, "user/user-caches", cache)
     rule.row.tool = ", ".join((version_of(world, "borg", "--version"), " ".join(version_of(world, "restic", "version").split()[:2]),
-                               version_of(world, "black", "--version").split(" (")[0], "clang"))
+                               "black " + version_of(world, "black", "--version").split()[1], "clang"))
     refill = Refill(rule, fill, lambda _: True)
     refill()
     expect(all(folders()), f"filled {folders()}")

@@ -168,7 +168,7 @@ def crash_reports(world):
         (cache / "kexec_cmd").write_text("/sbin/kexec -p")
 
     row = play_files(world, "system/crash-reports",
-                     f"{world.versions['kdump-tools']}, its kdump-config (stand-in for the crashed kernel's memory)",
+                     f"{world.versions['kdump-tools']}, its kdump-config; the crashed kernel's memory is made up",
                      cache, fill, lambda path: path.startswith(f"{cache}/2"), (30, 14, 7, 3),
                      kept="{young} of the last 3 days, kdump-config's lock and command")
     row.real = False
@@ -218,6 +218,9 @@ def snap_downloads(world):
     os.makedirs("/var/lib/snapd/snaps")
     installed = f"/var/lib/snapd/cache/{0:096d}"
     cache = pathlib.Path("/var/lib/snapd/cache")
-    return play_files(world, "system/snap-downloads", world.versions["golang-github-snapcore-snapd-dev"] + ", its code of the download cache", cache, lambda: run([fill]),
-                      lambda path: path != installed, (30, 7, 1, 0),
-                      kept="the download of an installed revision (a second name of it)")
+    version = world.versions["golang-github-snapcore-snapd-dev"].split()[1]
+    row = play_files(world, "system/snap-downloads", f"snapd {version}, its code of the download cache alone", cache,
+                     lambda: run([fill]), lambda path: path != installed, (30, 7, 1, 0),
+                     kept="the download of an installed revision (a second name of it)")
+    row.real = False
+    return row

@@ -27,7 +27,7 @@ class Row:
     """One rule's line. A cell that stays empty is a failure."""
     rule: str
     tool: str = ""             # with its version; says so where it is a stand-in
-    real: bool = True          # whether the tool itself filled the cache
+    real: bool = True          # whether the whole tool filled the cache, with nothing made up
     taken: list = dataclasses.field(default_factory=list)  # (bytes, files) for each urgency
     kept: str = ""             # what was there and did not go at any urgency
     in_use: str = ""           # what was in use, was kept, and went afterwards

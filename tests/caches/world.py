@@ -8,6 +8,7 @@ import os
 import pathlib
 import shutil
 import subprocess
+import sys
 import tempfile
 import time
 
@@ -35,6 +36,19 @@ def run(words, check=True, **more):
     if check and done.returncode != 0:
         raise Failure(f"{' '.join(map(str, words))}: status {done.returncode}\n{done.stdout}{done.stderr}")
     return done
+
+
+def alone():
+    """In name spaces of its own, with somebody to bury the processes that lost their parents."""
+    if os.environ.get("SPACEKEEP_PRIVATE_MOUNTS") != "1":
+        os.environ["SPACEKEEP_PRIVATE_MOUNTS"] = "1"
+        os.execvp("unshare", ["unshare", "--mount", "--propagation", "private", "--pid", "--fork", "--kill-child",
+                              "--mount-proc", "--ipc", sys.executable, *sys.argv])
+    child = os.fork()
+    while child:
+        process, status = os.wait()
+        if process == child:
+            sys.exit(os.waitstatus_to_exitcode(status))
 
 
 def until(condition, what, seconds=60):

@@ -297,9 +297,8 @@ bool BusLink::judgeHeader(const WireFixedHeader& header) {
   return true;
 }
 
-/// The broker has checked each message, but sd-bus is stricter here and there (a field that announces
-/// no descriptors is fine with dbus-daemon 1.14). What sd-bus might drop is not shown to it, since it
-/// would read on behind it.
+/// The broker has checked each message, but by its own rules. sd-bus reads on behind what it drops, and
+/// so past what was judged: it is shown only what certainly makes sense to it.
 BusLink::Ahead BusLink::judgeBusMessage(const WireFixedHeader& fixed, bool brings_descriptors) {
   LeftOut message;
   message.bytes = fixed.messageBytes();

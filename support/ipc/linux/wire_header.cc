@@ -139,7 +139,8 @@ bool readField(HeaderReader& reader, std::uint8_t code, WireHeader& header) {
   if (type == 'u') {
     auto& number = code == kReplySerial ? header.reply_serial : header.descriptors;
     number = reader.number();
-    return number && *number != 0;
+    // No descriptors may be announced as well as not be mentioned.
+    return number && (*number != 0 || code == kDescriptors);
   }
   const auto length = type == 'g' ? std::optional<std::size_t>(reader.byte())
                                   : std::optional<std::size_t>(reader.number());

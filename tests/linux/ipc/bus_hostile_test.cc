@@ -107,7 +107,6 @@ std::string longPath() { return "/" + std::string(20'000, 'a'); }
 INSTANTIATE_TEST_SUITE_P(
     Messages, OddBusMessages,
     ::testing::Values(
-        // Fine with dbus-daemon, broken to sd-bus.
         OddMessage{"NoDescriptorsAnnounced", RawMessage().callOf("number").number(9, 0).bytes()},
         OddMessage{"TypeThatNobodyKnows", RawMessage().callOf("number").bytes(9)},
         OddMessage{"SignalToTheName", RawMessage().callOf("number").bytes(4)},
@@ -132,6 +131,15 @@ INSTANTIATE_TEST_SUITE_P(
         OddMessage{"ForgedSender",
                    RawMessage().callOf("number").text(7, 's', "org.freedesktop.DBus").bytes()}),
     [](const auto& tried) { return std::string(tried.param.name); });
+
+TEST_F(HostileBusCaller, ACallThatAnnouncesNoDescriptorsIsServedLikeAnyOther) {
+  RawBusPeer peer(bus);
+  const std::string call =
+      RawMessage().callOf("number").text(8, 'g', "i").number(9, 0).bytes(1, 7, "M\0\0\0"sv);
+  ASSERT_TRUE(peer.send(call));
+  ASSERT_TRUE(peer.brokerHasReadAll());
+  EXPECT_TRUE(eventually([&] { return std::ranges::count(server->numbers(), 'M') == 1; }));
+}
 
 TEST_F(HostileBusCaller, WhoVanishesWhileACallIsAtWorkHarmsNobody) {
   {

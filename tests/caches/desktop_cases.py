@@ -33,10 +33,11 @@ def write_picture(path, colour):
                      chunk(b"IDAT", zlib.compress(row * 400)) + chunk(b"IEND", b""))
 
 
+# The type of the last number is said: asking the service for it takes a while on a busy machine.
 QUEUE = """
-gdbus call --session --dest org.freedesktop.thumbnails.Thumbnailer1 --object-path \
+gdbus call --timeout 120 --session --dest org.freedesktop.thumbnails.Thumbnailer1 --object-path \
   /org/freedesktop/thumbnails/Thumbnailer1 --method org.freedesktop.thumbnails.Thumbnailer1.Queue \
-  "$1" "$2" normal default 0 >/dev/null
+  "$1" "$2" normal default 'uint32 0' >/dev/null
 for i in $(seq 600); do
   [ "$(find ~/.cache/thumbnails -name '*.png' | wc -l)" -ge "$3" ] && exit 0
   sleep 0.1

@@ -88,7 +88,9 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
         waiting->group.leave();
       });
   waiting->group.wait();
-  return waiting->slot.get();
+  auto answer = waiting->slot.get();
+  if (operation && answer) rememberPurge(*operation, *answer);
+  return answer;
 }
 
 void Spacekeep::cancelPurgeWithToken(const Value* token) {
@@ -109,8 +111,10 @@ std::uint64_t Spacekeep::requestsInFlight(const Array& collection) const {
 void Spacekeep::performPeriodicsWithInfo(const Value& info) {
   const auto operation = makeOperation<SpacekeepPeriodicOperation>(platform_, info, copyServices());
   if (!operation) return;
-  operation->startOperation([](const Dictionary& outcome) {
+  const OperationCompletion remember = rememberingDailyPass(operation);
+  operation->startOperation([&remember](const Dictionary& outcome) {
     logTrace("%s result: %@", "performPeriodicsWithInfo", outcome);
+    remember(outcome);
   });
 }
 

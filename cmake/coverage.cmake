@@ -9,7 +9,7 @@ set(SPACEKEEP_COVERAGE "" CACHE PATH "Where programs keep their counts of execut
 if(SPACEKEEP_COVERAGE)
   set(list ${CMAKE_BINARY_DIR}/counted_sources.list)
   set(text "[clang]\ndefault:skip\n")
-  foreach(folder IN ITEMS daemon support registry client operations purge purgeable)
+  foreach(folder IN ITEMS daemon support registry client operations purge purgeable history)
     string(APPEND text "source:${CMAKE_SOURCE_DIR}/${folder}/*=allow\n")
   endforeach()
   file(CONFIGURE OUTPUT ${list} CONTENT "${text}" @ONLY)

@@ -31,6 +31,7 @@ struct Options {
   StateOptions state;
   VolumesOptions volumes;
   OneVolumeOptions one_volume;
+  HistoryOptions history;
   DoctorOptions doctor;
   ReportOptions report;
   std::string since_text;
@@ -235,6 +236,25 @@ void addReport(CLI::App& app, const SharedOptions& options, Command& chosen) {
       ->check(sinceInto(options->report.since_ns));
 }
 
+void addHistory(CLI::App& app, const SharedOptions& options, Command& chosen) {
+  auto& history = addCommand(
+      app, "history",
+      "Show what the daemon has done\n"
+      "Who asked for space, how much was asked for and freed, who gave it, and why it fell short. "
+      "Newest first.",
+      options, chosen, [](const Options& o) { return runHistory(o.common, o.history); });
+  HistoryOptions& wanted = options->history;
+  history.add_option("--volume", wanted.volume, "Only this volume")->option_text("PATH");
+  history
+      .add_option("--since", options->since_text,
+                  "Leave out what is older: 12h, 7d, 4w, 2026-11-01, \"2026-11-01 14:30\"")
+      ->option_text("WHEN")
+      ->check(sinceInto(wanted.since_ns));
+  history.add_option("--limit", wanted.limit, "Most entries, 1 to 10000 (default 20)")
+      ->option_text("NUMBER")
+      ->check(CLI::Range(1, 10'000));
+}
+
 void addDoctor(CLI::App& app, const SharedOptions& options, Command& chosen) {
   auto& doctor = addCommand(
       app, "doctor",
@@ -319,8 +339,8 @@ int commandMissing(const CLI::App& app) {
   const bool in_state = app.got_subcommand("state");
   std::fprintf(stderr, "A command is required: %s\nRun with --help for more information.\n",
                in_state ? "state get, state set, state unset or state list"
-                        : "status, explain, report, doctor, purge, query, state, volumes, cancel "
-                          "or check-service");
+                        : "status, explain, history, report, doctor, purge, query, state, volumes, "
+                          "cancel or check-service");
   return static_cast<int>(ExitCode::kUsage);
 }
 
@@ -335,6 +355,7 @@ std::variant<Command, int> parseCommandLine(int argc, const char* const* argv,
   addCommonOptions(app, options->common, version);
   addStatus(app, options, chosen);
   addExplain(app, options, chosen);
+  addHistory(app, options, chosen);
   addReport(app, options, chosen);
   addDoctor(app, options, chosen);
   addPurge(app, options, chosen);

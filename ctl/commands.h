@@ -4,12 +4,14 @@
 // remarks and complaints to standard error.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string>
 
 #include "ctl/complaint.h"
 #include "ctl/state_value.h"
+#include "support/values/value.h"
 
 namespace spacekeep::ctl {
 
@@ -51,6 +53,12 @@ struct ReportOptions {
   std::optional<std::int64_t> since_ns;  ///< wall clock; none: as far back as is known
 };
 
+struct HistoryOptions {
+  std::string volume;                    ///< empty: all
+  std::optional<std::int64_t> since_ns;  ///< as above
+  std::size_t limit = 20;
+};
+
 struct DoctorOptions {
   std::string root;  ///< of the system to look at; empty: this one
 };
@@ -65,6 +73,7 @@ struct DoctorOptions {
 [[nodiscard]] ExitCode runVolumes(const CommonOptions& common, const VolumesOptions& options);
 [[nodiscard]] ExitCode runStatus(const CommonOptions& common, const OneVolumeOptions& options);
 [[nodiscard]] ExitCode runExplain(const CommonOptions& common, const OneVolumeOptions& options);
+[[nodiscard]] ExitCode runHistory(const CommonOptions& common, const HistoryOptions& options);
 [[nodiscard]] ExitCode runReport(const CommonOptions& common, const ReportOptions& options);
 [[nodiscard]] ExitCode runDoctor(const CommonOptions& common, const DoctorOptions& options);
 

@@ -7,6 +7,7 @@
 #include "client/entitlements.h"
 #include "daemon/descriptors.h"
 #include "daemon/names.h"
+#include "history/history.h"
 #include "operations/info_keys.h"
 #include "support/logging/log.h"
 
@@ -30,6 +31,7 @@ void Spacekeep::init() {
   default_values_ = Dictionary{{keys::kCacheEnabled, true}};
   user_defaults_ = platform_.openPreferencesSuite(kSuiteName);
   if (!user_defaults_) logProblem("%s Unable to initialize user defaults!", "init");
+  history_ = History::create(platform_);
   createQueues();
   applyStoredSettings();
   scanDescriptors(directories);
@@ -69,7 +71,9 @@ void Spacekeep::scanDescriptors(const std::vector<std::string>& directories) {
 }
 
 void Spacekeep::startListener() {
-  listener_ = platform_.makeListener(makeClientAdaptor(weak_from_this()));
+  ipc::ServedInterface served = makeClientAdaptor(weak_from_this());
+  serveHistory(served, weak_from_this());
+  listener_ = platform_.makeListener(std::move(served));
   listener_->setRequiredEntitlement(std::string(entitlements::kClient));
   logTrace("%s resuming listener", "init");
   listener_->resume();

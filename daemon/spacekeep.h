@@ -21,6 +21,7 @@
 #include <vector>
 
 #include "client/client_protocol.h"
+#include "client/history_protocol.h"
 #include "client/kept_record.h"
 #include "client/purge_operations.h"
 #include "registry/service.h"
@@ -30,6 +31,10 @@
 #include "support/queues/serial_queue.h"
 
 namespace spacekeep {
+
+class History;
+class SpacekeepPeriodicOperation;
+class SpacekeepPurgeOperation;
 
 /// Accepts client connections and serves the daemon object to them.
 using SpacekeepListener = ipc::Listener;
@@ -44,7 +49,9 @@ using StateObject = std::variant<std::monostate, Value, std::shared_ptr<Spacekee
 /// How late the daemon's own records reach the disk: many answers make one write.
 inline constexpr std::uint64_t kLateWriteDelayNs = 5'000'000'000;
 
-class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from_this<Spacekeep> {
+class Spacekeep : public SpacekeepClientProtocol,
+                  public SpacekeepHistoryProtocol,
+                  public std::enable_shared_from_this<Spacekeep> {
  private:
   struct Key {};
 
@@ -114,6 +121,7 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   void clientSetState(ipc::OptionalValue value, std::string key, EmptyReply reply,
                       StoreFailure failed) override;
   void clientGetState(std::string key, ValueReply reply) override;
+  void clientHistory(Dictionary info, HistoryReply reply, HistoryFailure failed) override;
 
   // Client state. Only on defaults_queue(); each has called its reply when it returns.
   /// On the disk before `reply`. A change that cannot be stored is taken back and told to `failed`,
@@ -158,6 +166,11 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   void deliverNotification(const ServiceMap& recipients, const std::string& name,
                            const ipc::OptionalValue& value) const;
   void cancelPurgeWithToken(const Value* token);
+  /// Puts a purge that has ended down for the history. On the thread that serves the request.
+  void rememberPurge(const SpacekeepPurgeOperation& operation, const Dictionary& outcome) const;
+  /// To be called, while the operation is there, with its outcome.
+  [[nodiscard]] OperationCompletion rememberingDailyPass(
+      const std::shared_ptr<SpacekeepPeriodicOperation>& operation) const;
   void answerQuery(const Value& info, std::string_view entitlement, const char* operation,
                    DictionaryReply reply);
 
@@ -190,6 +203,7 @@ class Spacekeep : public SpacekeepClientProtocol, public std::enable_shared_from
   std::shared_ptr<SerialQueue> periodic_queue_;
   std::shared_ptr<SerialQueue> notify_queue_;
   std::shared_ptr<SerialQueue> daemons_queue_;
+  std::shared_ptr<History> history_;  // null when none is kept; constant after init
   std::string root_path_;
   std::unique_ptr<PreferencesSuite> user_defaults_;  // confined to defaults_queue_
   KeptRecord kept_record_;                           // confined to defaults_queue_

@@ -82,7 +82,10 @@ void SpacekeepPurgeOperation::finish(const Run& run) {
   cancelIfShort(freed_bytes);
   fillOutcome(run, freed_bytes, elapsed_ns);
   Dictionary outcome;
-  collection_queue()->sync([&] { outcome = run.outcome->snapshot(); });
+  collection_queue()->sync([&] {
+    outcome = run.outcome->snapshot();
+    reported_at_end_ = reported_by_service_;
+  });
   logTrace("%s result %@", "startOperation", outcome);
   countShortfall(freed_bytes);
   if (run.completion) run.completion(outcome);

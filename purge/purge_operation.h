@@ -11,6 +11,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <map>
 #include <memory>
 #include <string>
 
@@ -58,6 +59,11 @@ class SpacekeepPurgeOperation : public SpacekeepOperation {
   /// How many services the missing amount is currently divided among.
   [[nodiscard]] std::uint64_t viable_purging_services() const { return viable_purging_services_; }
   void setViable_purging_services(std::uint64_t count) { viable_purging_services_ = count; }
+  /// What each service that answered said it purged, at all urgencies together, as it stood at the
+  /// end. Once startOperation has returned.
+  [[nodiscard]] const std::map<std::string, std::uint64_t>& reportedByService() const {
+    return reported_at_end_;
+  }
   /// Made afresh for each urgency, null before the first and at the end.
   [[nodiscard]] std::shared_ptr<CountingSemaphore> purge_semaphore() const {
     return purge_semaphore_.get();
@@ -121,7 +127,9 @@ class SpacekeepPurgeOperation : public SpacekeepOperation {
   rt::Guarded<std::shared_ptr<CountingSemaphore>> purge_semaphore_;
   /// Services that stand in flight although their share was 0 and nothing was sent to them.
   std::atomic<std::uint64_t> unasked_in_flight_ = 0;
-  std::atomic<bool> finish_early_ = false;  // constant once the purge has started
+  std::atomic<bool> finish_early_ = false;                    // constant once the purge has started
+  std::map<std::string, std::uint64_t> reported_by_service_;  // confined to collection_queue()
+  std::map<std::string, std::uint64_t> reported_at_end_;      // written by the starting thread
 };
 
 }  // namespace spacekeep

@@ -140,7 +140,11 @@ void SpacekeepPurgeOperation::bookReply(const ServiceRequest& request,
 void SpacekeepPurgeOperation::bookAmount(const ServiceRequest& request,
                                          std::uint64_t purged_bytes) {
   purge_amount_reported_ += purged_bytes;
-  collection_queue()->sync([&] { request.record->setReported(request.service->ID, purged_bytes); });
+  collection_queue()->sync([&] {
+    request.record->setReported(request.service->ID, purged_bytes);
+    // The record keeps the last answer of a service alone.
+    reported_by_service_[request.service->ID] += purged_bytes;
+  });
   logTrace("%s %@ service purged: %llu", "queueServiceRequest", request.service->ID, purged_bytes);
 }
 

@@ -65,6 +65,14 @@ Dictionary PurgeRequest::info() const {
   return info;
 }
 
+Dictionary HistoryRequest::info() const {
+  Dictionary info;
+  if (before) info.set("SPACEKEEP_BEFORE", *before);
+  if (limit) info.set("SPACEKEEP_LIMIT", *limit);
+  if (volume) info.set("SPACEKEEP_VOLUME", *volume);
+  return info;
+}
+
 class Client::Impl {
  public:
   explicit Impl(std::unique_ptr<ClientLink> opened) : link(std::move(opened)) {}
@@ -113,6 +121,17 @@ void Client::stateAsync(const std::string& key, StateHandler handler, Deadline d
                     [handler = std::move(handler)](ClientLink::End end) {
                       handler(stateReplyOf(std::move(end)));
                     });
+}
+
+void Client::historyAsync(const HistoryRequest& request, ReplyHandler handler, Deadline deadline) {
+  impl_->link->call(
+      "clientHistory", {request.info()}, deadline,
+      [handler = std::move(handler)](ClientLink::End end) { handler(replyOf(std::move(end))); });
+}
+
+Reply Client::history(const HistoryRequest& request, Deadline deadline) {
+  return waitFor<Reply>(
+      [&](ReplyHandler handler) { historyAsync(request, std::move(handler), deadline); });
 }
 
 Reply Client::call(Operation operation, const Dictionary& info, Deadline deadline) {

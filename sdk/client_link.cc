@@ -7,7 +7,7 @@
 #include <utility>
 #include <vector>
 
-#include "client/client_protocol.h"
+#include "client/history_protocol.h"
 #include "sdk/deadline_timer.h"
 #include "sdk/failure.h"
 #include "support/ipc/linux/connector.h"
@@ -135,7 +135,7 @@ Result<std::unique_ptr<ClientLink>> ClientLink::open(ClientOptions options) {
     return Error{ErrorKind::kUnreachable,
                  fmt::format("cannot connect to the daemon at {}: {}", path, why)};
   }
-  link->connection_->setRemoteInterface(spacekeepClientInterface());
+  link->connection_->setRemoteInterface(spacekeepClientInterfaces());
   link->connection_->setInvalidationHandler([shared = link->shared_] { shared->noteEnd(true); });
   link->connection_->setInterruptionHandler([shared = link->shared_] { shared->noteEnd(false); });
   link->connection_->resume();

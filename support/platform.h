@@ -12,6 +12,7 @@
 
 #include "support/access/access.h"
 #include "support/files/directory_reader.h"
+#include "support/history/history_store.h"
 #include "support/ipc/served.h"
 #include "support/preferences/preferences_suite.h"
 #include "support/queues/concurrent_queue.h"
@@ -38,6 +39,8 @@ struct Platform {
   std::function<void(std::uint64_t delay_ns, Task task)> after;
   /// A fresh token, unique within the process. It compares by value.
   std::function<Value()> createSpacekeepToken;
+  /// Where the daemon keeps what it has done. Empty: nowhere.
+  std::function<std::unique_ptr<HistoryStore>()> openHistory = nullptr;
 };
 
 }  // namespace spacekeep

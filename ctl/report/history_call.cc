@@ -2,10 +2,13 @@
 
 namespace spacekeep::ctl {
 
-AskHistory historyOver(sdk::Client& /*client*/) {
-  return [](const Dictionary& /*request*/) {
-    return sdk::Reply{.outcome = {},
-                      .error = sdk::Error{sdk::ErrorKind::kNotSupported, "no history is kept"}};
+AskHistory historyOver(sdk::Client& client) {
+  return [&client](const Dictionary& request) {
+    sdk::HistoryRequest wanted;
+    wanted.before = unsignedAt(request, "SPACEKEEP_BEFORE");
+    wanted.limit = unsignedAt(request, "SPACEKEEP_LIMIT");
+    if (const std::string* volume = stringAt(request, "SPACEKEEP_VOLUME")) wanted.volume = *volume;
+    return client.history(wanted);
   };
 }
 

@@ -14,6 +14,7 @@ _spacekeepctl_matches() {
 _spacekeepctl_options() {
   case $1 in
     status) printf '%s\n' --volume ;;
+    history) printf '%s\n' --volume --since --limit ;;
     report) printf '%s\n' --html --volume --since ;;
     doctor) printf '%s\n' --root ;;
     purge) printf '%s\n' --urgency --timeout --token --wait-all ;;
@@ -40,7 +41,7 @@ _spacekeepctl_option_value() {
     --volume)
       _spacekeepctl_matches "$2" < <("$tool" volumes --names 2>/dev/null)
       ;;
-    --timeout | --token | --patience | --item | --since) COMPREPLY=() ;;
+    --timeout | --token | --patience | --item | --since | --limit) COMPREPLY=() ;;
     *) return 1 ;;
   esac
 }
@@ -69,7 +70,7 @@ _spacekeepctl() {
         return
         ;;
       --socket | --urgency | --timeout | --token | --type | --volume | --endpoint | --data | \
-        --in-use | --item | --patience | --root | --html | --since)
+        --in-use | --item | --patience | --root | --html | --since | --limit)
         local option=${COMP_WORDS[i]}
         [[ ${COMP_WORDS[i + 1]} == = ]] && ((i++))
         ((i++))
@@ -86,7 +87,7 @@ _spacekeepctl() {
     return
   fi
   case "${#words[@]} $command" in
-    '0 ') _spacekeepctl_matches "$current" <<<$'status\nexplain\nreport\ndoctor\npurge\nquery\nstate\nvolumes\ncancel\ncheck-service' ;;
+    '0 ') _spacekeepctl_matches "$current" <<<$'status\nexplain\nhistory\nreport\ndoctor\npurge\nquery\nstate\nvolumes\ncancel\ncheck-service' ;;
     '1 explain' | '1 purge' | '1 query')
       _spacekeepctl_matches "$current" < <("$tool" "${socket[@]}" volumes --names 2>/dev/null)
       ;;

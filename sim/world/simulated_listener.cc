@@ -101,7 +101,8 @@ std::string SimulatedListener::refusal(const SimulatedPeer& peer, std::string_vi
   const ipc::MethodDescription* described = nullptr;
   {
     const std::scoped_lock lock(mutex_);
-    described = served_->description->method(member);
+    const auto* interface = served_->description->having(member);
+    if (interface != nullptr) described = interface->method(member);
   }
   if (described == nullptr) return "no description of " + std::string(member);
   if (!ipc::matches(described->in, arguments)) return "wrong arguments for " + std::string(member);

@@ -3,19 +3,15 @@
 #include <algorithm>
 #include <utility>
 
-#include "support/runtime/runtime.h"
-
 namespace spacekeep::sim {
 
 SimulatedPeer::SimulatedPeer(std::string name, std::set<std::string, std::less<>> entitlements)
-    : name_(std::move(name)), entitlements_(std::move(entitlements)) {}
+    : name_(std::move(name)),
+      entitlements_(std::move(entitlements)),
+      identity_(access::PeerFacts{.uid = 1000, .gid = 1000, .pid = 4711, .program = name_}) {}
 
 bool SimulatedPeer::holds(std::string_view entitlement) const {
   return entitlements_.contains(entitlement);
-}
-
-const access::PeerIdentity& SimulatedPeer::identity() const {
-  rt::panic("a simulated peer has no identity");
 }
 
 bool SimulatedAccess::connectionIsEntitled(ipc::PeerConnection* connection,

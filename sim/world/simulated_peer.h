@@ -1,6 +1,6 @@
 // Thread safety: SimulatedPeer is immutable; SimulatedAccess holds no state.
 //
-// A client process as the listener sees it: nothing but a name and the entitlements it holds.
+// A client process as the listener sees it: a name and the entitlements it holds.
 #pragma once
 
 #include <initializer_list>
@@ -9,6 +9,7 @@
 #include <string_view>
 
 #include "support/access/access.h"
+#include "support/access/peer_identity.h"
 #include "support/ipc/served.h"
 
 namespace spacekeep::sim {
@@ -22,12 +23,13 @@ class SimulatedPeer final : public ipc::PeerConnection {
     return entitlements_;
   }
   [[nodiscard]] bool holds(std::string_view entitlement) const;
-  /// There is no process behind a simulated peer, so asking for its identity is a panic.
-  [[nodiscard]] const access::PeerIdentity& identity() const override;
+  /// Of a made-up process: user 1000, process 4711, its program has the peer's name.
+  [[nodiscard]] const access::PeerIdentity& identity() const override { return identity_; }
 
  private:
   const std::string name_;
   const std::set<std::string, std::less<>> entitlements_;
+  const access::PeerIdentity identity_;
 };
 
 /// Grants exactly what a SimulatedPeer holds, and nothing to any other connection.

@@ -37,7 +37,7 @@ World::World(Options options)
       events_(*global_),
       keep_alive_(trace_),
       caller_(*global_, connector_, spacekeepServiceInterface()),
-      platform_(makePlatform()) {
+      platform_(makePlatform(options.keeps_history)) {
   if (const auto base = rt::timebase()) {
     gTimebaseConversion = static_cast<double>(base->numerator) / base->denominator;
   }
@@ -46,8 +46,8 @@ World::World(Options options)
 
 World::~World() { shutDown(); }
 
-Platform World::makePlatform() {
-  return Platform{
+Platform World::makePlatform(bool keeps_history) {
+  Platform platform{
       .global = *global_,
       .volumes = volumes_,
       .access = access_,
@@ -67,6 +67,8 @@ Platform World::makePlatform() {
             return Value("token-" + std::to_string(++tokens_));
           },
   };
+  if (keeps_history) platform.openHistory = [this] { return history_.open(); };
+  return platform;
 }
 
 std::unique_ptr<PreferencesSuite> World::openSuite(const std::string& name) {

@@ -21,6 +21,7 @@
 
 #include "sim/world/delay_line.h"
 #include "sim/world/in_memory_files.h"
+#include "sim/world/in_memory_history.h"
 #include "sim/world/in_memory_preferences.h"
 #include "sim/world/log_capture.h"
 #include "sim/world/recording_statistics.h"
@@ -40,6 +41,7 @@ class World {
   struct Options {
     std::size_t parallelism = 4;  ///< of the global queue
     TraceStart trace{};           ///< where the trace of an earlier world is taken up
+    bool keeps_history = false;
   };
 
   World();
@@ -60,6 +62,7 @@ class World {
   [[nodiscard]] RecordingStatistics& statistics() { return statistics_; }
   [[nodiscard]] InMemoryFiles& files() { return files_; }
   [[nodiscard]] InMemoryDisk& disk() { return disk_; }
+  [[nodiscard]] InMemoryHistory& history() { return history_; }
   [[nodiscard]] SimulatedConnector& connector() { return connector_; }
   [[nodiscard]] SimulatedListener& listener() { return listener_; }
   [[nodiscard]] SimulatedEventSources& events() { return events_; }
@@ -100,7 +103,7 @@ class World {
   void shutDown();
 
  private:
-  [[nodiscard]] Platform makePlatform();
+  [[nodiscard]] Platform makePlatform(bool keeps_history);
   [[nodiscard]] std::unique_ptr<PreferencesSuite> openSuite(const std::string& name);
 
   Trace trace_;
@@ -112,6 +115,7 @@ class World {
   RecordingStatistics statistics_;
   InMemoryFiles files_;
   InMemoryDisk disk_;
+  InMemoryHistory history_;
   SimulatedConnector connector_;
   SimulatedListener listener_;
   SimulatedEventSources events_;

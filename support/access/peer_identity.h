@@ -39,6 +39,9 @@ struct PeerFacts {
   /// `pidfd`, because a unit looked up by process number alone could be somebody else's.
   std::optional<std::string> unit = {};
   UnclearFacts unclear = {};
+  /// What the process calls itself ("backup"), for people to read. It may call itself anything, so
+  /// this is never for a decision either.
+  std::optional<std::string> program = {};
 };
 
 class PeerIdentity {
@@ -54,6 +57,7 @@ class PeerIdentity {
   [[nodiscard]] std::int32_t pid() const { return facts_.pid; }
   [[nodiscard]] const ipc::SharedDescriptor& pidfd() const { return facts_.pidfd; }
   [[nodiscard]] const std::optional<std::string>& unit() const { return facts_.unit; }
+  [[nodiscard]] const std::optional<std::string>& program() const { return facts_.program; }
 
   [[nodiscard]] const UnclearFacts& unclear() const { return facts_.unclear; }
 

@@ -46,6 +46,20 @@ const MethodDescription* InterfaceDescription::method(std::string_view method_na
   return found == methods.end() ? nullptr : &*found;
 }
 
+const InterfaceDescription* InterfaceDescription::having(std::string_view method_name) const {
+  const InterfaceDescription* interface = this;
+  while (interface != nullptr && interface->method(method_name) == nullptr) {
+    interface = interface->beside;
+  }
+  return interface;
+}
+
+const InterfaceDescription* InterfaceDescription::named(std::string_view interface_name) const {
+  const InterfaceDescription* interface = this;
+  while (interface != nullptr && interface->name != interface_name) interface = interface->beside;
+  return interface;
+}
+
 bool matches(const std::vector<ArgumentDescription>& described, const Arguments& arguments) {
   return std::equal(described.begin(), described.end(), arguments.begin(), arguments.end(),
                     [](const ArgumentDescription& wanted, const Argument& given) {

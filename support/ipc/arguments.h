@@ -66,12 +66,19 @@ struct MethodDescription {
 struct InterfaceDescription {
   std::string_view name;
   std::vector<MethodDescription> methods;
+  /// Another interface of the same object, and so on. Method names are different in all of them.
+  const InterfaceDescription* beside = nullptr;
 
-  /// Null when there is no such method.
+  /// Of this interface alone. Null when there is no such method.
   [[nodiscard]] const MethodDescription* method(std::string_view method_name) const;
+  /// The interface, this one or one beside it, that has this method. Null when none has.
+  [[nodiscard]] const InterfaceDescription* having(std::string_view method_name) const;
+  /// The same by its name.
+  [[nodiscard]] const InterfaceDescription* named(std::string_view interface_name) const;
 };
 
-/// The introspection document of one interface, as D-Bus defines it.
+/// The introspection document of an object with this interface and those beside it, as D-Bus
+/// defines it.
 [[nodiscard]] std::string introspectionXml(const InterfaceDescription& interface);
 
 /// The one object path on every connection.

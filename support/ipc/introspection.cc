@@ -65,9 +65,12 @@ constexpr std::string_view kStandardInterfaces =
 }  // namespace
 
 std::string introspectionXml(const InterfaceDescription& interface) {
-  std::string xml = "<node>\n  <interface name=\"" + escaped(interface.name) + "\">\n";
-  for (const MethodDescription& method : interface.methods) addMethod(xml, method);
-  xml += "  </interface>\n";
+  std::string xml = "<node>\n";
+  for (const auto* each = &interface; each != nullptr; each = each->beside) {
+    xml += "  <interface name=\"" + escaped(each->name) + "\">\n";
+    for (const MethodDescription& method : each->methods) addMethod(xml, method);
+    xml += "  </interface>\n";
+  }
   xml += kStandardInterfaces;
   xml += "</node>\n";
   return xml;

@@ -72,7 +72,7 @@ struct ServedMethod {
 
 struct ServedInterface {
   const InterfaceDescription* description = nullptr;
-  std::vector<ServedMethod> methods;  ///< one per described method
+  std::vector<ServedMethod> methods;  ///< one per described method, those beside it included
 };
 
 /// What is wrong with it, empty when each described method has exactly one usable handler.

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "support/access/linux/load_rules.h"
+#include "support/history/linux/sqlite_history.h"
 #include "support/ipc/linux/bus_listener.h"
 #include "support/ipc/linux/sockets.h"
 #include "support/linux/process_limits.h"
@@ -91,7 +92,10 @@ Platform LinuxPlatform::makePlatform() {
                   global_.async(std::move(task));
                 });
               },
-          .createSpacekeepToken = [] { return Value(randomToken()); }};
+          .createSpacekeepToken = [] { return Value(randomToken()); },
+          .openHistory = [this]() -> std::unique_ptr<HistoryStore> {
+            return SqliteHistory::open(paths_.state_directory);
+          }};
 }
 
 std::unique_ptr<PreferencesSuite> LinuxPlatform::openSuite(const std::string& name) {

@@ -3,7 +3,8 @@ import json
 import pathlib
 import subprocess
 
-FOLDERS = ('daemon', 'support', 'registry', 'client', 'operations', 'purge', 'purgeable')
+FOLDERS = ('daemon', 'support', 'registry', 'client', 'operations', 'purge', 'purgeable',
+           'history')
 
 
 def merge(raw_files, into):

@@ -39,6 +39,17 @@ struct PurgeRequest {
   [[nodiscard]] Dictionary info() const;
 };
 
+/// Which entries of the daemon's history are wanted. What is left empty is not sent, and the
+/// daemon's default holds.
+struct HistoryRequest {
+  std::optional<std::uint64_t> before;  ///< entries with a smaller number; default: the newest
+  std::optional<std::uint64_t> limit;   ///< most entries, 1 to 1000; default 100
+  std::optional<std::string> volume;    ///< only of this one; default: of all
+
+  /// The request dictionary as the daemon reads it.
+  [[nodiscard]] Dictionary info() const;
+};
+
 /// The answer to a request. Exactly one of three: an outcome, a refusal (neither is set), an error.
 struct Reply {
   std::optional<Dictionary> outcome;
@@ -101,6 +112,10 @@ class Client {
   [[nodiscard]] Status setState(const std::string& key, std::optional<Value> value,
                                 Deadline deadline = {});
   [[nodiscard]] StateReply state(const std::string& key, Deadline deadline = {});
+  /// What the daemon has done: "SPACEKEEP_ENTRIES", newest first, at most half a megabyte at once,
+  /// and "SPACEKEEP_NEXT", the `before` of the older ones, when there are more. kNotSupported: the
+  /// daemon is of a version without a history.
+  [[nodiscard]] Reply history(const HistoryRequest& request = {}, Deadline deadline = {});
 
   // The same without waiting. The handler runs exactly once, on a worker thread, never from within
   // the call that set it off.
@@ -111,6 +126,7 @@ class Client {
   void setStateAsync(const std::string& key, std::optional<Value> value, StatusHandler handler,
                      Deadline deadline = {});
   void stateAsync(const std::string& key, StateHandler handler, Deadline deadline = {});
+  void historyAsync(const HistoryRequest& request, ReplyHandler handler, Deadline deadline = {});
 
  private:
   class Impl;

@@ -12,6 +12,7 @@
 
 #include "support/access/cgroup_unit.h"
 #include "support/access/fdinfo_pid.h"
+#include "support/values/text.h"
 
 namespace spacekeep::access {
 namespace {
@@ -96,6 +97,12 @@ bool stillRuns(int pidfd) {
   return ::poll(&exit_of_process, 1, 0) == 0;
 }
 
+/// proc(5), /proc/pid/comm: up to 15 bytes of the process's own choice and a line break.
+std::optional<std::string> programFromComm(const std::string& comm) {
+  if (comm.empty() || comm == "\n") return std::nullopt;
+  return lineOf(comm.ends_with('\n') ? comm.substr(0, comm.size() - 1) : comm);
+}
+
 std::optional<ucred> readCredentials(int fd) {
   ucred credentials{};
   socklen_t bytes = sizeof(credentials);
@@ -115,9 +122,12 @@ std::optional<ucred> readCredentials(int fd) {
 bool addFactsOfProcess(PeerFacts& facts) {
   const auto pid = facts.pidfd == nullptr ? std::nullopt : pidOf(facts.pidfd->fd());
   if (!pid) return false;
-  const auto cgroup = readProcFile("/proc/" + std::to_string(*pid) + "/cgroup");
+  const std::string directory = "/proc/" + std::to_string(*pid);
+  const auto cgroup = readProcFile(directory + "/cgroup");
+  const auto comm = readProcFile(directory + "/comm");
   if (!cgroup || !stillRuns(facts.pidfd->fd())) return false;
   facts.unit = systemUnitFromCgroup(*cgroup);
+  if (comm) facts.program = programFromComm(*comm);
   return true;
 }
 

@@ -45,13 +45,16 @@ void CallServer::dispatch(sd_bus_message* call, std::size_t bytes) {
     return;
   }
   const std::string path = textOrEmpty(sd_bus_message_get_path(call));
-  const std::string name(context_->interface.description->name);
+  const InterfaceDescription& first = *context_->interface.description;
+  // Without a name, the interface is the one that has the method.
+  const auto* meant = interface.empty() ? first.having(member) : first.named(interface);
   if (path != kObjectPath) {
     refuse(call, kErrorUnknownObject, "There is no object " + path + "; use " + kObjectPath);
-  } else if (!interface.empty() && interface != name) {
-    refuse(call, kErrorUnknownInterface, "There is no interface " + interface + "; use " + name);
+  } else if (meant == nullptr && !interface.empty()) {
+    refuse(call, kErrorUnknownInterface,
+           "There is no interface " + interface + "; use " + std::string(first.name));
   } else {
-    dispatchServed(call, member, bytes);
+    dispatchServed(call, meant == nullptr ? first : *meant, member, bytes);
   }
 }
 
@@ -79,9 +82,8 @@ void CallServer::dispatchStandard(sd_bus_message* call, const std::string& inter
   }
 }
 
-void CallServer::dispatchServed(sd_bus_message* call, const std::string& member,
-                                std::size_t bytes) {
-  const InterfaceDescription& interface = *context_->interface.description;
+void CallServer::dispatchServed(sd_bus_message* call, const InterfaceDescription& interface,
+                                const std::string& member, std::size_t bytes) {
   const MethodDescription* method = interface.method(member);
   if (method == nullptr) {
     refuse(call, kErrorUnknownMethod,

@@ -56,7 +56,8 @@ class CallServer : public std::enable_shared_from_this<CallServer> {
 
   void dispatchStandard(sd_bus_message* call, const std::string& interface,
                         const std::string& member);
-  void dispatchServed(sd_bus_message* call, const std::string& member, std::size_t bytes);
+  void dispatchServed(sd_bus_message* call, const InterfaceDescription& interface,
+                      const std::string& member, std::size_t bytes);
   void serve(sd_bus_message* call, const MethodDescription& method, std::size_t bytes);
   void run(const ServedMethod& method, std::size_t bytes, Task task);
   void schedule(const ServedMethod& method, Task task);

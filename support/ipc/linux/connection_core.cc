@@ -92,9 +92,11 @@ void ConnectionCore::call(std::string_view member, Arguments arguments,
 /// Fills in the method. Answers an error with an empty name when the call may be made.
 Error ConnectionCore::admit(std::string_view member, const Arguments& arguments, Call& call) {
   if (ended_) return {kErrorDisconnected, "the connection has ended"};
-  call.interface = interface_;
-  call.method = interface_ == nullptr ? nullptr : interface_->method(member);
-  if (call.method == nullptr) return {kErrorUnknownMethod, std::string(member) + " is not known"};
+  call.interface = interface_ == nullptr ? nullptr : interface_->having(member);
+  if (call.interface == nullptr) {
+    return {kErrorUnknownMethod, std::string(member) + " is not known"};
+  }
+  call.method = call.interface->method(member);
   if (!matches(call.method->in, arguments)) {
     return {kErrorInvalidArgs, std::string(member) + " takes other arguments"};
   }

@@ -90,7 +90,7 @@ Finding checkIntegrity(sqlite3* database) {
 }
 
 // An empty file is a fresh one: it has neither tables nor an application of its own.
-Finding checkOwner(sqlite3* database) {
+Finding checkOwner(sqlite3* database, const SuiteFileKind& kind) {
   int code = SQLITE_OK;
   const std::int64_t tables = queryInteger(database, "SELECT count(*) FROM sqlite_schema", code);
   if (code != SQLITE_ROW) return findingOf(database, code);
@@ -99,17 +99,17 @@ Finding checkOwner(sqlite3* database) {
   const std::int64_t version = queryInteger(database, "PRAGMA user_version", code);
   if (code != SQLITE_ROW) return findingOf(database, code);
   if (tables == 0 && application == 0) return {};
-  if (application != kSuiteApplicationId) {
+  if (application != kind.application_id) {
     return {Soundness::kDamaged, "it is the database of another program"};
   }
-  if (version > kSuiteVersion) {
+  if (version > kind.version) {
     return {Soundness::kUnreachable, "it was written by a newer version of this program"};
   }
   return {};
 }
 
-Finding checkFile(sqlite3* database) {
-  const Finding owner = checkOwner(database);
+Finding checkFile(sqlite3* database, const SuiteFileKind& kind) {
+  const Finding owner = checkOwner(database, kind);
   return owner.soundness == Soundness::kSound ? checkIntegrity(database) : owner;
 }
 
@@ -131,7 +131,7 @@ std::string corruptName(const std::string& directory, const std::string& name) {
 
 // The rollback journal goes along: it belongs to this content and would be played into the next.
 Problem setAside(const std::string& directory, const std::string& name, const std::string& path,
-                 const std::string& reason) {
+                 const std::string& reason, const char* what) {
   const std::string aside = corruptName(directory, name);
   const std::string journal = path + "-journal";
   if (exists(journal) && std::rename(journal.c_str(), (aside + "-journal").c_str()) != 0) {
@@ -140,12 +140,12 @@ Problem setAside(const std::string& directory, const std::string& name, const st
   if (std::rename(path.c_str(), aside.c_str()) != 0) {
     return path + " cannot be set aside: " + errorText(errno);
   }
-  logProblem("%s %@ cannot be used (%@). It was set aside as %@ and the suite starts empty.",
-             "openSuiteFile", path, reason, aside);
+  logProblem("%s %@ cannot be used (%@). It was set aside as %@ and %s starts empty.",
+             "openSuiteFile", path, reason, aside, what);
   return syncDirectory(directory);
 }
 
-std::variant<Database, Finding> openAndCheck(const std::string& path) {
+std::variant<Database, Finding> openAndCheck(const std::string& path, const SuiteFileKind& kind) {
   sqlite3* raw = nullptr;
   const int code =
       sqlite3_open_v2(path.c_str(), &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX, nullptr);
@@ -154,7 +154,7 @@ std::variant<Database, Finding> openAndCheck(const std::string& path) {
   sqlite3_extended_result_codes(database.get(), 1);
   // Another process may hold the file for a moment; that alone must not cost the suite.
   sqlite3_busy_timeout(database.get(), 2000);
-  const Finding finding = checkFile(database.get());
+  const Finding finding = checkFile(database.get(), kind);
   if (finding.soundness != Soundness::kSound) return finding;
   return database;
 }
@@ -167,20 +167,21 @@ bool isSafeSuiteName(const std::string& name) {
 }
 
 std::variant<Database, SuiteFileError> openSuiteFile(const std::string& directory,
-                                                     const std::string& name) {
+                                                     const std::string& name,
+                                                     const SuiteFileKind& kind) {
   if (!isSafeSuiteName(name)) return SuiteFileError{"its name is no safe file name"};
   if (Problem problem = makeDirectories(directory)) return SuiteFileError{*problem};
   keepInPlace(directory);
   const std::string path = directory + "/" + name + ".sqlite";
   for (int attempt = 0; attempt < 2; ++attempt) {
     if (Problem problem = lockDownFile(path)) return SuiteFileError{*problem};
-    auto opened = openAndCheck(path);
+    auto opened = openAndCheck(path, kind);
     if (auto* database = std::get_if<Database>(&opened)) return std::move(*database);
     const auto& finding = std::get<Finding>(opened);
     if (finding.soundness != Soundness::kDamaged) {
       return SuiteFileError{path + ": " + finding.reason};
     }
-    if (Problem problem = setAside(directory, name, path, finding.reason)) {
+    if (Problem problem = setAside(directory, name, path, finding.reason, kind.what)) {
       return SuiteFileError{*problem};
     }
   }

@@ -1,6 +1,7 @@
 // Thread safety: confined to one thread at a time.
 //
-// Getting from a name to an open, sound SQLite file, whatever stands in its place.
+// Getting from a name to an open, sound SQLite file, whatever stands in its place. Suites are such
+// files, and what else the daemon keeps beside them.
 #pragma once
 
 #include <cstdint>
@@ -15,6 +16,13 @@ namespace spacekeep {
 inline constexpr std::int64_t kSuiteApplicationId = 0x534b5046;
 inline constexpr std::int64_t kSuiteVersion = 1;
 
+/// What tells one kind of file from another.
+struct SuiteFileKind {
+  std::int64_t application_id = kSuiteApplicationId;
+  std::int64_t version = kSuiteVersion;  ///< the newest that this program understands
+  const char* what = "the suite";        ///< in log lines
+};
+
 struct SuiteFileError {
   std::string reason;
 };
@@ -24,6 +32,7 @@ struct SuiteFileError {
 
 /// As SqliteSuite::open describes. Setting aside is logged here.
 [[nodiscard]] std::variant<Database, SuiteFileError> openSuiteFile(const std::string& directory,
-                                                                   const std::string& name);
+                                                                   const std::string& name,
+                                                                   const SuiteFileKind& kind = {});
 
 }  // namespace spacekeep

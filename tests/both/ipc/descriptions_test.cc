@@ -86,6 +86,37 @@ TEST(IntrospectionXml, EscapesNames) {
   EXPECT_NE(introspectionXml(odd).find("name=\"a&lt;b&gt;&amp;&quot;c\""), std::string::npos);
 }
 
+const InterfaceDescription kLater = {"com.quorvel.Later", {{"third", {}, {}}}};
+
+InterfaceDescription twoInterfaces() {
+  InterfaceDescription both = kInterface;
+  both.beside = &kLater;
+  return both;
+}
+
+TEST(IntrospectionXml, NamesTheInterfacesBesideToo) {
+  const std::string xml = introspectionXml(twoInterfaces());
+  EXPECT_NE(xml.find("  </interface>\n"
+                     "  <interface name=\"com.quorvel.Later\">\n"
+                     "    <method name=\"third\">\n"
+                     "    </method>\n"
+                     "  </interface>\n"
+                     "  <interface name=\"org.freedesktop.DBus.Introspectable\">\n"),
+            std::string::npos)
+      << xml;
+}
+
+TEST(InterfacesBesideEachOther, AreFoundByMethodAndByName) {
+  const InterfaceDescription both = twoInterfaces();
+  EXPECT_EQ(both.having("second"), &both);
+  EXPECT_EQ(both.having("third"), &kLater);
+  EXPECT_EQ(both.having("fourth"), nullptr);
+  EXPECT_EQ(both.named("com.quorvel.Test"), &both);
+  EXPECT_EQ(both.named("com.quorvel.Later"), &kLater);
+  EXPECT_EQ(both.named("com.quorvel.Never"), nullptr);
+  EXPECT_EQ(both.method("third"), nullptr) << "of this interface alone";
+}
+
 ServedInterface complete() {
   ServedInterface served;
   served.description = &kInterface;
@@ -100,6 +131,16 @@ ServedInterface complete() {
 
 TEST(ProblemOfServedInterface, IsEmptyWithOneHandlerForEachMethod) {
   EXPECT_EQ(problemOf(complete()), "");
+}
+
+TEST(ProblemOfServedInterface, LooksAtTheInterfacesBesideToo) {
+  const InterfaceDescription both = twoInterfaces();
+  ServedInterface served = complete();
+  served.description = &both;
+  EXPECT_EQ(problemOf(served), "third is not served");
+  served.methods.push_back(served.methods.front());
+  served.methods.back().name = "third";
+  EXPECT_EQ(problemOf(served), "");
 }
 
 TEST(ProblemOfServedInterface, NamesWhatIsWrong) {

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <sys/wait.h>
@@ -106,6 +107,19 @@ TEST(CapturePeerIdentity, TheIdentityStaysWhenTheProcessHasDied) {
   ASSERT_NE(identity, nullptr);
   EXPECT_EQ(identity->uid(), 4711U);
   EXPECT_EQ(identity->unit(), std::nullopt) << "a dead process has no unit";
+  EXPECT_EQ(identity->program(), std::nullopt) << "and no name";
+}
+
+TEST(CapturePeerIdentity, TheProgramIsWhatTheProcessCallsItselfOnOneLine) {
+  std::array<char, 16> own{};
+  ASSERT_EQ(::prctl(PR_GET_NAME, own.data()), 0);
+  ASSERT_EQ(::prctl(PR_SET_NAME, "a\nb\x01"), 0);
+  const Door door;
+  const ipc::Descriptor entered(door.enter());
+  const ipc::Descriptor accepted(door.accept());
+  const auto identity = capturePeerIdentity(accepted.fd());
+  ASSERT_EQ(::prctl(PR_SET_NAME, own.data()), 0);
+  EXPECT_EQ(identity->program(), "a\\nb\\x01");
 }
 
 TEST(CapturePeerIdentity, ThePidfdIsOfTheVeryProcessAndNotInherited) {

@@ -116,7 +116,8 @@ struct UsageCase {
 TEST_F(CommandTest, AWrongCommandLineExitsWithTwoAndSaysWhatIsWrong) {
   const UsageCase cases[] = {
       {"",
-       "A command is required: status, explain, report, doctor, purge, query, state, volumes, "
+       "A command is required: status, explain, history, report, doctor, purge, query, state, "
+       "volumes, "
        "cancel "
        "or check-service"},
       {"eat", "eat"},

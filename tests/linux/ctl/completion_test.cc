@@ -76,8 +76,9 @@ class Completion : public ToolTest {
 };
 
 TEST_F(Completion, BashOffersCommands) {
-  EXPECT_THAT(inBash("\"\""), ElementsAre("status", "explain", "report", "doctor", "purge", "query",
-                                          "state", "volumes", "cancel", "check-service"));
+  EXPECT_THAT(inBash("\"\""),
+              ElementsAre("status", "explain", "history", "report", "doctor", "purge", "query",
+                          "state", "volumes", "cancel", "check-service"));
   EXPECT_THAT(inBash("q"), ElementsAre("query"));
   EXPECT_THAT(inBash("--json q"), ElementsAre("query"));
   EXPECT_THAT(inBash("state \"\""), ElementsAre("get", "set", "unset", "list"));
@@ -148,8 +149,8 @@ TEST_F(Completion, BashOffersFilesAndVolumesForACheckAndProgramsForItsCommand) {
 /// Every option that bash offers is one that the tool knows for that command.
 TEST_F(Completion, EveryOptionThatIsOfferedStandsInTheHelp) {
   for (const std::string command :
-       {"status", "explain", "report", "doctor", "purge", "query", "state set", "state list",
-        "state get", "volumes", "cancel", "check-service"}) {
+       {"status", "explain", "history", "report", "doctor", "purge", "query", "state set",
+        "state list", "state get", "volumes", "cancel", "check-service"}) {
     const std::string help = ctl(command + " --help").out;
     for (const auto& option : inBash(command + " --")) {
       EXPECT_NE(help.find(option), std::string::npos) << command << " " << option;

@@ -18,8 +18,8 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 
 constexpr const char* kCommands[] = {
-    "status",    "explain",     "report",     "doctor",  "purge",  "query",        "state get",
-    "state set", "state unset", "state list", "volumes", "cancel", "check-service"};
+    "status",    "explain",   "history",     "report",     "doctor",  "purge",  "query",
+    "state get", "state set", "state unset", "state list", "volumes", "cancel", "check-service"};
 
 class Manual : public ToolTest {
  protected:

@@ -38,6 +38,15 @@ TEST(Calls, MadeBeforeResumeAreHeldAndThenGoOutFirst) {
   EXPECT_EQ(server.numbers(), (std::vector<std::int32_t>{1, 2}));
 }
 
+TEST(Calls, ReachTheInterfaceBesideOnTheSameConnection) {
+  TestServer server;
+  const auto connection = server.connect();
+  const Outcome outcome = callAndWait(connection, "aside", {});
+  ASSERT_TRUE(outcome.reply);
+  EXPECT_EQ(std::get<std::string>(outcome.reply->at(0)), "from beside");
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+}
+
 TEST(Calls, AnswersMayComeInAnyOrder) {
   TestServer server;
   const auto connection = server.connect();

@@ -59,6 +59,12 @@ class ForeignClient : public ::testing::Test {
       };
       served.methods.push_back(std::move(method));
     }
+    ServedMethod aside;
+    aside.name = "aside";
+    aside.serve = [](const Arguments&, const Responder& responder) {
+      responder.reply({std::string()});
+    };
+    served.methods.push_back(std::move(aside));
     return served;
   }
 
@@ -187,6 +193,13 @@ TEST_F(ForeignClient, IsToldWhatDoesNotExist) {
 
 TEST_F(ForeignClient, MayLeaveTheInterfaceOut) {
   EXPECT_EQ(client.errorOf(client.newCall("forget", nullptr)), "");
+}
+
+TEST_F(ForeignClient, FindsAMethodOnlyInItsInterface) {
+  EXPECT_EQ(client.errorOf(client.newCall("aside", "com.quorvel.IpcTestAside")), "");
+  EXPECT_EQ(client.errorOf(client.newCall("aside", nullptr)), "");
+  EXPECT_EQ(client.errorOf(client.newCall("aside")), kUnknownMethod);
+  EXPECT_EQ(client.errorOf(client.newCall("forget", "com.quorvel.IpcTestAside")), kUnknownMethod);
 }
 
 TEST_F(ForeignClient, GetsAnswersToTheStandardQuestions) {

@@ -19,6 +19,8 @@ const InterfaceDescription& testInterface() {
                                                        {"maybe_info", kOptionalDictionary},
                                                        {"maybe_value", kOptionalValue},
                                                        {"maybe_text", kOptionalString}};
+  static const InterfaceDescription aside = {"com.quorvel.IpcTestAside",
+                                             {{"aside", {}, {{"text", kString}}}}};
   static const InterfaceDescription interface = {
       "com.quorvel.IpcTest",
       {{"echo", all, all},
@@ -29,7 +31,8 @@ const InterfaceDescription& testInterface() {
        {"numberBriefly", {{"number", kInt32}}, {{"number", kInt32}}},
        {"blockBriefly", {}, {}},
        {"forget", {}, {}},
-       {"whoAmI", {}, {{"uid", kOptionalValue}}}}};
+       {"whoAmI", {}, {{"uid", kOptionalValue}}}},
+      &aside};
   return interface;
 }
 
@@ -172,6 +175,9 @@ ServedInterface TestServer::interface() {
   served.methods.push_back(method("forget", [](const Arguments&, const Responder&) {}));
   served.methods.push_back(method("whoAmI", [](const Arguments&, const Responder& responder) {
     responder.reply({OptionalValue(Value(currentConnection()->identity().uid()))});
+  }));
+  served.methods.push_back(method("aside", [](const Arguments&, const Responder& responder) {
+    responder.reply({std::string("from beside")});
   }));
   return served;
 }

@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 
 #include "client/client_protocol.h"
+#include "client/history_protocol.h"
 #include "registry/service_protocol.h"
 #include "tests/linux/packaging/packaging_world.h"
 
@@ -10,7 +11,8 @@ namespace {
 
 TEST(Interfaces, TheInstalledDocumentsAreWhatTheDaemonDeclares) {
   std::set<fs::path> expected;
-  for (const auto* interface : {&spacekeepClientInterface(), &spacekeepServiceInterface()}) {
+  for (const auto* interface :
+       {&spacekeepClientInterface(), &spacekeepHistoryInterface(), &spacekeepServiceInterface()}) {
     const fs::path file = kSource / "packaging/dbus" / (std::string(interface->name) + ".xml");
     EXPECT_EQ(contentOf(file), ipc::introspectionXml(*interface)) << file;
     expected.insert(file);
@@ -32,7 +34,8 @@ TEST(Interfaces, TheBusLetsEveryInterfaceOfTheDaemonThroughAndNoOtherOfThisSyste
 
 TEST(Interfaces, TheManualTellsOfEveryMethod) {
   const std::string page = contentOf(kSource / "packaging/man/spacekeep-protocol.7");
-  for (const auto* interface : {&spacekeepClientInterface(), &spacekeepServiceInterface()}) {
+  for (const auto* interface :
+       {&spacekeepClientInterface(), &spacekeepHistoryInterface(), &spacekeepServiceInterface()}) {
     for (const auto& method : interface->methods) {
       const std::string entry = ".It Fn " + std::string(method.name);
       EXPECT_NE(page.find(entry), std::string::npos) << entry;

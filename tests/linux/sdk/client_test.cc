@@ -114,6 +114,37 @@ TEST_F(ClientTest, EachOperationCallsItsOwnMember) {
             "clientItemizedPurgeableSpace");
 }
 
+TEST_F(ClientTest, AHistoryRequestArrivesUnderTheDaemonsKeysAndItsPageComesBack) {
+  rt::Guarded<std::vector<Dictionary>> seen;
+  const Dictionary page{{"SPACEKEEP_ENTRIES", Array{Dictionary{{"SPACEKEEP_ENTRY", 7}}}},
+                        {"SPACEKEEP_NEXT", 7}};
+  daemon_.on("clientHistory", [&](const ipc::Arguments& in, const ipc::Responder& responder) {
+    seen.update([&](auto& list) { list.push_back(std::get<Dictionary>(in.at(0))); });
+    responder.reply(outcome(page));
+  });
+  const auto running = daemon_.run();
+  Client client = connect();
+  EXPECT_EQ(client.history().outcome, page);
+  HistoryRequest request;
+  request.before = 8;
+  request.limit = 1;
+  request.volume = "/data";
+  EXPECT_EQ(client.history(request).outcome, page);
+  EXPECT_EQ(
+      seen.get(),
+      (std::vector<Dictionary>{
+          {}, {{"SPACEKEEP_BEFORE", 8}, {"SPACEKEEP_LIMIT", 1}, {"SPACEKEEP_VOLUME", "/data"}}}));
+}
+
+TEST_F(ClientTest, AHistoryThatTheDaemonDoesNotHaveIsNotSupported) {
+  const auto running = daemon_.run();
+  Client client = connect();
+  const Reply reply = client.history();
+  ASSERT_TRUE(reply.error);
+  EXPECT_EQ(reply.error->kind, ErrorKind::kNotSupported);
+  EXPECT_THAT(reply.error->text, HasSubstr("clientHistory"));
+}
+
 TEST_F(ClientTest, ACancelRequestCarriesTheTokenAndIsAnswered) {
   rt::Guarded<Dictionary> seen;
   daemon_.on("clientCancelPurge", [&](const ipc::Arguments& in, const ipc::Responder& responder) {

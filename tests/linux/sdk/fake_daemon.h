@@ -16,7 +16,7 @@
 #include <utility>
 #include <vector>
 
-#include "client/client_protocol.h"
+#include "client/history_protocol.h"
 #include "registry/service_protocol.h"
 #include "support/ipc/linux/bus_server.h"
 #include "support/ipc/linux/connector.h"
@@ -65,11 +65,13 @@ class FakeDaemon {
 
   /// Listens, but serves nothing until start().
   explicit FakeDaemon(std::string socket_path) : socket_path_(std::move(socket_path)) {
-    for (const auto& method : spacekeepClientInterface().methods) {
-      handlers_[std::string(method.name)] = [](const ipc::Arguments&, const ipc::Responder& r) {
-        r.fail(
-            {"org.freedesktop.DBus.Error.NotSupported", "the test did not say how to serve this"});
-      };
+    for (const auto* each = &spacekeepClientInterfaces(); each != nullptr; each = each->beside) {
+      for (const auto& method : each->methods) {
+        handlers_[std::string(method.name)] = [](const ipc::Arguments&, const ipc::Responder& r) {
+          r.fail({"org.freedesktop.DBus.Error.NotSupported",
+                  "the test did not say how to serve this"});
+        };
+      }
     }
   }
   ~FakeDaemon() { stop(); }
@@ -154,13 +156,13 @@ class FakeDaemon {
 
  private:
   ipc::ServedInterface interface() {
-    ipc::ServedInterface served{&spacekeepClientInterface(), {}};
-    for (const auto& method : spacekeepClientInterface().methods) {
-      served.methods.push_back({.name = method.name,
+    ipc::ServedInterface served{&spacekeepClientInterfaces(), {}};
+    for (const auto& [name, serve] : handlers_) {
+      served.methods.push_back({.name = name,
                                 .mode = ipc::ServeMode::kInOrder,
                                 .lane = {},
                                 .lane_width = 1,
-                                .serve = handlers_.at(std::string(method.name))});
+                                .serve = serve});
     }
     return served;
   }

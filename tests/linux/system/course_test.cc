@@ -150,5 +150,42 @@ TEST_F(Course, StateIsThereAfterARestart) {
   EXPECT_EQ(all.value->dictionary()->size(), 2U);
 }
 
+TEST_F(Course, TheHistoryTellsWhoAskedAndWhoGaveAlsoAfterTheDaemonWasKilled) {
+  const Output purge =
+      sandbox_.run({"/programs/ctl/spacekeepctl", "purge", "/volumes/disk", "20M"});
+  ASSERT_EQ(purge.status, 0) << purge.text;
+  const auto history = [this] {
+    return sandbox_.run({"/programs/ctl/spacekeepctl", "history", "--json"}).text;
+  };
+  const std::string before = history();
+  for (const char* part : {"\"number\":1", "\"kind\":\"purge\"", "\"program\":\"spacekeepctl\"",
+                           "\"uid\":0", "\"volume\":\"/volumes/disk\"", "\"asked_bytes\":20971520",
+                           "\"id\":\"com.example.thumbnails\"", "\"older\":false"}) {
+    EXPECT_NE(before.find(part), std::string::npos) << part << "\n" << before;
+  }
+  EXPECT_EQ(before.find("why_short"), std::string::npos) << before;
+  daemon_.signal(SIGKILL);
+  daemon_.wait();
+  daemon_ = sandbox_.startDaemon();
+  EXPECT_EQ(history(), before);
+  sandbox_.run({"/programs/ctl/spacekeepctl", "purge", "/volumes/disk", "1G"});
+  const std::string after = history();
+  EXPECT_NE(after.find("\"number\":2"), std::string::npos) << after;
+  EXPECT_NE(after.find("\"why_short\":\"nothing more to give\""), std::string::npos) << after;
+}
+
+TEST_F(Course, AHistoryThatIsDamagedIsSetAsideAndThePurgeGoesOn) {
+  daemon_.signal(SIGKILL);
+  daemon_.wait();
+  sandbox_.write("/var/lib/spacekeep/history.sqlite", "no database at all, but long enough");
+  daemon_ = sandbox_.startDaemon();
+  const Output purge =
+      sandbox_.run({"/programs/ctl/spacekeepctl", "purge", "/volumes/disk", "20M"});
+  EXPECT_EQ(purge.status, 0) << purge.text;
+  const Output history = sandbox_.run({"/programs/ctl/spacekeepctl", "history"});
+  EXPECT_NE(history.text.find("1 entry"), std::string::npos) << history.text;
+  EXPECT_EQ(timesIn(sandbox_.daemonLog(), "and the history starts empty."), 1U);
+}
+
 }  // namespace
 }  // namespace spacekeep::system_test

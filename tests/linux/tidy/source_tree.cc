@@ -71,15 +71,15 @@ SourceFile parsed(std::string path, const std::string& content) {
 }
 
 const std::vector<std::string>& daemonRooms() {
-  static const std::vector<std::string> rooms = {"daemon",     "registry", "client",
-                                                 "operations", "purge",    "purgeable"};
+  static const std::vector<std::string> rooms = {"daemon", "registry",  "client", "operations",
+                                                 "purge",  "purgeable", "history"};
   return rooms;
 }
 
 const std::vector<std::string>& productionRooms() {
   static const std::vector<std::string> rooms = {"daemon", "registry",  "client",  "operations",
                                                  "purge",  "purgeable", "support", "sdk",
-                                                 "ctl",    "services",  "sim"};
+                                                 "ctl",    "services",  "sim",     "history"};
   return rooms;
 }
 

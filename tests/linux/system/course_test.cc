@@ -168,7 +168,9 @@ TEST_F(Course, TheHistoryTellsWhoAskedAndWhoGaveAlsoAfterTheDaemonWasKilled) {
   daemon_.wait();
   daemon_ = sandbox_.startDaemon();
   EXPECT_EQ(history(), before);
-  sandbox_.run({"/programs/ctl/spacekeepctl", "purge", "/volumes/disk", "1G"});
+  const Output second =
+      sandbox_.run({"/programs/ctl/spacekeepctl", "purge", "/volumes/disk", "1G"});
+  EXPECT_EQ(second.status, 1) << second.text;
   const std::string after = history();
   EXPECT_NE(after.find("\"number\":2"), std::string::npos) << after;
   EXPECT_NE(after.find("\"why_short\":\"nothing more to give\""), std::string::npos) << after;

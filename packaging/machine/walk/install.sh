@@ -19,7 +19,7 @@ walk_install() {
   show sh -c 'dpkg -l "*spacekeep*" | tail -n +6'
   echo "  packages that came along: $(($(inside_sh 'dpkg -l | grep -c ^ii') - $(cat "$work/packages.before")))"
   check "the packages are installed and configured" inside_sh \
-    '[ "$(dpkg-query -W -f="\${db:Status-Abbrev}\n" spacekeep spacekeep-services libspacekeep-dev | sort -u)" = "ii " ]'
+    '[ "$(dpkg-query -W -f="\${db:Status-Abbrev}\n" spacekeep spacekeep-services libspacekeep-dev python3-spacekeep | sort -u)" = "ii " ]'
   [ $failures = 0 ] || die "without the packages there is nothing to walk through"
   check "none of them brings a desktop" no_dependency_on_a_desktop
   check "the daemon runs and has told that it is ready" inside systemctl is-active spacekeepd.service
@@ -31,5 +31,7 @@ walk_install() {
   check "only the daemon reads its state" inside_sh \
     '[ "$(stat -c "%U %a" /var/lib/spacekeep)" = "_spacekeep 700" ]'
   check "the daemon and its socket come up with the machine" inside systemctl is-enabled spacekeepd.service spacekeepd.socket
-  check "nothing of the packages has changed" inside dpkg --verify spacekeep spacekeep-services libspacekeep-dev
+  check "nothing of the packages has changed" inside dpkg --verify spacekeep spacekeep-services libspacekeep-dev python3-spacekeep
+  check "a program in Python asks the daemon" inside_sh \
+    'python3 -c "import spacekeep; print(spacekeep.Client().purgeable(\"/\"))" | grep -q SPACEKEEP_TOTAL_AVAILABLE'
 }

@@ -2,7 +2,7 @@
 
 walk_purge() {
   say "Removing"
-  show sh -c 'apt-get remove -y spacekeep spacekeep-services libspacekeep-dev | tail -3'
+  show sh -c 'apt-get remove -y spacekeep spacekeep-services libspacekeep-dev python3-spacekeep | tail -3'
   check "the daemon is gone, and its socket" inside_sh \
     '! pgrep spacekeep && [ ! -e /run/spacekeep/spacekeep.sock ]'
   check "no unit of it is left" inside_sh '[ -z "$(systemctl list-units --all --no-legend "spacekeep*" | grep -v not-found)" ]'

@@ -12,10 +12,12 @@
 #include "ctl/explanation.h"
 #include "ctl/json_text.h"
 #include "ctl/local_volumes.h"
+#include "ctl/past.h"
 #include "ctl/status_report.h"
 #include "ctl/supply.h"
 #include "operations/info_keys.h"
 #include "support/linux/linux_paths.h"
+#include "support/runtime/runtime.h"
 
 namespace spacekeep::ctl {
 namespace {
@@ -36,7 +38,8 @@ std::map<std::string, std::string> missingSockets(
 }
 
 std::vector<VolumeFacts> factsOf(const VolumeReport& report, const Survey& survey,
-                                 const Dictionary& state) {
+                                 const Dictionary& state, const Past& past) {
+  const Date now{rt::wallClockNs()};
   const auto declared = servicesById(readDeclarations(""));
   const auto missing = missingSockets(declared);
   std::vector<VolumeFacts> facts;
@@ -48,6 +51,8 @@ std::vector<VolumeFacts> factsOf(const VolumeReport& report, const Survey& surve
                      .offers = offers == nullptr ? VolumeOffers() : *offers,
                      .declared = declared,
                      .missing_sockets = missing});
+    const auto done = past.find(sample.volume);
+    if (done != past.end()) facts.back().past = pastParagraphs(done->second, now, localWords());
   }
   return facts;
 }
@@ -86,7 +91,7 @@ ExitCode runExplain(const CommonOptions& common, const OneVolumeOptions& options
     return complain(common, ExitCode::kRefused, *objection);
   }
   const Survey survey = surveyShowing(common, report);
-  const auto facts = factsOf(report, survey, state);
+  const auto facts = factsOf(report, survey, state, pastOf(common, report));
   fmt::print("{}", common.json ? allJson(facts, survey.problem) + "\n"
                                : allText(facts, styleOf(STDOUT_FILENO)));
   if (!survey.problem) return ExitCode::kDone;

@@ -158,6 +158,7 @@ std::vector<Paragraph> explanationOf(const VolumeFacts& facts) {
   append(list, offerParagraphs(facts));
   append(list, wayOut(facts));
   append(list, silenceOf(facts));
+  append(list, facts.past);
   return list;
 }
 

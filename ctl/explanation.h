@@ -15,6 +15,11 @@
 
 namespace spacekeep::ctl {
 
+struct Paragraph {
+  std::string text;
+  bool is_item = false;  ///< one of a list that the paragraph before it announces
+};
+
 /// What there is to know about one volume.
 struct VolumeFacts {
   VolumeSample sample;
@@ -24,11 +29,7 @@ struct VolumeFacts {
   std::map<std::string, DeclaredService> declared;
   /// Of those declared: the sockets that are not there, by service.
   std::map<std::string, std::string> missing_sockets;
-};
-
-struct Paragraph {
-  std::string text;
-  bool is_item = false;  ///< one of a list that the paragraph before it announces
+  std::vector<Paragraph> past = {};  ///< what was done here, in words
 };
 
 /// The first says in a word how the volume is.

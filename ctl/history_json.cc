@@ -36,7 +36,9 @@ void setServices(Dictionary& object, const HistoryEntry& entry) {
   object.set("silent_services", std::move(silent));
 }
 
-Value valueOf(const HistoryEntry& entry, const HistoryWords& words) {
+}  // namespace
+
+Value jsonMembersOf(const HistoryEntry& entry, const HistoryWords& words) {
   Dictionary object{{"number", entry.number}, {"kind", entry.kind}};
   if (entry.ended) object.set("ended", *entry.ended);
   if (entry.client) object.set("client", valueOf(*entry.client, words));
@@ -54,11 +56,9 @@ Value valueOf(const HistoryEntry& entry, const HistoryWords& words) {
   return object;
 }
 
-}  // namespace
-
 std::string jsonOf(const HistoryList& list, const HistoryWords& words) {
   Array entries;
-  for (const HistoryEntry& entry : list.entries) entries.emplace_back(valueOf(entry, words));
+  for (const HistoryEntry& entry : list.entries) entries.push_back(jsonMembersOf(entry, words));
   return jsonOf(Value(Dictionary{{"entries", std::move(entries)}, {"older", list.older}}));
 }
 

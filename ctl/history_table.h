@@ -28,6 +28,8 @@ struct HistoryWords {
 /// fitted to its width.
 [[nodiscard]] std::string textOf(const HistoryList& list, const HistoryWords& words,
                                  const Style& style);
+/// One entry as an object.
+[[nodiscard]] Value jsonMembersOf(const HistoryEntry& entry, const HistoryWords& words);
 /// One object; the man page of the tool describes its members.
 [[nodiscard]] std::string jsonOf(const HistoryList& list, const HistoryWords& words);
 

@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "ctl/json_text.h"
+#include "ctl/past.h"
 #include "ctl/size_text.h"
 #include "ctl/supply.h"
 #include "ctl/text_layout.h"
@@ -37,11 +38,13 @@ std::string headOf(const VolumeSample& sample, const Style& style) {
   return head + ":\n" + wrapped(shortage, style.columns, kGap) + "\n";
 }
 
-std::string blockOf(const VolumeSample& sample, const Survey& survey, const Style& style) {
+std::string blockOf(const VolumeSample& sample, const StatusReport& report, const Style& style) {
   std::string text = headOf(sample, style);
   for (const auto& supply : suppliesOf(sample)) text += supplyLine(supply, style);
-  const VolumeOffers* offers = offersFor(survey, sample.volume);
+  const VolumeOffers* offers = offersFor(report.survey, sample.volume);
   if (offers != nullptr) text += offersText(*offers, style);
+  const auto past = report.past.find(sample.volume);
+  if (past != report.past.end()) text += pastLines(past->second.sentences, style);
   return text;
 }
 
@@ -149,7 +152,7 @@ std::string textOf(const StatusReport& report, const Style& style) {
   if (report.volumes.volumes.empty()) return "There is no local volume here.\n";
   std::string text;
   for (const auto& sample : report.volumes.volumes) {
-    text += blockOf(sample, report.survey, style) + "\n";
+    text += blockOf(sample, report, style) + "\n";
   }
   text += fitted(closingLine(report), style);
   if (somebodyWasLate(report.survey)) {
@@ -168,6 +171,8 @@ Array volumesValueOf(const StatusReport& report) {
     members.set("short_of", shortOf(sample));
     const VolumeOffers* offers = offersFor(report.survey, sample.volume);
     members.set("offers", offers == nullptr ? valueOf(VolumeOffers{}) : valueOf(*offers));
+    const auto past = report.past.find(sample.volume);
+    if (past != report.past.end()) members.set("past", past->second.entries);
     volumes.emplace_back(std::move(members));
   }
   return volumes;

@@ -3,6 +3,7 @@
 // How the volumes of this machine are, and what could be done about it, for people and programs.
 #pragma once
 
+#include <map>
 #include <optional>
 #include <string>
 #include <vector>
@@ -14,9 +15,16 @@
 
 namespace spacekeep::ctl {
 
+/// What was done last on a volume, newest first.
+struct VolumePast {
+  std::vector<std::string> sentences = {};
+  Array entries = {};  ///< the same as objects
+};
+
 struct StatusReport {
   VolumeReport volumes;
-  Survey survey;  ///< of the same volumes, or of none
+  Survey survey;                                ///< of the same volumes, or of none
+  std::map<std::string, VolumePast> past = {};  ///< by volume; nothing where nothing is known
 };
 
 /// What makes the volume short: "less than 500.0 MiB free", "fewer than 50,000 inodes free", both

@@ -2,13 +2,13 @@
 
 namespace spacekeep::ctl {
 
-AskHistory historyOver(sdk::Client& client) {
-  return [&client](const Dictionary& request) {
+AskHistory historyOver(sdk::Client& client, sdk::Deadline deadline) {
+  return [&client, deadline](const Dictionary& request) {
     sdk::HistoryRequest wanted;
     wanted.before = unsignedAt(request, "SPACEKEEP_BEFORE");
     wanted.limit = unsignedAt(request, "SPACEKEEP_LIMIT");
     if (const std::string* volume = stringAt(request, "SPACEKEEP_VOLUME")) wanted.volume = *volume;
-    return client.history(wanted);
+    return client.history(wanted, deadline);
   };
 }
 

@@ -9,7 +9,7 @@
 
 namespace spacekeep::ctl {
 
-/// Asks over `client`, which must outlive what is answered.
-[[nodiscard]] AskHistory historyOver(sdk::Client& client);
+/// Asks over `client`, which must outlive what is answered. The deadline holds for each page.
+[[nodiscard]] AskHistory historyOver(sdk::Client& client, sdk::Deadline deadline = {});
 
 }  // namespace spacekeep::ctl

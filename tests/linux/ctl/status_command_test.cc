@@ -159,5 +159,36 @@ TEST_F(StatusCommand, OnATerminalWhatTakesLongerThanASecondSaysSo) {
   EXPECT_THAT(run.out, HasSubstr("\r\x1b[K" + someVolume() + "  "));
 }
 
+TEST_F(StatusCommand, TellsWhatWasDoneLastWhereTheDaemonRemembers) {
+  answer(kItemized);
+  daemon_.on("clientHistory", [this](const ipc::Arguments& in, const ipc::Responder& responder) {
+    seen_.set(std::get<Dictionary>(in.at(0)));
+    responder.reply(
+        sdk::outcome({{"SPACEKEEP_ENTRIES",
+                       Array{Dictionary{{"SPACEKEEP_KIND", "low space"},
+                                        {"SPACEKEEP_AMOUNT", 2 << 20},
+                                        {"SPACEKEEP_AMOUNT_FREED", 1 << 20},
+                                        {"SPACEKEEP_WHY_SHORT", "nothing more to give"}}}}}));
+  });
+  daemon_.start();
+  EXPECT_THAT(status().out,
+              HasSubstr("\n  once the daemon, short of space, asked for 2.0 MiB and got 1.0 MiB: "
+                        "nothing more to give\n"));
+  EXPECT_EQ(seen_.get(), (Dictionary{{"SPACEKEEP_VOLUME", someVolume()}, {"SPACEKEEP_LIMIT", 4}}));
+  EXPECT_THAT(status("--json").out, HasSubstr("\"past\":[{\"asked_bytes\":2097152"));
+  const Finished explained = ctlWithSocket("explain " + someVolume());
+  EXPECT_THAT(explained.out, HasSubstr("What the daemon did here last:"));
+  EXPECT_THAT(explained.out, HasSubstr("more to give at any urgency"));
+}
+
+TEST_F(StatusCommand, IsTheSameWhereTheDaemonKeepsNoHistory) {
+  answer(kItemized);
+  daemon_.start();
+  const Finished run = status("--json");
+  EXPECT_EQ(run.exit_code, 0) << run.err;
+  EXPECT_THAT(run.err, IsEmpty());
+  EXPECT_EQ(run.out.find("past"), std::string::npos);
+}
+
 }  // namespace
 }  // namespace spacekeep::ctl

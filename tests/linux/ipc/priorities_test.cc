@@ -26,9 +26,11 @@ void sendBriefly(BareClient& client, std::int32_t number) {
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
 }
 
+/// Answered by the thread that reads: a worker that answers may be at it for a moment longer, and would
+/// serve the next calls of the connection as well.
 std::unique_ptr<BareClient> connected(TestServer& server) {
   auto client = std::make_unique<BareClient>(server.path());
-  sd_bus_message* call = client->newCall("whoAmI");
+  sd_bus_message* call = client->newCall("Ping", "org.freedesktop.DBus.Peer", "/");
   EXPECT_EQ(client->errorOf(call), "");
   return client;
 }

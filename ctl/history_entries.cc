@@ -106,8 +106,8 @@ sdk::Result<HistoryList> newestEntries(const HistoryFilter& filter, const AskHis
   while (true) {
     const sdk::Reply reply = ask(request);
     if (reply.error) return *reply.error;
-    list.refused = reply.refused();
-    if (list.refused || !takePage(*reply.outcome, filter, list)) return list;
+    list.refused = !reply.outcome;
+    if (!reply.outcome || !takePage(*reply.outcome, filter, list)) return list;
     const auto next = unsignedAt(*reply.outcome, keys::kNext);
     const auto before = unsignedAt(request, keys::kBefore);
     // Numbers fall from page to page; a daemon that does otherwise is not asked for ever.

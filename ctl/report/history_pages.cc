@@ -31,7 +31,7 @@ class Reader {
   bool takePage() {
     const sdk::Reply reply = ask_(request());
     if (reply.error) return fail(*reply.error);
-    if (reply.refused()) {
+    if (!reply.outcome) {
       return stop(History::Access::kRefused, {ExitCode::kRefused, kNoRight});
     }
     const Value* entries = reply.outcome->find("SPACEKEEP_ENTRIES");

@@ -1,4 +1,4 @@
-// Thread safety: readHistory() for one thread at a time, the rest pure.
+// Thread safety: newestEntries() for one thread at a time, the rest may be called from any thread.
 //
 // What the daemon keeps of its doings, read and understood.
 #pragma once

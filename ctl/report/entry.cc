@@ -5,6 +5,9 @@
 #include <array>
 #include <utility>
 
+#include "history/history_keys.h"
+#include "operations/info_keys.h"
+
 namespace spacekeep::ctl {
 namespace {
 
@@ -17,22 +20,22 @@ struct Member {
 };
 
 constexpr std::array kMembers{
-    Member{"SPACEKEEP_ENTRY", "number", Kind::kNumber},
-    Member{"SPACEKEEP_KIND", "kind", Kind::kText},
-    Member{"SPACEKEEP_VOLUME", "volume", Kind::kText},
-    Member{"SPACEKEEP_AMOUNT", "asked", Kind::kNumber},
-    Member{"SPACEKEEP_URGENCY_LIMIT", "limit", Kind::kNumber},
-    Member{"SPACEKEEP_URGENCY", "urgency", Kind::kNumber},
-    Member{"SPACEKEEP_FREESPACE_BEGIN", "begin", Kind::kNumber},
-    Member{"SPACEKEEP_FREESPACE_END", "end", Kind::kNumber},
-    Member{"SPACEKEEP_AMOUNT_FREED", "freed", Kind::kNumber},
-    Member{"SPACEKEEP_AMOUNT_REPORTED", "reported", Kind::kNumber},
-    Member{"SPACEKEEP_REPORTING_SERVICES", "services", Kind::kAmounts},
-    Member{"SPACEKEEP_OTHER_SERVICES", "others", Kind::kNumber},
-    Member{"SPACEKEEP_SERVICES_INFLIGHT", "silent", Kind::kTexts},
-    Member{"SPACEKEEP_ELAPSED_TIME", "seconds", Kind::kSeconds},
-    Member{"SPACEKEEP_OPERATION_CANCELLED", "cancelled", Kind::kTruth},
-    Member{"SPACEKEEP_WHY_SHORT", "why", Kind::kText},
+    Member{keys::kEntry, "number", Kind::kNumber},
+    Member{keys::kKind, "kind", Kind::kText},
+    Member{keys::kVolume, "volume", Kind::kText},
+    Member{keys::kAmount, "asked", Kind::kNumber},
+    Member{keys::kUrgencyLimit, "limit", Kind::kNumber},
+    Member{keys::kUrgency, "urgency", Kind::kNumber},
+    Member{keys::kFreespaceBegin, "begin", Kind::kNumber},
+    Member{keys::kFreespaceEnd, "end", Kind::kNumber},
+    Member{keys::kAmountFreed, "freed", Kind::kNumber},
+    Member{keys::kAmountReported, "reported", Kind::kNumber},
+    Member{keys::kReportingServices, "services", Kind::kAmounts},
+    Member{keys::kOtherServices, "others", Kind::kNumber},
+    Member{keys::kServicesInFlight, "silent", Kind::kTexts},
+    Member{keys::kElapsedTime, "seconds", Kind::kSeconds},
+    Member{keys::kOperationCancelled, "cancelled", Kind::kTruth},
+    Member{keys::kWhyShort, "why", Kind::kText},
 };
 
 template <class T>
@@ -81,19 +84,19 @@ std::optional<Value> contentOf(const Value& value, Kind kind) {
 }  // namespace
 
 std::optional<std::int64_t> dateOf(const Dictionary& entry) {
-  const Value* value = entry.find("SPACEKEEP_DATE");
+  const Value* value = entry.find(keys::kDate);
   const Date* date = value == nullptr ? nullptr : value->date();
   return date == nullptr ? std::nullopt : std::optional(date->unix_ns);
 }
 
 std::string clientTextOf(const Dictionary& entry) {
-  const Value* value = entry.find("SPACEKEEP_CLIENT");
+  const Value* value = entry.find(keys::kClient);
   const Dictionary* client = value == nullptr ? nullptr : value->dictionary();
   if (client == nullptr) return "";
-  const std::string* program = stringAt(*client, "SPACEKEEP_PROGRAM");
+  const std::string* program = stringAt(*client, keys::kProgram);
   std::string text = program == nullptr || program->empty() ? "unknown program" : *program;
-  const auto uid = unsignedAt(*client, "SPACEKEEP_UID");
-  const std::string* unit = stringAt(*client, "SPACEKEEP_UNIT");
+  const auto uid = unsignedAt(*client, keys::kUid);
+  const std::string* unit = stringAt(*client, keys::kUnit);
   if (!uid && unit == nullptr) return text;
   text += " (";
   if (uid) text += fmt::format("user {}", *uid);

@@ -1,13 +1,16 @@
 #include "ctl/report/history_call.h"
 
+#include "history/history_keys.h"
+#include "operations/info_keys.h"
+
 namespace spacekeep::ctl {
 
 AskHistory historyOver(sdk::Client& client, sdk::Deadline deadline) {
   return [&client, deadline](const Dictionary& request) {
     sdk::HistoryRequest wanted;
-    wanted.before = unsignedAt(request, "SPACEKEEP_BEFORE");
-    wanted.limit = unsignedAt(request, "SPACEKEEP_LIMIT");
-    if (const std::string* volume = stringAt(request, "SPACEKEEP_VOLUME")) wanted.volume = *volume;
+    wanted.before = unsignedAt(request, keys::kBefore);
+    wanted.limit = unsignedAt(request, keys::kLimit);
+    if (const std::string* volume = stringAt(request, keys::kVolume)) wanted.volume = *volume;
     return client.history(wanted, deadline);
   };
 }

@@ -3,6 +3,8 @@
 #include <utility>
 
 #include "ctl/report/entry.h"
+#include "history/history_keys.h"
+#include "operations/info_keys.h"
 
 namespace spacekeep::ctl {
 namespace {
@@ -34,10 +36,10 @@ class Reader {
     if (!reply.outcome) {
       return stop(History::Access::kRefused, {ExitCode::kRefused, kNoRight});
     }
-    const Value* entries = reply.outcome->find("SPACEKEEP_ENTRIES");
+    const Value* entries = reply.outcome->find(keys::kEntries);
     const bool wanted =
         entries == nullptr || entries->array() == nullptr || take(*entries->array());
-    const auto next = unsignedAt(*reply.outcome, "SPACEKEEP_NEXT");
+    const auto next = unsignedAt(*reply.outcome, keys::kNext);
     if (!wanted || !next) return false;
     if (before_ && *next >= *before_) {
       return stop(History::Access::kFailed, {ExitCode::kFailed, kNoSense});
@@ -61,9 +63,9 @@ class Reader {
   }
 
   [[nodiscard]] Dictionary request() const {
-    Dictionary request{{"SPACEKEEP_LIMIT", kPageEntries}};
-    if (!wanted_.volume.empty()) request.set("SPACEKEEP_VOLUME", wanted_.volume);
-    if (before_) request.set("SPACEKEEP_BEFORE", *before_);
+    Dictionary request{{keys::kLimit, kPageEntries}};
+    if (!wanted_.volume.empty()) request.set(keys::kVolume, wanted_.volume);
+    if (before_) request.set(keys::kBefore, *before_);
     return request;
   }
 

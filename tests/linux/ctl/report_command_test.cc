@@ -22,17 +22,11 @@ using testing::IsEmpty;
 using testing::Not;
 using testing::StartsWith;
 
-constexpr const char* kItemized = "clientItemizedPurgeableSpace";
-constexpr const char* kPlain = "clientPurgeableSpace";
 constexpr const char* kHostile = "</script><script>alert(\"'&\")</script>\u202E";
 
 class ReportCommand : public ToolTest {
  protected:
-  ReportCommand() {
-    daemon_.on("clientGetState", [](const ipc::Arguments&, const ipc::Responder& responder) {
-      responder.reply({ipc::OptionalValue(Value(Dictionary{}))});
-    });
-  }
+  ReportCommand() { answerWithEmptyState(); }
   ~ReportCommand() override { daemon_.stop(); }
 
   void offer(const char* operation) {

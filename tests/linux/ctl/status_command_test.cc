@@ -16,16 +16,9 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
 
-constexpr const char* kItemized = "clientItemizedPurgeableSpace";
-constexpr const char* kPlain = "clientPurgeableSpace";
-
 class StatusCommand : public ToolTest {
  protected:
-  StatusCommand() {
-    daemon_.on("clientGetState", [](const ipc::Arguments&, const ipc::Responder& responder) {
-      responder.reply({ipc::OptionalValue(Value(Dictionary{}))});
-    });
-  }
+  StatusCommand() { answerWithEmptyState(); }
   ~StatusCommand() override { daemon_.stop(); }
 
   /// A MiB more at each urgency, from one service.

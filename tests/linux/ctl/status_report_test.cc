@@ -5,20 +5,10 @@
 #include <cstdint>
 #include <string>
 
+#include "tests/linux/ctl/volume_samples.h"
+
 namespace spacekeep::ctl {
 namespace {
-
-constexpr std::uint64_t kGiB = 1ULL << 30;
-constexpr std::uint64_t kMiB = 1ULL << 20;
-
-VolumeSample sampleOf(const std::string& volume, const VolumeSpace& space) {
-  const SpaceThresholds thresholds = spaceThresholds(space, LowSpaceSettings{});
-  return {.volume = volume,
-          .file_system = 1,
-          .space = space,
-          .thresholds = thresholds,
-          .level = spaceLevel(space, thresholds, SpaceLevel::kEnough)};
-}
 
 VolumeSample low() {
   return sampleOf("/data", {.size_bytes = 100 * kGiB,

@@ -42,6 +42,9 @@ inline Finished runShell(const std::string& command_line, const std::string& err
   return run;
 }
 
+inline constexpr const char* kItemized = "clientItemizedPurgeableSpace";
+inline constexpr const char* kPlain = "clientPurgeableSpace";
+
 inline std::string toolPath() { return std::string(SPACEKEEP_BUILD_DIR) + "/ctl/spacekeepctl"; }
 
 class ToolTest : public testing::Test {
@@ -66,6 +69,12 @@ class ToolTest : public testing::Test {
     return runShell("LANG=C.UTF-8 LC_ALL= TERM=xterm script -fqec \"" + inner + "\" " +
                         terminalFile() + " </dev/null",
                     errFile());
+  }
+  /// The daemon's settings are as after its first start.
+  void answerWithEmptyState() {
+    daemon_.on("clientGetState", [](const ipc::Arguments&, const ipc::Responder& responder) {
+      responder.reply({ipc::OptionalValue(Value(Dictionary{}))});
+    });
   }
   /// What stood on the terminal so far.
   [[nodiscard]] std::string onTerminalSoFar() const { return contentOf(terminalFile()); }

@@ -10,6 +10,7 @@
 #include <concepts>
 #include <cstdint>
 #include <initializer_list>
+#include <limits>
 #include <span>
 #include <string>
 #include <string_view>
@@ -113,8 +114,10 @@ constexpr bool fits(std::string_view placeholder) {
   if (placeholder == "%@") return true;
   if (placeholder == "%s") return kIsText<T>;
   if (placeholder == "%f") return std::is_floating_point_v<T>;
-  if (!std::is_integral_v<T>) return false;
-  return placeholder.size() == 4 || sizeof(T) <= 4;
+  if constexpr (std::is_integral_v<T>) {
+    return placeholder.size() == 4 || std::numeric_limits<T>::digits <= 32;
+  }
+  return false;
 }
 
 /// A format that was checked against the types of its arguments when it was compiled.

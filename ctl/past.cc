@@ -5,7 +5,7 @@
 #include <algorithm>
 
 #include "ctl/daemon_link.h"
-#include "ctl/report/history_call.h"
+#include "ctl/history/pages.h"
 #include "ctl/size_text.h"
 #include "ctl/text_layout.h"
 #include "history/entry.h"

@@ -9,7 +9,7 @@
 
 #include "ctl/complaint.h"
 #include "ctl/explanation.h"
-#include "ctl/history_table.h"
+#include "ctl/history/table.h"
 #include "ctl/style.h"
 #include "ctl/volume_report.h"
 

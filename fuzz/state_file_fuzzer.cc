@@ -3,87 +3,45 @@
 // away, and what the suite then takes it keeps.
 #include <cstddef>
 #include <cstdint>
-#include <filesystem>
 #include <memory>
 #include <string>
 #include <string_view>
 
+#include "fuzz/helpers/database_files.h"
 #include "fuzz/helpers/piece_reader.h"
 #include "fuzz/helpers/promises.h"
-#include "fuzz/helpers/state_templates.h"
 #include "support/preferences/linux/sqlite_suite.h"
 #include "tests/helpers/temporary_directory.h"
 
 namespace spacekeep::fuzz {
 namespace {
 
-constexpr const char* kFile = "fuzz.sqlite";
+constexpr const char* kName = "fuzz";
 // Small files are opened and written sooner; to what is in them the bound makes no difference.
 const SqliteSuiteOptions kOptions{.max_pages = 20};
-constexpr std::size_t kMostFileBytes = 256 * 1024;
 
-const StateTemplates& templates() {
-  static const StateTemplates all = makeStateTemplates();
+/// At rest "fuzz.old" is there, being changed in the middle of a change; "fuzz.logged" is in the log.
+const DatabaseTemplates& templates() {
+  static const DatabaseTemplates all = makeTemplates(
+      {.name = kName,
+       .make =
+           [](const std::string& directory) {
+             const auto suite = SqliteSuite::open(directory, kName, kOptions);
+             require(suite != nullptr, "a suite can be made");
+             suite->set("fuzz.old", Value("old value"));
+             require(!suite->synchronize(), "a suite can be written");
+           },
+       .interrupted = "PRAGMA journal_mode = PERSIST; BEGIN; UPDATE preferences SET value = x'00';"
+                      "CREATE TABLE other (a)",
+       .logged = "PRAGMA journal_mode = WAL; INSERT INTO preferences"
+                 " SELECT 'fuzz.logged', value FROM preferences"});
   return all;
-}
-
-void put(std::string& file, std::size_t at, std::string_view piece) {
-  if (at + piece.size() > kMostFileBytes) return;
-  if (file.size() < at + piece.size()) file.resize(at + piece.size(), '\0');
-  file.replace(at, piece.size(), piece);
-}
-
-/// One change: which file, what to do, where (256 pages of 4096 bytes), and with what.
-void damage(StateFiles& files, PieceReader& input) {
-  const std::uint8_t choice = input.byte();
-  std::string& file = choice % 4 < 2 ? files.database : choice % 4 == 2 ? files.journal : files.log;
-  const std::size_t at = input.byte() % 64 * std::size_t{4096} + input.number() % 4096;
-  switch (choice / 4 % 4) {
-    case 0:
-    case 1:
-      return put(file, at, input.shortPiece());
-    case 2:
-      if (at < file.size()) file.resize(at);
-      return;
-    default:
-      return put(file, file.size(), input.piece());
-  }
-}
-
-StateFiles filesOf(std::string_view text) {
-  PieceReader input(text);
-  StateFiles files;
-  switch (input.byte() % 4) {
-    case 0:
-      files.database = std::string(input.rest());
-      return files;
-    case 1:
-      files = templates().at_rest;
-      break;
-    case 2:
-      files = templates().interrupted;
-      break;
-    default:
-      files = templates().logged;
-      break;
-  }
-  for (int changes = 0; changes < 32 && !input.usedUp(); ++changes) damage(files, input);
-  return files;
-}
-
-/// The file that was set aside, empty when none was.
-std::string setAside(const std::string& directory) {
-  for (const auto& entry : std::filesystem::directory_iterator(directory)) {
-    const std::string name = entry.path().filename().string();
-    if (name.starts_with("fuzz.corrupt-") && !name.ends_with("-journal")) return entry.path();
-  }
-  return "";
 }
 
 bool takesAndKeeps(const std::string& directory, SqliteSuite& suite) {
   suite.set("fuzz.key", Value("fuzz value"));
   if (suite.synchronize()) return false;
-  const auto again = SqliteSuite::open(directory, kStateName, kOptions);
+  const auto again = SqliteSuite::open(directory, kName, kOptions);
   require(again != nullptr, "a suite that was written can be opened");
   require(!again->refresh(), "a suite that was written can be read");
   const Value* kept = again->find("fuzz.key");
@@ -103,21 +61,12 @@ void requireUndamaged(const SqliteSuite* suite, std::string_view input) {
 }
 
 void examine(std::string_view input) {
-  const StateFiles files = filesOf(input);
-  const bool is_alone = files.journal.empty() && files.log.empty();
+  const DatabaseFiles files = filesOf(input, templates());
   const test::TemporaryDirectory directory;
-  const std::string path = directory.write(kFile, files.database);
-  if (!files.journal.empty()) directory.write("fuzz.sqlite-journal", files.journal);
-  if (!files.log.empty()) directory.write("fuzz.sqlite-wal", files.log);
-  const auto suite = SqliteSuite::open(directory.path(), kStateName, kOptions);
-  const std::string aside = setAside(directory.path());
-  if (!aside.empty()) {
-    require(!is_alone || test::contentOf(aside) == files.database,
-            "what is set aside is set aside as it was");
-    require(suite != nullptr, "in the place of a damaged file a fresh one is begun");
-  } else if (suite == nullptr && is_alone) {
-    require(test::contentOf(path) == files.database, "a file that cannot be opened is left alone");
-  }
+  const std::string path = layOut(directory.path(), kName, files);
+  const auto suite = SqliteSuite::open(directory.path(), kName, kOptions);
+  const std::string aside = setAside(directory.path(), kName);
+  requireNothingLost(files, path, aside, suite != nullptr);
   requireUndamaged(suite.get(), input);
   if (suite == nullptr) return;
   require(!suite->refresh() || aside.empty(), "a fresh suite can be read");

@@ -8,9 +8,9 @@
 
 #include "ctl/commands.h"
 #include "ctl/daemon_link.h"
+#include "ctl/history/pages.h"
 #include "ctl/json_text.h"
 #include "ctl/local_volumes.h"
-#include "ctl/report/history_call.h"
 #include "ctl/report/html_page.h"
 #include "ctl/report/page_file.h"
 #include "ctl/report/report_data.h"

@@ -7,7 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "ctl/report/history_pages.h"
+#include "ctl/report/whole_history.h"
 #include "ctl/status_report.h"
 
 namespace spacekeep::ctl {

@@ -10,6 +10,7 @@
 
 #include "services/cachedir/engine/beneath.h"
 #include "support/values/plist.h"
+#include "support/values/text.h"
 
 namespace spacekeep::cachedir {
 namespace {
@@ -34,7 +35,9 @@ class Reader {
  private:
   bool fail(const std::string& where, const std::string& what, const std::string& advice) {
     if (error_.text.empty()) {
-      error_.text = file_ + ": " + (where.empty() ? "" : where + ": ") + what + "; " + advice;
+      // What the file says goes into it, whatever that is.
+      error_.text =
+          lineOf(file_ + ": " + (where.empty() ? "" : where + ": ") + what + "; " + advice);
     }
     return false;
   }

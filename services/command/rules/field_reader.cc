@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "services/command/rules/rule.h"
+#include "support/values/text.h"
 
 namespace spacekeep::command {
 
@@ -12,7 +13,7 @@ void FieldReader::fail(const std::string& where, const std::string& what,
 }
 
 void FieldReader::failWith(const std::string& text) {
-  if (error_.empty()) error_ = text;
+  if (error_.empty()) error_ = lineOf(text);
 }
 
 void FieldReader::onlyKnown(const Dictionary& from, std::span<const std::string_view> known,
@@ -88,7 +89,7 @@ std::string FieldReader::path(const std::string& written, const std::string& whe
     return "";
   }
   const std::string framed = *filled + "/";
-  if (filled->front() != '/' || framed.find("//") != std::string::npos ||
+  if (!filled->starts_with('/') || framed.find("//") != std::string::npos ||
       framed.find("/../") != std::string::npos || framed.find("/./") != std::string::npos) {
     fail(where, "\"" + written + "\" is not an absolute path without \".\" and \"..\"",
          "begin it with a slash, ~/ or $XDG_CACHE_HOME/");

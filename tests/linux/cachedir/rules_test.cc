@@ -87,6 +87,7 @@ TEST(Rules, EachMistakeInADirectoryIsNamedWithItsPlace) {
       {"PATH", 5, "DIRECTORIES[0] PATH: missing, or not a string"},
       {"PATH", "", "is not an absolute path"},
       {"PATH", "cache", "\"cache\" is not an absolute path"},
+      {"PATH", "a\nb\x1b", "\"a\\nb\\x1b\" is not an absolute path"},
       {"PATH", "/data/../etc", "holds an empty, \".\" or \"..\" component"},
       {"PATH", "/data//cache", "holds an empty"},
       {"PATH", "/data/.", "holds an empty"},

@@ -83,6 +83,16 @@ const std::map<std::string, std::string> kBadContents = {
          kClean,
      "FILE: NOT_WHILE[0] PROCESS: \"a/b\" holds a slash; give the executable's name without its "
      "directory"},
+    {"<key>NOT_WHILE</key><array><dict><key>OPEN</key><string/></dict></array>" + kClean,
+     "FILE: NOT_WHILE[0] OPEN: not a string, or empty; give a text, or leave the key out"},
+    {"<key>DIRECTORIES</key><array><dict><key>PATH</key><string/></dict></array>",
+     "FILE: DIRECTORIES[0] PATH: \"\" is not an absolute path without \".\" and \"..\"; begin it "
+     "with a slash, ~/ or $XDG_CACHE_HOME/"},
+    {"<key>NOT_WHILE</key><array><dict><key>PROCESS</key><string>/a\nb&#127;</string></dict>"
+     "</array>" +
+         kClean,
+     "FILE: NOT_WHILE[0] PROCESS: \"/a\\nb\\x7f\" holds a slash; give the executable's name "
+     "without its directory"},
     {"<key>NOT_WHILE</key><array><dict/></array>" + kClean,
      "FILE: NOT_WHILE[0]: not exactly one key; make one dictionary of each"},
     {"<key>OWNERS_LOCKS</key><array><dict><key>FLOCK</key><string>/a/l</string></dict></array>" +

@@ -6,7 +6,7 @@
 #include <utility>
 #include <vector>
 
-#include "ctl/history_table.h"
+#include "ctl/history/table.h"
 
 namespace spacekeep::ctl {
 namespace {

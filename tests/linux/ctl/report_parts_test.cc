@@ -8,10 +8,10 @@
 
 #include "ctl/json_parse.h"
 #include "ctl/report/entry.h"
-#include "ctl/report/history_pages.h"
 #include "ctl/report/html_page.h"
 #include "ctl/report/report_data.h"
 #include "ctl/report/since.h"
+#include "ctl/report/whole_history.h"
 
 namespace spacekeep::ctl {
 namespace {

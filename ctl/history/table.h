@@ -6,7 +6,7 @@
 #include <functional>
 #include <string>
 
-#include "ctl/history_entries.h"
+#include "ctl/history/entries.h"
 #include "ctl/style.h"
 
 namespace spacekeep::ctl {

@@ -1,4 +1,4 @@
-#include "ctl/history_table.h"
+#include "ctl/history/table.h"
 
 #include <fmt/core.h>
 

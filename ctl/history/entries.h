@@ -11,7 +11,7 @@
 #include <utility>
 #include <vector>
 
-#include "ctl/report/history_pages.h"
+#include "ctl/history/pages.h"
 #include "support/values/value.h"
 
 namespace spacekeep::ctl {
@@ -58,7 +58,7 @@ struct HistoryList {
   bool refused = false;               ///< the user has not the right; then there is nothing
 };
 
-/// Reads as many pages as the filter takes.
+/// Reads as many pages as the filter takes; of a daemon whose pages do not get older what there is.
 [[nodiscard]] sdk::Result<HistoryList> newestEntries(const HistoryFilter& filter,
                                                      const AskHistory& ask);
 

@@ -1,4 +1,4 @@
-#include "ctl/history_entries.h"
+#include "ctl/history/entries.h"
 
 #include <fmt/core.h>
 #include <pwd.h>
@@ -10,8 +10,6 @@
 
 namespace spacekeep::ctl {
 namespace {
-
-constexpr std::uint64_t kMostOfOnePage = 1000;
 
 std::string textAt(const Dictionary& entry, const char* key) {
   const std::string* text = stringAt(entry, key);
@@ -50,24 +48,8 @@ std::vector<std::string> silentOf(const Dictionary& entry) {
   return silent;
 }
 
-bool fits(const HistoryEntry& entry, const HistoryFilter& filter) {
-  const auto& since_ns = filter.wanted.since_ns;
-  return !since_ns || (entry.ended && entry.ended->unix_ns >= *since_ns);
-}
-
-/// Answers whether more is wanted.
-bool takePage(const Dictionary& page, const HistoryFilter& filter, HistoryList& list) {
-  const Value* entries = page.find(keys::kEntries);
-  if (entries == nullptr || entries->array() == nullptr) return false;
-  for (const Value& value : *entries->array()) {
-    if (value.dictionary() == nullptr) continue;
-    HistoryEntry entry = historyEntryOf(*value.dictionary());
-    if (!fits(entry, filter)) continue;
-    list.older = list.entries.size() == filter.limit;
-    if (list.older) return false;
-    list.entries.push_back(std::move(entry));
-  }
-  return true;
+bool isTooOld(const HistoryEntry& entry, const std::optional<std::int64_t>& since_ns) {
+  return since_ns && !(entry.ended && entry.ended->unix_ns >= *since_ns);
 }
 
 }  // namespace
@@ -97,23 +79,19 @@ HistoryEntry historyEntryOf(const Dictionary& entry) {
 
 sdk::Result<HistoryList> newestEntries(const HistoryFilter& filter, const AskHistory& ask) {
   HistoryList list;
-  Dictionary request;
-  if (!filter.wanted.volume.empty()) request.set(keys::kVolume, filter.wanted.volume);
   // With one more than is wanted it shows whether there are older ones.
-  if (!filter.wanted.since_ns) {
-    request.set(keys::kLimit, std::min<std::uint64_t>(filter.limit + 1, kMostOfOnePage));
-  }
-  while (true) {
-    const sdk::Reply reply = ask(request);
-    if (reply.error) return *reply.error;
-    list.refused = !reply.outcome;
-    if (!reply.outcome || !takePage(*reply.outcome, filter, list)) return list;
-    const auto next = unsignedAt(*reply.outcome, keys::kNext);
-    const auto before = unsignedAt(request, keys::kBefore);
-    // Numbers fall from page to page; a daemon that does otherwise is not asked for ever.
-    if (!next || (before && *next >= *before)) return list;
-    request.set(keys::kBefore, *next);
-  }
+  const std::uint64_t page_entries = filter.wanted.since_ns ? kMostOfOnePage : filter.limit + 1;
+  auto end =
+      forEachEntry(filter.wanted.volume, page_entries, ask, [&](const Dictionary& dictionary) {
+        HistoryEntry entry = historyEntryOf(dictionary);
+        if (isTooOld(entry, filter.wanted.since_ns)) return true;
+        list.older = list.entries.size() == filter.limit;
+        if (!list.older) list.entries.push_back(std::move(entry));
+        return !list.older;
+      });
+  if (!end) return end.error();
+  list.refused = *end == PagesEnd::kRefused;
+  return list;
 }
 
 std::string userName(std::uint64_t uid) {

@@ -1,25 +1,16 @@
 // Thread safety: for one thread.
 //
-// The daemon's history as a whole, page by page.
+// The daemon's history as a whole, for the page.
 #pragma once
 
-#include <spacekeep/client.h>
-
 #include <cstddef>
-#include <cstdint>
-#include <functional>
 #include <optional>
-#include <string>
 
+#include "ctl/history/pages.h"
 #include "ctl/survey.h"
 #include "support/values/value.h"
 
 namespace spacekeep::ctl {
-
-struct WantedHistory {
-  std::string volume;                    ///< empty: all
-  std::optional<std::int64_t> since_ns;  ///< wall clock; entries that ended earlier are left out
-};
 
 struct History {
   enum class Access {
@@ -36,8 +27,6 @@ struct History {
 
 /// More than a daemon keeps. What is beyond would make the page slow.
 inline constexpr std::size_t kMostEntries = 20'000;
-
-using AskHistory = std::function<sdk::Reply(const Dictionary& request)>;
 
 /// Asks for page after page until the daemon says that there is no older one. A daemon whose pages
 /// do not get older is a failure, not a loop without end.

@@ -3,8 +3,8 @@
 
 #include "ctl/commands.h"
 #include "ctl/daemon_link.h"
-#include "ctl/history_table.h"
-#include "ctl/report/history_call.h"
+#include "ctl/history/pages.h"
+#include "ctl/history/table.h"
 #include "ctl/volume_space.h"
 
 namespace spacekeep::ctl {

@@ -1,7 +1,7 @@
 // The history as one object for programs.
 #include <utility>
 
-#include "ctl/history_table.h"
+#include "ctl/history/table.h"
 #include "ctl/json_text.h"
 
 namespace spacekeep::ctl {

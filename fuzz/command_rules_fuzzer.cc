@@ -20,14 +20,40 @@ namespace {
 
 using fuzz::require;
 
-const std::vector<std::string> kWords{
-    "SPACEKEEP_ID",   "SPACEKEEP_SERVICES", "ENABLED",      "TAKES",        "NOT_WHILE",
-    "IDLE_PROCESSES", "OWNERS_LOCKS",       "DIRECTORIES",  "MEASURE",      "CLEAN",
-    "PATH",           "UNUSED_DAYS",        "KEEP",         "COMMAND",      "TIMEOUT_SECONDS",
-    "AMOUNT",         "FILES",              "AFTER",        "COLUMN",       "PATHS",
-    "PROCESS",        "LOCKED",             "WHOLE_DIRECTORIES", "OPEN",    "FLOCK",
-    "1",              "2",                  "3",            "4",            "~/x",
-    "/a/b",           "$XDG_CACHE_HOME/*",  "{AMOUNT}",     "com.example.one"};
+const std::vector<std::string> kWords{"SPACEKEEP_ID",
+                                      "SPACEKEEP_SERVICES",
+                                      "ENABLED",
+                                      "TAKES",
+                                      "NOT_WHILE",
+                                      "IDLE_PROCESSES",
+                                      "OWNERS_LOCKS",
+                                      "DIRECTORIES",
+                                      "MEASURE",
+                                      "CLEAN",
+                                      "PATH",
+                                      "UNUSED_DAYS",
+                                      "KEEP",
+                                      "COMMAND",
+                                      "TIMEOUT_SECONDS",
+                                      "AMOUNT",
+                                      "FILES",
+                                      "AFTER",
+                                      "COLUMN",
+                                      "PATHS",
+                                      "PROCESS",
+                                      "LOCKED",
+                                      "WHOLE_DIRECTORIES",
+                                      "OPEN",
+                                      "FLOCK",
+                                      "1",
+                                      "2",
+                                      "3",
+                                      "4",
+                                      "~/x",
+                                      "/a/b",
+                                      "$XDG_CACHE_HOME/*",
+                                      "{AMOUNT}",
+                                      "com.example.one"};
 const std::array<std::string, 4> kNames{"vendor/a.plist", "admin/a.plist", "vendor/b.plist",
                                         "admin/c.plist"};
 
@@ -109,8 +135,9 @@ void examineFiles(fuzz::PieceReader& input) {
     const std::string& name = kNames.at(input.byte() % kNames.size());
     directory.write(name, fuzz::fileContent(input, kWords));
   }
-  const RulesWanted wanted{
-      .files = {}, .folders = {directory.path() + "/vendor", directory.path() + "/admin"}, .only = {}};
+  const RulesWanted wanted{.files = {},
+                           .folders = {directory.path() + "/vendor", directory.path() + "/admin"},
+                           .only = {}};
   const auto read = readRules(wanted, folders);
   directory.clear();
   if (const auto* error = std::get_if<cachedir::RuleError>(&read)) {
@@ -121,11 +148,11 @@ void examineFiles(fuzz::PieceReader& input) {
 
 void examineOutput(fuzz::PieceReader& input) {
   const std::uint8_t choice = input.byte();
-  const AmountInOutput how{.kind = choice % 2 == 0 ? AmountInOutput::Kind::kAfter
-                                                   : AmountInOutput::Kind::kColumn,
-                           .after = "freed ",
-                           .column = choice / 2 % 4 + std::size_t{1},
-                           .base = choice % 16 < 8 ? std::uint64_t{1000} : std::uint64_t{1024}};
+  const AmountInOutput how{
+      .kind = choice % 2 == 0 ? AmountInOutput::Kind::kAfter : AmountInOutput::Kind::kColumn,
+      .after = "freed ",
+      .column = choice / 2 % 4 + std::size_t{1},
+      .base = choice % 16 < 8 ? std::uint64_t{1000} : std::uint64_t{1024}};
   const std::string output(input.rest());
   const auto once = amountIn(output, how);
   const auto twice = amountIn(output + "\n" + output, how);

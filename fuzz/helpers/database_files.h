@@ -28,10 +28,10 @@ struct DatabaseTemplates {
 
 /// How templates are made.
 struct DatabaseChanges {
-  std::string name;                                       ///< of the file, without ".sqlite"
+  std::string name;                                        ///< of the file, without ".sqlite"
   std::function<void(const std::string& directory)> make;  ///< the file at rest
-  const char* interrupted;                                ///< SQL that begins a change
-  const char* logged;                                     ///< SQL that makes one
+  const char* interrupted;                                 ///< SQL that begins a change
+  const char* logged;                                      ///< SQL that makes one
 };
 [[nodiscard]] DatabaseTemplates makeTemplates(const DatabaseChanges& changes);
 

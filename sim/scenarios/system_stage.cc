@@ -52,6 +52,7 @@ void SystemStage::takeDown() {
   Spacekeep::resetSharedSpacekeep();
   world_.events().unpark();
   if (daemon_.joinable()) daemon_.join();
+  if (rt::clearingAway()) rt::letKeepersGo();
 }
 
 void SystemStage::setUpDisk() {

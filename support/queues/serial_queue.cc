@@ -134,6 +134,14 @@ std::size_t SerialQueue::depth() const {
   return items_.size();
 }
 
+void SerialQueue::letGo() {
+  const std::shared_ptr<SerialQueue> self =
+      weak_from_this().lock();  // A task may hold the last one.
+  std::deque<Item> items;
+  const Lock lock(mutex_);
+  items.swap(items_);
+}
+
 /// Gives the free turn to the first item, if there is one and nothing stands against it.
 void SerialQueue::startNext() {
   if (running_ || suspensions_ > 0 || items_.empty()) return;

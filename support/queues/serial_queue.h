@@ -16,7 +16,7 @@
 
 namespace spacekeep {
 
-class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
+class SerialQueue final : public std::enable_shared_from_this<SerialQueue>, private rt::Keeper {
  public:
   [[nodiscard]] static std::shared_ptr<SerialQueue> create(std::string label,
                                                            ConcurrentQueue& global);
@@ -65,6 +65,7 @@ class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
   };
   using Lock = std::unique_lock<rt::Mutex>;
 
+  void letGo() override;  // drops its tasks: they may hold who owns this queue
   void startNext();
   void passTurn();
   void drain();

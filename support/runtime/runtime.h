@@ -100,6 +100,20 @@ void sleepNs(std::uint64_t duration_ns);
 enum class ThreadSlot { kCurrentQueue, kCurrentConnection, kPoolWorker, kBorrowedThread, kCount };
 [[nodiscard]] void*& threadSlot(ThreadSlot slot);
 
+/// Something that may keep alive what keeps it alive. Of a simulated schedule that was cut off
+/// nothing goes on that would end this, so whoever clears it away has each that is left let go
+/// (letKeepersGo()). A process on real threads that is cut off is gone, and nothing is called.
+class Keeper {
+ public:
+  Keeper(const Keeper&) = delete;
+  Keeper& operator=(const Keeper&) = delete;
+  virtual void letGo() = 0;
+
+ protected:
+  Keeper();
+  ~Keeper();
+};
+
 /// Ends the process after writing `reason` to standard error. For broken invariants of the program
 /// itself, never for bad input.
 [[noreturn]] void panic(const char* reason);

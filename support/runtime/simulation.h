@@ -58,6 +58,10 @@ ScheduleReport runSchedule(const ScheduleOptions& options, const std::function<v
 /// True while what is left of a schedule is unwound: what happens now is no part of the run.
 [[nodiscard]] bool clearingAway();
 
+/// In a schedule that is cleared away: every Keeper made in it lets go. To be called when nothing
+/// of the run needs them any more.
+void letKeepersGo();
+
 /// Moves the wall clock without moving the monotonic counter.
 void jumpWallClockNs(std::int64_t by_ns);
 

@@ -68,6 +68,12 @@ class Scheduler {
   /// Gives the running fiber up as it stands. Its stack is never touched again.
   [[noreturn]] void giveUpRunning();
 
+  // What outlives its fibers (unwinding.cc).
+  void remember(Keeper& keeper) { keepers_.push_back(&keeper); }
+  void forget(const Keeper& keeper) { std::erase(keepers_, &keeper); }
+  /// Null when there is none.
+  [[nodiscard]] Keeper* takeKeeper();
+
   // Time and numbers.
   [[nodiscard]] std::uint64_t now() const { return now_ticks_; }
   [[nodiscard]] std::int64_t wallClockNs() const;
@@ -135,6 +141,7 @@ class Scheduler {
   bool unwinding_ = false;
   std::uint64_t unwinding_steps_ = 0;
   std::vector<std::string> given_up_;
+  std::vector<Keeper*> keepers_;
 };
 
 /// `name#id`, the way reports and messages call a fiber.

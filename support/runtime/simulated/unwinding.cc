@@ -107,6 +107,13 @@ void Scheduler::giveUp(Fiber& fiber) {
   alive_.erase(fiber.id);
 }
 
+Keeper* Scheduler::takeKeeper() {
+  if (keepers_.empty()) return nullptr;
+  Keeper* const last = keepers_.back();
+  keepers_.pop_back();
+  return last;
+}
+
 void Scheduler::giveUpRunning() {
   Fiber& fiber = *running_;
   giveUp(fiber);
@@ -115,3 +122,21 @@ void Scheduler::giveUpRunning() {
 }
 
 }  // namespace spacekeep::rt::simulated
+
+namespace spacekeep::rt {
+
+Keeper::Keeper() {
+  if (insideSchedule()) simulated::Scheduler::current()->remember(*this);
+}
+
+Keeper::~Keeper() {
+  if (insideSchedule()) simulated::Scheduler::current()->forget(*this);
+}
+
+void letKeepersGo() {
+  while (Keeper* const keeper = simulated::Scheduler::current()->takeKeeper()) {
+    keeper->letGo();
+  }
+}
+
+}  // namespace spacekeep::rt

@@ -27,6 +27,10 @@ std::uint64_t randomNumber() {
   return generator.next();
 }
 
+Keeper::Keeper() = default;
+
+Keeper::~Keeper() = default;
+
 void*& threadSlot(ThreadSlot slot) {
   thread_local std::array<void*, static_cast<std::size_t>(ThreadSlot::kCount)> slots{};
   return slots.at(static_cast<std::size_t>(slot));

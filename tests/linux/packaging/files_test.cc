@@ -79,14 +79,24 @@ TEST_F(InstalledFiles, NothingIsInstalledIntoEtc) {
   for (const std::string& file : files_) EXPECT_FALSE(file.starts_with("etc/")) << file;
 }
 
+// What is linked with a library that has a sanitizer in it has to bring that along.
+#if defined(__SANITIZE_ADDRESS__)
+constexpr const char* kSanitizers = "-fsanitize=address,undefined";
+#elif defined(__SANITIZE_THREAD__)
+constexpr const char* kSanitizers = "-fsanitize=thread";
+#else
+constexpr const char* kSanitizers = "";
+#endif
+
 TEST_F(InstalledFiles, AClientAndAServiceAreBuiltFromThemByCMakeAndByPkgConfig) {
   const std::string root = workshop_.path().string();
   const std::string examples = (kSource / "sdk/examples").string();
-  const Finished by_pkg_config = run(
-      "cd " + root + " && export PKG_CONFIG_PATH=" + root + "/usr/lib/pkgconfig && c++ " +
-      examples + "/make_room.cc -o by-pkg-config $(pkg-config --define-variable=prefix=" + root +
-      "/usr --define-variable=includedir=" + root +
-      "/usr/include --define-variable=libdir=" + root + "/usr/lib --cflags --libs spacekeep)");
+  const Finished by_pkg_config =
+      run("cd " + root + " && export PKG_CONFIG_PATH=" + root + "/usr/lib/pkgconfig && c++ " +
+          kSanitizers + " " + examples +
+          "/make_room.cc -o by-pkg-config $(pkg-config --define-variable=prefix=" + root +
+          "/usr --define-variable=includedir=" + root +
+          "/usr/include --define-variable=libdir=" + root + "/usr/lib --cflags --libs spacekeep)");
   EXPECT_EQ(by_pkg_config.exit_code, 0) << by_pkg_config.out;
   const Finished tried = run(root + "/by-pkg-config; test $? = 1");
   EXPECT_EQ(tried.exit_code, 0) << tried.out;  // it has no volume /data, or no daemon, and says so
@@ -97,8 +107,8 @@ TEST_F(InstalledFiles, AClientAndAServiceAreBuiltFromThemByCMakeAndByPkgConfig) 
       << "find_package(spacekeep 0.1 REQUIRED)\nadd_executable(service " << examples
       << "/thumbnail_cache.cc)\ntarget_link_libraries(service PRIVATE spacekeep::spacekeep)\n";
   const Finished by_cmake =
-      run("cd " + root + "/project && cmake -B build -DCMAKE_PREFIX_PATH=" + root +
-          "/usr . && cmake --build build");
+      run("cd " + root + "/project && export CXXFLAGS=" + kSanitizers +
+          " && cmake -B build -DCMAKE_PREFIX_PATH=" + root + "/usr . && cmake --build build");
   EXPECT_EQ(by_cmake.exit_code, 0) << by_cmake.out;
   EXPECT_TRUE(fs::exists(workshop_.path() / "project/build/service"));
 }

@@ -282,5 +282,47 @@ TEST(LeftOvers, AJoinableThreadInTheWayIsNoPanic) {
   EXPECT_EQ(report.blocked.size(), 2U);
 }
 
+/// As whoever owns a simulated world does.
+struct ClearingAway {
+  ~ClearingAway() {
+    if (rt::clearingAway()) rt::letKeepersGo();
+  }
+};
+
+struct Owner {
+  explicit Owner(int& alive) : witness(alive) {}
+  Witness witness;
+  std::shared_ptr<SerialQueue> queue;
+};
+
+TEST(Keepers, AQueueOfACutOffScheduleLetsGoOfTasksThatHoldItsOwner) {
+  int alive = 0;
+  int alive_in_the_end = 0;
+  const auto report = rt::runSchedule({}, [&] {
+    ConcurrentQueue global({.name = "global", .parallelism = 2});
+    const ClearingAway clearing_away;
+    const auto owner = std::make_shared<Owner>(alive);
+    owner->queue = SerialQueue::create("queue", global);
+    owner->queue->async([] { waitForever(); });
+    owner->queue->async([owner] { owner->queue = nullptr; });
+    alive_in_the_end = alive;
+    waitForever();
+  });
+  EXPECT_EQ(report.end, rt::ScheduleEnd::kDeadlock);
+  EXPECT_EQ(alive_in_the_end, 1);
+  EXPECT_EQ(alive, 0);
+}
+
+TEST(Keepers, KeepWhatTheyHaveInAScheduleThatComesToItsEnd) {
+  bool ran = false;
+  const auto report = rt::runSchedule({}, [&ran] {
+    const ClearingAway clearing_away;
+    ConcurrentQueue global({.name = "global", .parallelism = 2});
+    SerialQueue::create("queue", global)->async([&ran] { ran = true; });
+  });
+  EXPECT_EQ(report.end, rt::ScheduleEnd::kFinished);
+  EXPECT_TRUE(ran);
+}
+
 }  // namespace
 }  // namespace spacekeep

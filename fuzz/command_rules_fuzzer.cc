@@ -60,11 +60,11 @@ const std::array<std::string, 4> kNames{"vendor/a.plist", "admin/a.plist", "vend
 const UserFolders& userFolders() {
   static const UserFolders folders{.uid = 1000,
                                    .name = "user",
-                                   .home = "/home/user",
-                                   .cache = "/home/user/.cache",
-                                   .data = "/home/user/.local/share",
-                                   .config = "/home/user/.config",
-                                   .state = "/home/user/.local/state",
+                                   .home = "/srv/user",
+                                   .cache = "/srv/user/.cache",
+                                   .data = "/srv/user/.local/share",
+                                   .config = "/srv/user/.config",
+                                   .state = "/srv/user/.local/state",
                                    .runtime = "",
                                    .problems = {}};
   return folders;

@@ -31,10 +31,10 @@ class PrivateBus {
         "<busconfig><type>system</type><listen>unix:path=" + socket +
             "</listen><policy context=\"default\"><allow send_destination=\"*\"/><allow own=\"*\"/>"
             "<allow receive_sender=\"*\"/><allow user=\"*\"/></policy></busconfig>");
+    const std::string option = "--config-file=" + config;
     pid_ = ::fork();
     if (pid_ == 0) {
-      ::execlp("dbus-daemon", "dbus-daemon", "--nofork", "--nopidfile",
-               ("--config-file=" + config).c_str(), nullptr);
+      ::execlp("dbus-daemon", "dbus-daemon", "--nofork", "--nopidfile", option.c_str(), nullptr);
       ::_exit(127);
     }
     EXPECT_TRUE(comesTrue([this] { return listens(); }));

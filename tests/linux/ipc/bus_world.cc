@@ -35,13 +35,23 @@ std::string contentOf(const std::string& path) {
   return text.str();
 }
 
-void exec(std::vector<std::string> command) {
-  std::vector<char*> arguments;
-  for (std::string& word : command) arguments.push_back(word.data());
-  arguments.push_back(nullptr);
-  ::execvp(arguments[0], arguments.data());
-  ::_exit(127);
-}
+/// A command made ready before the fork: in the child of a process with threads nothing may be
+/// allocated.
+class Command {
+ public:
+  explicit Command(std::vector<std::string> words) : words_(std::move(words)) {
+    for (std::string& word : words_) arguments_.push_back(word.data());
+    arguments_.push_back(nullptr);
+  }
+  [[noreturn]] void become() const {
+    ::execvp(arguments_[0], arguments_.data());
+    ::_exit(127);
+  }
+
+ private:
+  std::vector<std::string> words_;
+  std::vector<char*> arguments_;
+};
 
 }  // namespace
 
@@ -61,13 +71,14 @@ void PrivateBus::start(const std::string& policy) {
       directory_.write("bus.conf", "<busconfig><type>system</type><listen>unix:path=" + socket_ +
                                        "</listen><auth>EXTERNAL</auth>" + std::string(kUsualRules) +
                                        policy + "</busconfig>");
+  const Command broker({"dbus-daemon", "--nofork", "--nopidfile", "--nosyslog", "--print-address=3",
+                        "--config-file=" + config});
   int ready[2] = {-1, -1};
   ASSERT_EQ(::pipe2(ready, O_CLOEXEC), 0);
   pid_ = ::fork();
   if (pid_ == 0) {
     ::dup2(ready[1], 3);
-    exec({"dbus-daemon", "--nofork", "--nopidfile", "--nosyslog", "--print-address=3",
-          "--config-file=" + config});
+    broker.become();
   }
   ::close(ready[1]);
   // It tells its address once it listens, and closes the pipe when it fails.
@@ -149,12 +160,13 @@ ProgramOutput runAs(uid_t uid, gid_t gid, const std::string& groups,
   whole.insert(whole.end(), command.begin(), command.end());
   const spacekeep::test::TemporaryDirectory directory;
   const std::string path = directory / "output";
+  const Command ready(std::move(whole));
   const pid_t pid = ::fork();
   if (pid == 0) {
     const int out = ::open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644);
     ::dup2(out, 1);
     ::dup2(out, 2);
-    exec(std::move(whole));
+    ready.become();
   }
   int status = 0;
   ::waitpid(pid, &status, 0);

@@ -88,7 +88,7 @@ TEST_P(DocumentedService, Passes) {
   const std::string root = directory_.path() + "/root";
   const Finished run = runShell(
       std::string(SPACEKEEP_SOURCE_DIR) + "/tests/sandbox/enter " + root + " " +
-          SPACEKEEP_BUILD_DIR + " -- /bin/sh -c \"export ASAN_OPTIONS=" + kSmallQuarantine +
+          SPACEKEEP_BUILD_DIR + " -- /bin/sh -c \"export ASAN_OPTIONS=" + kNoQuarantine +
           "; mkdir /data && mount -t tmpfs data /data && mkdir /data/thumbnails "
           "&& " +
           "head -c 81920000 /dev/zero | split -b 20480 -a 4 -d - /data/thumbnails/item- && " +

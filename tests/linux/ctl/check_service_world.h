@@ -18,14 +18,14 @@
 
 namespace spacekeep::ctl {
 
-/// A service that was built with AddressSanitizer keeps much of what it has given back for a while,
+/// A service that was built with AddressSanitizer would keep what it has given back for a while,
 /// which is not the growth that is looked for.
-inline constexpr const char* kSmallQuarantine =
-    "quarantine_size_mb=1:thread_local_quarantine_size_kb=64";
+inline constexpr const char* kNoQuarantine =
+    "quarantine_size_mb=0:thread_local_quarantine_size_kb=0";
 
 class CheckServiceTest : public ToolTest {
  protected:
-  CheckServiceTest() { ::setenv("ASAN_OPTIONS", kSmallQuarantine, 1); }
+  CheckServiceTest() { ::setenv("ASAN_OPTIONS", kNoQuarantine, 1); }
   ~CheckServiceTest() override {
     std::remove(scriptFile().c_str());
     std::remove((directory_.path() + "/rules.plist").c_str());

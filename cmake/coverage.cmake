@@ -16,13 +16,15 @@ if(SPACEKEEP_COVERAGE)
   set(counts "-fprofile-instr-generate=${SPACEKEEP_COVERAGE}/%m%c.profraw")
   add_compile_options(${counts} -fcoverage-mapping -fprofile-list=${list} -fprofile-update=atomic
                       "SHELL:-mllvm -runtime-counter-relocation")
-  string(APPEND CMAKE_EXE_LINKER_FLAGS " -fprofile-instr-generate")
+  # The counting library comes with this option, whatever else is said of it.
+  set(is_counted $<AND:$<STREQUAL:$<TARGET_PROPERTY:TYPE>,EXECUTABLE>,$<NOT:$<BOOL:$<TARGET_PROPERTY:SK_NOT_COUNTED>>>>)
+  add_link_options($<${is_counted}:-fprofile-instr-generate>)
 endif()
 
 # For a program without any counted source: the counting library would complain of that at each start.
 function(sk_not_counted target)
   if(SPACEKEEP_COVERAGE)
     target_compile_options(${target} PRIVATE -fno-profile-instr-generate -fno-coverage-mapping)
-    target_link_options(${target} PRIVATE -fno-profile-instr-generate)
+    set_target_properties(${target} PROPERTIES SK_NOT_COUNTED ON)
   endif()
 endfunction()

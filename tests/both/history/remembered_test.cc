@@ -58,8 +58,9 @@ TEST(Remembered, APurgeOfAClientWithWhoAskedAndWhoGave) {
 TEST(Remembered, AServiceThatWasAskedSeveralTimesWithTheSumOfItsAnswers) {
   inEverySchedule(kSchedules, [] {
     HistoryWorld world;
-    world.world.declareService("large", sim::ownsBytes("/", 900));
-    world.world.declareService("empty", sim::ownsBytes("/", 0));
+    // Asked in the order of their names: no urgency ends before the large one has answered.
+    world.world.declareService("a-large", sim::ownsBytes("/", 900));
+    world.world.declareService("b-empty", sim::ownsBytes("/", 0));
     world.start();
     Dictionary request = purgeRequest(1000);
     request.set(keys::kUrgency, 3);
@@ -72,7 +73,7 @@ TEST(Remembered, AServiceThatWasAskedSeveralTimesWithTheSumOfItsAnswers) {
     const Value reported = valueOf(entries.front(), keys::kReportingServices);
     ASSERT_NE(reported.dictionary(), nullptr);
     // An answer may come between the one and the other.
-    const std::uint64_t large_bytes = unsignedAt(*reported.dictionary(), "large").value_or(0);
+    const std::uint64_t large_bytes = unsignedAt(*reported.dictionary(), "a-large").value_or(0);
     EXPECT_GE(large_bytes, reported_bytes);
     EXPECT_LE(large_bytes, 900U);
     EXPECT_EQ(valueOf(entries.front(), keys::kWhyShort), Value(history::kNothingMoreToGive));

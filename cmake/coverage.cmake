@@ -1,5 +1,5 @@
 # SPACEKEEP_COVERAGE: a directory for the counts of executed lines and branches (clang only). Counted
-# is what stands in the seven folders of the daemon, and nothing else. The directory is compiled into
+# is what stands in the daemon's folders, and nothing else. The directory is compiled into
 # the programs, so a daemon that a test starts with an empty environment and a root of its own counts
 # too: /dev is the one directory that such a root has in common with the machine. The counts live in a
 # shared mapping of a file there (%c, which needs the relocation), so those of a killed process stay;

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Runs every test program and tells which lines and branches of the seven folders they reach.
+"""Runs every test program and tells which lines and branches of the daemon's folders they reach.
 
 Usage: coverage.py --source DIRECTORY --build DIRECTORY --counts DIRECTORY [--report-only] [--missed FILE]
 
@@ -38,7 +38,7 @@ def main():
 
 
 def _arguments():
-    parser = argparse.ArgumentParser(description='Line and branch coverage of the seven folders')
+    parser = argparse.ArgumentParser(description='Line and branch coverage of the daemon's folders')
     parser.add_argument('--source', type=pathlib.Path, required=True)
     parser.add_argument('--build', type=pathlib.Path, required=True)
     parser.add_argument('--counts', type=pathlib.Path, required=True, help='the folder compiled into the programs')

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Changes the seven folders in one place at a time and looks whether a test notices.
+"""Changes the daemon's folders in one place at a time and looks whether a test notices.
 
 Usage: mutate.py --source DIRECTORY --build DIRECTORY --counts DIRECTORY --workshop DIRECTORY
                  [--sample N] [--seed S] [--again] [--fresh]

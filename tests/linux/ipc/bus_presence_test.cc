@@ -46,6 +46,16 @@ TEST(BusPresence, WithABusThatIsQuietNothingWakesUp) {
   EXPECT_EQ(wakeUpsInNs(server->loop, kQuietNs), 0U);
 }
 
+TEST(BusPresence, NobodyTakesTheNameAway) {
+  PrivateBus bus;
+  bus.start();
+  const auto server = serverOn(bus);
+  ASSERT_TRUE(BusClient(bus).isServed());
+  BusClient other(bus);
+  EXPECT_EQ(sd_bus_request_name(other.bus(), kTestBusName, SD_BUS_NAME_REPLACE_EXISTING), -EEXIST);
+  EXPECT_EQ(other.number(3), "");
+}
+
 TEST(BusPresence, ABusThatAppearsLaterIsFound) {
   PrivateBus bus;
   const auto server = serverOn(bus);

@@ -105,7 +105,7 @@ void SpacekeepPurgeOperation::sendRequest(const std::shared_ptr<ServiceRequest>&
   auto self = std::static_pointer_cast<SpacekeepPurgeOperation>(shared_from_this());
   SpacekeepServiceProtocol(std::move(proxy))
       .servicePurge(request->urgency, request->info,
-                    [self, request, done = std::move(done)](ipc::OptionalDictionary reply) {
+                    [self, request, done = std::move(done)](const ipc::OptionalDictionary& reply) {
                       self->bookReply(*request, reply, done);
                     });
 }

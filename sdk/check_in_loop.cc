@@ -36,7 +36,7 @@ struct CheckInLoop::Session {
     ipc::OptionalDictionary result;
     std::string error;  ///< empty unless the check-in failed
   };
-  // Changed through HostControl::change().
+  // Changed through HostControl::change(), also after the session is over.
   bool daemon_lost = false;
   bool service_lost = false;
   std::optional<Answer> answer;
@@ -157,8 +157,8 @@ std::string CheckInLoop::awaitAnswer(Session& session) {
 
 std::string CheckInLoop::serveUntilLost(Session& session) {
   std::optional<Session::Answer> answer;
-  control_->change([&] { answer = session.answer; });
-  if (!answer) return session.whyOver();
+  control_->look([&] { answer = session.answer; });
+  if (!answer) return whyOver(session);
   if (!answer->error.empty()) return "the check-in failed: " + answer->error;
   const bool refused = !answer->result.has_value();
   if (refused) {
@@ -175,7 +175,13 @@ std::string CheckInLoop::serveUntilLost(Session& session) {
     control_->report(HostState::kServing);
     control_->waitUntil(rt::kNever, [&session] { return session.over(); });
   }
-  return session.whyOver();
+  return whyOver(session);
+}
+
+std::string CheckInLoop::whyOver(const Session& session) const {
+  std::string why;
+  control_->look([&] { why = session.whyOver(); });
+  return why;
 }
 
 void CheckInLoop::pauseAfter(const std::string& why) {

@@ -31,6 +31,7 @@ class CheckInLoop {
   void startCheckIn(const std::shared_ptr<Session>& session);
   std::string awaitAnswer(Session& session);
   std::string serveUntilLost(Session& session);
+  [[nodiscard]] std::string whyOver(const Session& session) const;
   [[nodiscard]] Dictionary checkInInfo() const;
   void pauseAfter(const std::string& why);
 

@@ -25,6 +25,11 @@ void HostControl::change(const std::function<void()>& change) {
   changed_.notifyAll();
 }
 
+void HostControl::look(const std::function<void()>& look) const {
+  const std::scoped_lock lock(mutex_);
+  look();
+}
+
 bool HostControl::waitUntil(std::uint64_t deadline_ticks, const std::function<bool()>& condition,
                             bool until_stop) {
   const std::scoped_lock lock(mutex_);

@@ -24,6 +24,8 @@ class HostControl {
 
   /// Runs `change` under the control's lock and wakes whoever waits.
   void change(const std::function<void()>& change);
+  /// Runs `look` under the control's lock.
+  void look(const std::function<void()>& look) const;
   /// Until `condition`, which is looked at under the control's lock, holds, or the deadline has
   /// passed; answers whether it holds. With `until_stop` the wish to stop ends the wait as well.
   bool waitUntil(std::uint64_t deadline_ticks, const std::function<bool()>& condition,

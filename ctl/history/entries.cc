@@ -49,7 +49,7 @@ std::vector<std::string> silentOf(const Dictionary& entry) {
 }
 
 bool isTooOld(const HistoryEntry& entry, const std::optional<std::int64_t>& since_ns) {
-  return since_ns && !(entry.ended && entry.ended->unix_ns >= *since_ns);
+  return since_ns && (!entry.ended || entry.ended->unix_ns < *since_ns);
 }
 
 }  // namespace

@@ -160,6 +160,11 @@ TEST_F(History, LetsTheOldestGoBeforeItsFileGetsTooLarge) {
   EXPECT_EQ(numbers.front(), static_cast<std::uint64_t>(last));
 }
 
+TEST(HistoryBounds, AreTenThousandEntriesAndEightMebibytes) {
+  EXPECT_EQ(SqliteHistoryOptions().max_entries, 10'000);
+  EXPECT_EQ(SqliteHistoryOptions().max_pages * 4096, 8 << 20);
+}
+
 TEST_F(History, NumbersGoOnEvenWhenAllOldEntriesHadToGo) {
   const auto history = open({.max_pages = 128});
   append(*history, 1, 60, "/", 3000);

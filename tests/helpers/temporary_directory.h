@@ -6,7 +6,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <string_view>
@@ -45,8 +45,10 @@ class TemporaryDirectory {
 };
 
 inline std::string contentOf(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  return std::string(std::istreambuf_iterator<char>(file), {});
+  const std::ifstream file(path, std::ios::binary);
+  std::ostringstream content;
+  content << file.rdbuf();  // in large pieces
+  return content.str();
 }
 
 }  // namespace spacekeep::test

@@ -9,6 +9,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <deque>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -80,7 +81,7 @@ class LoadedWorld {
   std::vector<sdk::ServiceHost> hosts_;  ///< of services_, the declared one last
   std::size_t next_to_renew_ = 0;
   std::unique_ptr<sdk::Client> client_;  ///< of the driving thread, for the daemon of now
-  std::vector<StateWriter> writers_;
+  std::deque<StateWriter> writers_;
   std::vector<std::thread> threads_;
   std::atomic<bool> stopping_{false};
   Counts counts_;

@@ -8,6 +8,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <deque>
 #include <filesystem>
 #include <numeric>
 #include <random>
@@ -79,7 +80,7 @@ class StateKills : public testing::Test {
 
   Sandbox sandbox_;
   Process daemon_;
-  std::vector<StateWriter> writers_;
+  std::deque<StateWriter> writers_;
 };
 
 TEST_F(StateKills, LoseNothingThatWasAnsweredAndNeverKeepTheDaemonFromStarting) {

@@ -1,4 +1,5 @@
-// Thread safety: each writer belongs to one thread at a time.
+// Thread safety: each writer belongs to one thread at a time; answers() and lost() may be called from
+// any thread.
 //
 // A client that counts up a key of its own and knows, after any end of the daemon, which values can
 // be stored: the last answered one, or the one that was under way.
@@ -6,6 +7,7 @@
 
 #include <spacekeep/client.h>
 
+#include <atomic>
 #include <cstdint>
 #include <string>
 
@@ -31,8 +33,8 @@ class StateWriter {
   const int number_;
   std::uint64_t sent_ = 0;
   std::uint64_t answered_ = 0;
-  std::uint64_t answers_ = 0;
-  std::uint64_t lost_ = 0;
+  std::atomic<std::uint64_t> answers_ = 0;
+  std::atomic<std::uint64_t> lost_ = 0;
 };
 
 }  // namespace spacekeep::system_test

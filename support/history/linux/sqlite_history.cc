@@ -15,7 +15,13 @@ namespace {
 
 constexpr const char* kName = "history";
 /// "SKHI": this file is no suite.
-constexpr SuiteFileKind kKind = {.application_id = 0x534b4849, .version = 1, .what = "the history"};
+constexpr SuiteFileKind kKind = {
+    .application_id = 0x534b4849,
+    .version = 1,
+    .what = "the history",
+    .table_sql =
+        "CREATE TABLE history (number INTEGER PRIMARY KEY AUTOINCREMENT, volume TEXT,"
+        " entry BLOB NOT NULL)"};
 
 constexpr std::int64_t kPageBytes = 4096;
 /// What a row takes besides its content.
@@ -103,12 +109,13 @@ int SqliteHistory::setUp() {
 }
 
 int SqliteHistory::makeTable() {
-  const std::string sql =
-      "PRAGMA application_id = " + std::to_string(kKind.application_id) +
-      "; CREATE TABLE IF NOT EXISTS history (number INTEGER PRIMARY KEY AUTOINCREMENT,"
-      " volume TEXT, entry BLOB NOT NULL)"
-      "; PRAGMA user_version = " +
-      std::to_string(kKind.version);
+  int code = SQLITE_OK;
+  const auto tables = queryInteger(
+      database_.get(), "SELECT count(*) FROM sqlite_schema WHERE name = 'history'", code);
+  if (code != SQLITE_ROW) return code;
+  const std::string sql = "PRAGMA application_id = " + std::to_string(kKind.application_id) + "; " +
+                          (tables == 0 ? kKind.table_sql : "") +
+                          "; PRAGMA user_version = " + std::to_string(kKind.version);
   return execute(database_.get(), sql.c_str());
 }
 

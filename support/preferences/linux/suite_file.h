@@ -21,6 +21,9 @@ struct SuiteFileKind {
   std::int64_t application_id = kSuiteApplicationId;
   std::int64_t version = kSuiteVersion;  ///< the newest that this program understands
   const char* what = "the suite";        ///< in log lines
+  /// The statement that makes its table, which is called as the file, as the database keeps it; a
+  /// file with another such table, or of this version without it, is damaged. Null: not looked at.
+  const char* table_sql = nullptr;
 };
 
 struct SuiteFileError {

@@ -204,6 +204,33 @@ TEST_F(History, ASuiteInItsPlaceIsTheDatabaseOfAnotherProgram) {
   EXPECT_EQ(setAside().size(), 1U);
 }
 
+TEST_F(History, ATableWithoutItsKeyIsSetAsideBecauseItWouldLoseWhatIsWritten) {
+  append(*open(), 1, 3);
+  std::string content = contentOf(file());
+  const std::size_t at = content.find("PRIMARY KEY AUTOINCREMENT");
+  ASSERT_NE(at, std::string::npos);
+  content.replace(at, 25, 25, 'x');  // a type of three words instead, for all that SQLite knows
+  directory_.write("history.sqlite", content);
+  const auto history = open();
+  ASSERT_NE(history, nullptr);
+  append(*history, 4, 5);
+  EXPECT_EQ(all(*history).size(), 2U);
+  EXPECT_TRUE(log_.contains(kLogProblem, "its table is not as this program makes it"));
+  const auto aside = setAside();  // the file and its empty journal
+  EXPECT_TRUE(std::ranges::any_of(
+      aside, [&content](const std::string& path) { return contentOf(path) == content; }));
+}
+
+TEST_F(History, AFileWithoutItsTableIsSetAside) {
+  append(*open(), 1, 3);
+  ASSERT_EQ(execute(outside().get(), "DROP TABLE history"), SQLITE_OK);
+  const auto history = open();
+  ASSERT_NE(history, nullptr);
+  append(*history, 4, 5);
+  EXPECT_EQ(all(*history).size(), 2U);
+  EXPECT_EQ(setAside().size(), 1U);
+}
+
 TEST_F(History, OfANewerVersionIsLeftAloneAndNotOpened) {
   append(*open(), 1, 1);
   ASSERT_EQ(execute(outside().get(), "PRAGMA user_version = 2"), SQLITE_OK);

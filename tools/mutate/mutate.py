@@ -2,12 +2,12 @@
 """Changes the daemon's folders in one place at a time and looks whether a test notices.
 
 Usage: mutate.py --source DIRECTORY --build DIRECTORY --counts DIRECTORY --workshop DIRECTORY
-                 [--sample N] [--seed S] [--again] [--fresh]
+                 [--sample N] [--seed S] [--quick] [--again] [--fresh]
 
 Stands on a finished coverage run in BUILD: it tells which test programs reach the changed line, and
 only these are asked. A line per mutant tells what was changed and which program noticed. The results
-are kept in WORKSHOP; a run that was stopped goes on. --again asks about the survivors once more,
---fresh takes a new copy of sources and build.
+are kept in WORKSHOP; a run that was stopped goes on. --quick leaves out the tests that take
+long, --again asks all of them about the survivors, --fresh takes a new copy of sources and build.
 """
 import argparse
 import json
@@ -35,9 +35,14 @@ class Trial:
         self._objects = arguments.workshop / 'objects'
         self._counts = arguments.counts
         self._reach = reach
+        self._quick = arguments.quick
+        self._quick_seconds = {program: self._seconds_without_slow_tests(program) for program in reach.lines}
         self._undo = arguments.workshop / 'undo'
         self._restore_source()
         self._build.restore_all()
+
+    def _seconds_without_slow_tests(self, program):
+        return max(0.0, self._reach.seconds.get(program, 10.0) - sum(self._reach.slow_tests_of(program).values()))
 
     def _restore_source(self):
         """Takes the change back; also one that a killed run has left."""
@@ -55,6 +60,8 @@ class Trial:
             return ledger.NOT_A_MUTANT, 'the line is no longer there'
         asked = suite.asked_about(mutant.file, mutant.line, self._reach.lines,
                                   [program for program in self._reach.lines if self._reach.is_sound(program)])
+        if self._quick:
+            asked = suite.quick_ones(asked, self._quick_seconds, suite.room_of(mutant.file))
         self._undo.write_text(json.dumps([str(path), original]), encoding='utf-8')
         path.write_text(text, encoding='utf-8')
         try:
@@ -73,12 +80,11 @@ class Trial:
             for program in asked:
                 if not self._link(program, objects, compiled, linked):
                     return ledger.NOT_A_MUTANT, 'does not compile'
-                slow = self._reach.slow_tests_of(program)
-                quick_seconds = max(0.0, self._reach.seconds.get(program, 10.0) - sum(slow.values()))
-                found = self._ask(program, linked, quick_seconds, self._all_but([*slow, *self._reach.failed_tests_of(program)]))
+                left_out = [*self._reach.slow_tests_of(program), *self._reach.failed_tests_of(program)]
+                found = self._ask(program, linked, self._quick_seconds[program], self._all_but(left_out))
                 if found is not None:
                     return ledger.CAUGHT, found
-            for program in asked:
+            for program in [] if self._quick else asked:
                 slow = self._reach.slow_tests_of(program)
                 found = self._ask(program, linked, sum(slow.values()), ':'.join(slow)) if slow else None
                 if found is not None:
@@ -144,7 +150,8 @@ def _arguments():
         parser.add_argument(f'--{name}', type=lambda text: pathlib.Path(text).resolve(), required=True)
     parser.add_argument('--sample', type=int, default=300, help='how many mutants (300)')
     parser.add_argument('--seed', type=int, default=1, help='which ones (1)')
-    parser.add_argument('--again', action='store_true', help='only those that survived')
+    parser.add_argument('--quick', action='store_true', help='leave out the tests that take long')
+    parser.add_argument('--again', action='store_true', help='only those that survived, by all programs')
     parser.add_argument('--fresh', action='store_true', help='copy sources and build anew')
     return parser.parse_args()
 

@@ -138,6 +138,11 @@ class Asking(unittest.TestCase):
         reach['tests/test_both_threads_purge'] = {'purge/a.cc': ({1}, {1})}
         self.assertEqual(suite.asked_about('purge/a.cc', 1, reach, self.PROGRAMS), ['tests/test_both_threads_purge'])
 
+    def test_a_quick_run_leaves_out_what_takes_long_unless_it_is_of_the_room_or_nothing_else_reaches_the_line(self):
+        seconds = {'test_quick': 3.0, 'test_border': 20.0, 'test_slow': 200.0, 'test_linux_purge': 200.0}
+        self.assertEqual(suite.quick_ones(list(seconds), seconds, 'purge'), ['test_quick', 'test_border', 'test_linux_purge'])
+        self.assertEqual(suite.quick_ones(['test_slow'], seconds, 'purge'), ['test_slow'])
+
 
 class WithoutAMutant(unittest.TestCase):
     def log_says(self, text):

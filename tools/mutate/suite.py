@@ -14,6 +14,10 @@ from test_programs import command_of  # noqa: E402 (stands beside this folder)
 LIMIT_FACTOR = 5
 LIMIT_LEAST_SECONDS = 60
 
+# A program that takes longer, its slow tests not counted, is not asked in a quick run, and neither are
+# the slow tests of the others: what they alone would notice waits for them with all other survivors.
+QUICK_SECONDS = 20
+
 
 def room_of(file):
     """The room whose tests stand first for a file: purge, ipc, ..."""
@@ -49,6 +53,12 @@ def asked_about(file, line, reach, programs):
     if any(is_exact(program) for program in chosen):
         chosen = [program for program in chosen if 'test_both_threads_' not in program]
     return sorted(chosen, key=lambda program: rank(program, room_of(file)))
+
+
+def quick_ones(programs, seconds, room):
+    """Of `programs` those of the room and those that take no more than QUICK_SECONDS; all where there is none."""
+    return [program for program in programs
+            if program.endswith('_' + room) or seconds.get(program, 0.0) <= QUICK_SECONDS] or programs
 
 
 def ask(program, build, usual_seconds, tests=''):

@@ -42,6 +42,8 @@ using SpacekeepListener = ipc::Listener;
 /// The most services that the registry takes by check-in: each holds a descriptor and a place in
 /// every snapshot.
 inline constexpr std::size_t kMaxRegisteredServices = 4096;
+/// Of the ID of one of them. IDs stand in every outcome and in every request of a later urgency.
+inline constexpr std::size_t kMaxServiceIdBytes = 255;
 
 /// What the daemon reads from its own state: nothing, a value, or a record.
 using StateObject = std::variant<std::monostate, Value, std::shared_ptr<SpacekeepRecentInfo>>;
@@ -161,6 +163,7 @@ class Spacekeep : public SpacekeepClientProtocol,
   void startListener();
   [[nodiscard]] bool connectionIsEntitled(std::string_view entitlement) const;
   void registerService(const CheckIn& check_in);
+  [[nodiscard]] static std::string refusalOf(const CheckIn& check_in);
   [[nodiscard]] std::shared_ptr<SKService> openService(const CheckIn& check_in);
   [[nodiscard]] std::function<void()> removalHandler(const std::shared_ptr<SKService>& service);
   void deliverNotification(const ServiceMap& recipients, const std::string& name,

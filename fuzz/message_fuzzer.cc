@@ -33,7 +33,7 @@ std::string messageWith(std::string_view signature, std::string_view body) {
 
 class Bus {
  public:
-  explicit Bus(int fd) : bus_(makeAuthenticatedBus(fd)) {
+  explicit Bus(int fd) : bus_(makeAuthenticatedBus(fd).bus) {
     require(bus_ != nullptr, "the fuzzer has descriptors left");
   }
   ~Bus() { sd_bus_close_unref(bus_); }

@@ -32,7 +32,7 @@ using Message = std::unique_ptr<sd_bus_message, DropMessage>;
 /// Messages can only be made for a bus; nothing is ever sent over this one.
 Message newMessage() {
   static const SocketPair kPair = makeSocketPair();
-  static sd_bus* const kBus = makeAuthenticatedBus(kPair.first->fd());
+  static sd_bus* const kBus = makeAuthenticatedBus(kPair.first->fd()).bus;
   sd_bus_message* raw = nullptr;
   const int made =
       sd_bus_message_new_method_call(kBus, &raw, nullptr, kObjectPath, nullptr, "call");

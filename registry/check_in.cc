@@ -1,4 +1,5 @@
 // Services that make themselves known at run time, and the lifetime of their connections.
+#include <string>
 #include <utility>
 
 #include "client/entitlements.h"
@@ -47,6 +48,13 @@ void Spacekeep::registerService(const CheckIn& check_in) {
     check_in.reply(std::nullopt, "too many services are registered, try again later");
     return;
   }
+  const std::string why = service ? std::string() : refusalOf(check_in);
+  if (!why.empty()) {
+    logProblem("%s refusing %@, %@", "clientCheckin",
+               check_in.service_id.substr(0, kMaxServiceIdBytes), why);
+    check_in.reply(std::nullopt, why);
+    return;
+  }
   if (service) {
     logTrace("%s operating on an existing service", "clientCheckin");
   } else {
@@ -58,6 +66,19 @@ void Spacekeep::registerService(const CheckIn& check_in) {
   service->setDesiredNotifications(names ? std::optional<Value>(*names) : std::nullopt);
   check_in.reply(Dictionary{{keys::kServiceId, check_in.service_id}, {keys::kAnonymous, true}},
                  std::nullopt);
+}
+
+/// Why no service can be made of it, empty when one can. Nobody stands behind a useless endpoint to
+/// answer the ping, and the ping is waited for without a limit.
+std::string Spacekeep::refusalOf(const CheckIn& check_in) {
+  if (check_in.service_id.size() > kMaxServiceIdBytes) {
+    return "its ID has " + std::to_string(check_in.service_id.size()) + " bytes, more than " +
+           std::to_string(kMaxServiceIdBytes);
+  }
+  if (check_in.endpoint && !check_in.endpoint->problem().empty()) {
+    return "its endpoint cannot be used: " + check_in.endpoint->problem();
+  }
+  return "";
 }
 
 // Waits until the service answers a ping, and with it everybody who needs collection_queue. A

@@ -21,6 +21,7 @@ class AnsweringConnection final : public ipc::Connection {
   void setRemoteInterface(const ipc::InterfaceDescription&) override {}
   void resume() override {}
   void invalidate() override {}
+  [[nodiscard]] bool ended() const override { return false; }
   std::shared_ptr<ipc::RemoteProxy> remoteProxy(ipc::RemoteProxy::ErrorHandler on_error) override {
     return std::make_shared<Proxy>(services_, std::move(on_error));
   }

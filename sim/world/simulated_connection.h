@@ -35,7 +35,7 @@ class SimulatedConnection final : public ipc::Connection,
 
   /// From the peer's side, or by the wire: pending calls fail, the fitting handler runs.
   void end(ConnectionEnd how);
-  [[nodiscard]] bool ended() const;
+  [[nodiscard]] bool ended() const override;
   /// Drops every handler and pending call without running it, but answers the pings that never got
   /// an answer, and every later one: the daemon waits for those without a limit, and the world has
   /// to come to an end.

@@ -60,6 +60,12 @@ const InterfaceDescription* InterfaceDescription::named(std::string_view interfa
   return interface;
 }
 
+bool passesDescriptor(const MethodDescription& method) {
+  return std::ranges::any_of(method.in, [](const ArgumentDescription& argument) {
+    return argument.kind == ArgumentKind::kDescriptor;
+  });
+}
+
 bool matches(const std::vector<ArgumentDescription>& described, const Arguments& arguments) {
   return std::equal(described.begin(), described.end(), arguments.begin(), arguments.end(),
                     [](const ArgumentDescription& wanted, const Argument& given) {

@@ -9,6 +9,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <variant>
 #include <vector>
 
@@ -20,13 +21,17 @@ namespace spacekeep::ipc {
 class Descriptor {
  public:
   explicit Descriptor(int fd) : fd_(fd) {}
+  /// One that was passed and cannot be used, with the reason.
+  explicit Descriptor(std::string problem) : problem_(std::move(problem)) {}
   ~Descriptor();
   Descriptor(const Descriptor&) = delete;
   Descriptor& operator=(const Descriptor&) = delete;
-  [[nodiscard]] int fd() const { return fd_; }
+  [[nodiscard]] int fd() const { return fd_; }  ///< -1 when there is a problem
+  [[nodiscard]] const std::string& problem() const { return problem_; }
 
  private:
-  int fd_;
+  int fd_ = -1;
+  std::string problem_;
 };
 using SharedDescriptor = std::shared_ptr<Descriptor>;
 
@@ -83,6 +88,9 @@ struct InterfaceDescription {
 
 /// The one object path on every connection.
 inline constexpr const char* kObjectPath = "/com/quorvel/Spacekeep";
+
+/// Whether one of the arguments in is a descriptor.
+[[nodiscard]] bool passesDescriptor(const MethodDescription& method);
 
 /// True when the arguments are of the described kinds, in order.
 [[nodiscard]] bool matches(const std::vector<ArgumentDescription>& described,

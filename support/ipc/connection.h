@@ -55,6 +55,8 @@ class Connection {
 
   /// Ends the connection. Pending calls fail. The second call does nothing.
   virtual void invalidate() = 0;
+  /// Every further call fails. True some time before the handler runs.
+  [[nodiscard]] virtual bool ended() const = 0;
 };
 
 /// Makes connections to services.

@@ -28,6 +28,7 @@ class FakeConnection final : public ipc::Connection,
   void setRemoteInterface(const ipc::InterfaceDescription&) override {}
   void resume() override {}
   void invalidate() override { failAll(); }
+  [[nodiscard]] bool ended() const override { return false; }
 
   std::shared_ptr<ipc::RemoteProxy> remoteProxy(ipc::RemoteProxy::ErrorHandler on_error) override {
     return std::make_shared<Proxy>(shared_from_this(), std::move(on_error));

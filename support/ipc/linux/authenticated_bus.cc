@@ -16,11 +16,12 @@ namespace spacekeep::ipc {
 
 namespace {
 
-/// Takes over `fd` in every case: a bus that has it closes it.
-sd_bus* startServer(int fd, BusDescriptors descriptors) {
+/// Takes over both descriptors in every case: a bus that has them closes them.
+sd_bus* startServer(int input, int output, BusDescriptors descriptors) {
   sd_bus* bus = nullptr;
   if (sd_bus_new(&bus) < 0) {
-    ::close(fd);
+    ::close(input);
+    ::close(output);
     return nullptr;
   }
   // Nobody ever sees it.
@@ -30,10 +31,11 @@ sd_bus* startServer(int fd, BusDescriptors descriptors) {
   const bool prepared =
       sd_bus_set_bus_client(bus, 0) >= 0 && sd_bus_negotiate_fds(bus, takes_descriptors) >= 0 &&
       sd_bus_set_server(bus, 1, kId) >= 0 && sd_bus_set_method_call_timeout(bus, UINT64_MAX) >= 0 &&
-      sd_bus_set_exit_on_disconnect(bus, 0) >= 0 && sd_bus_set_fd(bus, fd, fd) >= 0;
+      sd_bus_set_exit_on_disconnect(bus, 0) >= 0 && sd_bus_set_fd(bus, input, output) >= 0;
   if (!prepared) {
     sd_bus_unref(bus);
-    ::close(fd);
+    ::close(input);
+    ::close(output);
     return nullptr;
   }
   if (sd_bus_start(bus) >= 0) return bus;
@@ -68,16 +70,24 @@ bool passHandshake(sd_bus* bus, int other_end) {
 
 }  // namespace
 
-sd_bus* makeAuthenticatedBus(int socket, BusDescriptors descriptors) {
+AuthenticatedBus makeAuthenticatedBus(int socket, BusDescriptors descriptors) {
   const SocketPair pair = makeSocketPair();
-  if (pair.first == nullptr) return nullptr;
-  const int fd = ::fcntl(pair.first->fd(), F_DUPFD_CLOEXEC, 3);
-  if (fd < 0) return nullptr;
-  sd_bus* bus = startServer(fd, descriptors);
-  if (bus == nullptr) return nullptr;
-  if (passHandshake(bus, pair.second->fd()) && ::dup3(socket, fd, O_CLOEXEC) >= 0) return bus;
+  if (pair.first == nullptr) return {};
+  const int input = ::fcntl(pair.first->fd(), F_DUPFD_CLOEXEC, 3);
+  if (input < 0) return {};
+  const int output = ::fcntl(pair.first->fd(), F_DUPFD_CLOEXEC, 3);
+  if (output < 0) {
+    ::close(input);
+    return {};
+  }
+  sd_bus* bus = startServer(input, output, descriptors);
+  if (bus == nullptr) return {};
+  if (passHandshake(bus, pair.second->fd()) && ::dup3(socket, input, O_CLOEXEC) >= 0 &&
+      ::dup3(socket, output, O_CLOEXEC) >= 0) {
+    return {bus, input, output};
+  }
   sd_bus_close_unref(bus);
-  return nullptr;
+  return {};
 }
 
 }  // namespace spacekeep::ipc

@@ -93,10 +93,7 @@ std::string BusCaller::answerProblem(std::size_t bytes) const {
 }
 
 std::string BusCaller::methodProblem(const MethodDescription& method) const {
-  const bool passes_one = std::ranges::any_of(method.in, [](const ArgumentDescription& argument) {
-    return argument.kind == ArgumentKind::kDescriptor;
-  });
-  return passes_one ? useTheSocketInstead(context().endpoint_rules.own_address) : "";
+  return passesDescriptor(method) ? useTheSocketInstead(context().endpoint_rules.own_address) : "";
 }
 
 }  // namespace spacekeep::ipc

@@ -122,6 +122,8 @@ void BusCallers::tellLeftOut(const LeftOut& message) {
 }
 
 void BusCallers::refuse(sd_bus_message* call, const char* error_name, const std::string& text) {
+  const char* member = sd_bus_message_get_member(call);
+  context_->refusals.writeCall("a caller of the bus", member == nullptr ? "" : member, text);
   if (sd_bus_message_get_expect_reply(call) <= 0) return;
   const OwnedMessage answer = errorAnswer(call, error_name, text);
   if (answer != nullptr) link_.send(answer.get(), errorAnswerBytes(text), kUnknownUser);

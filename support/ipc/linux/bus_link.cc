@@ -26,7 +26,6 @@ constexpr std::size_t kLeftOutPerTurn = 64 * 1024;
 
 // Over a bus. Headers that anybody has a use for are much shorter.
 constexpr std::uint64_t kMaxBusHeaderBytes = 8 * 1024;
-constexpr std::size_t kMaxBusMessageBytes = 128 * 1024 * 1024;  // of D-Bus itself
 
 std::size_t bytesAvailable(int fd) {
   int bytes = 0;
@@ -147,12 +146,14 @@ bool BusLink::open() {
   io_ = sd_event_source_unref(io_);
   timer_ = sd_event_source_disable_unref(timer_);
   authentication_.reset();
-  bus_ = makeAuthenticatedBus(
+  const AuthenticatedBus made = makeAuthenticatedBus(
       fd_, sends_descriptors_ ? BusDescriptors::kTaken : BusDescriptors::kClosed);
+  if (made.bus == nullptr) return false;
   socket_.reset();
-  if (bus_ == nullptr) return false;
-  fd_ = sd_bus_get_fd(bus_);
-  return fd_ >= 0 && sd_bus_add_filter(bus_, nullptr, &BusLink::onMessage, this) >= 0 && watch();
+  bus_ = made.bus;
+  input_ = made.input;
+  fd_ = made.output;
+  return sd_bus_add_filter(bus_, nullptr, &BusLink::onMessage, this) >= 0 && watch();
 }
 
 int BusLink::onMessage(sd_bus_message* message, void* self, sd_bus_error*) {
@@ -166,6 +167,7 @@ int BusLink::onMessage(sd_bus_message* message, void* self, sd_bus_error*) {
 
 void BusLink::process() {
   processing_ = true;
+  if (!queued_sizes_.empty()) writeQueued();
   int turns = 0;
   while (turns < kMessagesPerTurn && !ended_ && processOnce()) ++turns;
   processing_ = false;
@@ -181,49 +183,65 @@ void BusLink::process() {
   if (turns == kMessagesPerTurn || peer_hung_up_) sd_event_source_set_io_events(io_, events_);
 }
 
+/// Lets sd-bus write what it can, and read nothing: of what may come meanwhile nothing was judged.
+void BusLink::writeQueued() {
+  const bool is_silent = ::dup3(loop_.silentSocket(), input_, O_CLOEXEC) >= 0;
+  const int progress = is_silent ? sd_bus_process(bus_, nullptr) : 0;
+  if (!is_silent || ::dup3(fd_, input_, O_CLOEXEC) < 0) {
+    end(LinkEnd::kRefused, "this process cannot duplicate a descriptor");
+  } else if (progress < 0 || sd_bus_is_open(bus_) <= 0) {
+    end(LinkEnd::kPeerLeft, "the peer has left");
+  } else {
+    forgetWritten();
+  }
+}
+
 /// Lets sd-bus read at most one message, and only one whose size is known to be within the limit.
 /// Answers whether there may be more to do.
 bool BusLink::processOnce() {
-  bool size_is_known = false;
   if (left_out_ > 0) return leaveOut();
   if (!in_message_) {
     switch (lookAhead()) {
       case Ahead::kRefused:
+      case Ahead::kNothing:
+      case Ahead::kIncomplete:
         return false;
       case Ahead::kLeftOut:
         return leaveOut();
       case Ahead::kDescriptors:
         return readWithDescriptors();
       case Ahead::kMessage:
-        size_is_known = true;
         in_message_ = true;
         message_read_ = 0;
-        break;
-      case Ahead::kNothing:
-      case Ahead::kIncomplete:
-        if (queued_sizes_.empty()) return false;
-        // To write, sd-bus must be allowed to read as well, and what came in meanwhile was not
-        // judged: until a message has arrived, its size counts as the largest.
-        in_message_ = true;
-        message_read_ = 0;
-        message_size_ = traffic_ == Traffic::kOfABus ? kMaxBusMessageBytes : limits_.message_bytes;
         break;
     }
   }
+  return readJudged();
+}
+
+bool BusLink::readJudged() {
   const std::size_t available = bytesAvailable(fd_);
+  const std::size_t queued = queued_sizes_.size();
   const int progress = sd_bus_process(bus_, nullptr);
   if (ended_) return false;
   if (progress < 0) {
     end(LinkEnd::kRefused, std::string("its messages cannot be read: ") + std::strerror(-progress));
-  } else if (sd_bus_is_open(bus_) <= 0) {
-    end(LinkEnd::kPeerLeft, "the peer has left");
-  } else if (in_message_ && messageWasDropped(available)) {
-    end(LinkEnd::kRefused, "it sent a broken message");
+    return false;
   }
-  if (ended_ || progress <= 0) return false;
+  if (sd_bus_is_open(bus_) <= 0) {
+    end(LinkEnd::kPeerLeft, "the peer has left");
+    return false;
+  }
+  if (in_message_) {
+    forgetWritten();
+    // It writes first, and reads only when no message was written to its end by that.
+    if (queued_sizes_.size() < queued) return true;
+    if (messageWasDropped(available)) end(LinkEnd::kRefused, "it sent a broken message");
+  }
+  if (ended_ || progress == 0) return false;
   // When this message was all there was, the next one wakes the loop by itself, and looking for it
   // now would be a system call for nothing.
-  return !size_is_known || available != message_size_ || !queued_sizes_.empty();
+  return available != message_size_;
 }
 
 BusLink::Ahead BusLink::lookAhead() {
@@ -266,7 +284,7 @@ BusLink::Ahead BusLink::judgeDescriptors() {
 /// By a bus for this one message: the connection's own takes no descriptors. Answers whether there
 /// may be more to do.
 bool BusLink::readWithDescriptors() {
-  sd_bus* reader = makeAuthenticatedBus(fd_, BusDescriptors::kTaken);
+  sd_bus* reader = makeAuthenticatedBus(fd_, BusDescriptors::kTaken).bus;
   if (reader == nullptr || sd_bus_add_filter(reader, nullptr, &BusLink::onMessage, this) < 0) {
     sd_bus_close_unref(reader);
     end(LinkEnd::kRefused, "this process has no descriptor left");
@@ -416,6 +434,9 @@ void BusLink::close() {
 void BusLink::release() {
   io_ = sd_event_source_disable_unref(io_);
   timer_ = sd_event_source_disable_unref(timer_);
+  // Who passed the socket may have kept a duplicate, as may this process: the peer shall know.
+  if (fd_ >= 0) ::shutdown(fd_, SHUT_RDWR);
+  fd_ = input_ = -1;
   if (bus_ != nullptr) bus_ = sd_bus_close_unref(bus_);
   socket_.reset();
 }

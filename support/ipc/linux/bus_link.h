@@ -106,6 +106,8 @@ class BusLink {
   bool open();
   void process();
   bool processOnce();
+  void writeQueued();
+  bool readJudged();
   enum class Ahead { kNothing, kIncomplete, kMessage, kDescriptors, kLeftOut, kRefused };
   Ahead lookAhead();
   bool judgeHeader(const WireFixedHeader& header);
@@ -133,7 +135,8 @@ class BusLink {
   sd_event_source* io_ = nullptr;
   sd_event_source* timer_ = nullptr;
   sd_bus* bus_ = nullptr;
-  int fd_ = -1;
+  int fd_ = -1;     // for everything but what sd-bus reads
+  int input_ = -1;  // another one of the same socket, for that
   std::uint32_t events_ = 0;
   bool waits_behind_others_ = false;
   bool sends_descriptors_ = false;

@@ -129,6 +129,7 @@ void BusServer::State::close() {
   connections.clear();
   context->turns.clear();
   context->pace.close();
+  context->refusals.close();
   open = 0;
 }
 

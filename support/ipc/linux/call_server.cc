@@ -21,6 +21,9 @@ namespace {
 constexpr std::string_view kIntrospectable = "org.freedesktop.DBus.Introspectable";
 constexpr std::string_view kPeer = "org.freedesktop.DBus.Peer";
 
+/// A descriptor that waits counts as that many bytes: a process has fewer of them than bytes.
+constexpr std::size_t kDescriptorWeight = 16 * 1024;
+
 std::string textOrEmpty(const char* text) { return text == nullptr ? "" : text; }
 
 /// The node on the way to the object whose path begins with `path` ("/" or "/com", ...), as an
@@ -109,11 +112,17 @@ void CallServer::serve(sd_bus_message* call, const MethodDescription& method, st
   const auto served =
       std::find_if(methods.begin(), methods.end(),
                    [&method](const auto& candidate) { return candidate.name == method.name; });
-  if (served->turn_per_user) {
-    if (const std::string why = context_->turns.refusal(identity().uid(), bytes); !why.empty()) {
-      refuse(call, kErrorLimitsExceeded, why);
-      return;
-    }
+  const std::size_t weight = bytes + (passesDescriptor(method) ? kDescriptorWeight : 0);
+  std::string why;
+  std::shared_ptr<void> room;
+  if (served->mode == ServeMode::kLane) {
+    room = context_->lane_budget->take(identity().uid(), weight, why);
+  } else {
+    why = context_->turns.refusal(identity().uid(), weight);
+  }
+  if (!why.empty()) {
+    refuse(call, kErrorLimitsExceeded, why);
+    return;
   }
   std::uint64_t serial = 0;
   if (sd_bus_message_get_cookie(call, &serial) < 0) return;
@@ -123,9 +132,9 @@ void CallServer::serve(sd_bus_message* call, const MethodDescription& method, st
   auto open = std::make_shared<OpenCall>(
       context_, weak_from_this(), method, serial, sd_bus_message_get_expect_reply(call) > 0,
       served->turn_per_user ? std::optional(identity().uid()) : std::nullopt);
-  run(*served, bytes,
+  run(*served, weight,
       [context = context_, peer = peer_, served = &*served, open = std::move(open),
-       arguments = std::move(*arguments)]() mutable {
+       room = std::move(room), arguments = std::move(*arguments)]() mutable {
         const GatePass pass(context->gate);
         if (!pass.inside()) return;
         const ServingScope scope(peer.get());
@@ -166,12 +175,21 @@ void CallServer::answer(std::uint64_t serial, const MethodDescription& method,
   const OwnedMessage message(made);
   WireWriter writer(message.get());
   if (writer.write(method.out, arguments)) {
-    const std::string problem = answerProblem(writer.bytes());
+    std::string problem = sizeProblem(writer.bytes());
+    if (problem.empty()) problem = answerProblem(writer.bytes());
     if (problem.empty()) return send(message.get(), writer.bytes());
+    context_->refusals.writeCall(identity().describe(), method.name, problem);
     return sendError(call.get(), kErrorLimitsExceeded, problem);
   }
   logProblem("%s The answer to %@ does not fit into a message", "answer", method.name);
   sendError(call.get(), kErrorLimitsExceeded, "The answer does not fit into a message");
+}
+
+std::string CallServer::sizeProblem(std::size_t bytes) const {
+  const std::size_t most = context_->options.limits.message_bytes;
+  if (bytes <= most) return "";
+  return "The answer has " + std::to_string(bytes) + " bytes, and a message " +
+         std::to_string(most) + " at most";
 }
 
 void CallServer::fail(std::uint64_t serial, const Error& error) {
@@ -198,6 +216,8 @@ void CallServer::sendText(sd_bus_message* call, const std::string& text) {
 }
 
 void CallServer::refuse(sd_bus_message* call, const char* error_name, const std::string& text) {
+  context_->refusals.writeCall(identity().describe(), textOrEmpty(sd_bus_message_get_member(call)),
+                               text);
   if (sd_bus_message_get_expect_reply(call) > 0) sendError(call, error_name, text);
 }
 

@@ -49,6 +49,8 @@ class CallServer : public std::enable_shared_from_this<CallServer> {
   virtual void send(sd_bus_message* message, std::size_t bytes) = 0;
   /// Why an answer of that size cannot be sent now, empty when it can.
   [[nodiscard]] virtual std::string answerProblem(std::size_t) const { return ""; }
+  /// A peer of ours takes no larger answer than this side takes calls, and ends the connection.
+  [[nodiscard]] std::string sizeProblem(std::size_t bytes) const;
   /// Why the method is not for these peers, empty when it is.
   [[nodiscard]] virtual std::string methodProblem(const MethodDescription&) const { return ""; }
   /// Whom answers go to, null where there is only one.

@@ -1,5 +1,6 @@
 #include "support/ipc/linux/connection_core.h"
 
+#include <algorithm>
 #include <mutex>
 #include <utility>
 
@@ -63,6 +64,11 @@ void ConnectionCore::invalidate() {
     self->failPending({kErrorDisconnected, "the connection was invalidated"});
     self->finish(End::kInvalidation);
   });
+}
+
+bool ConnectionCore::ended() const {
+  const std::scoped_lock lock(mutex_);
+  return ended_;
 }
 
 void ConnectionCore::call(std::string_view member, Arguments arguments,
@@ -140,12 +146,7 @@ void ConnectionCore::start(std::deque<Call> held) {
 bool ConnectionCore::sendsDescriptors() {
   const std::scoped_lock lock(mutex_);
   if (interface_ == nullptr) return false;
-  for (const MethodDescription& method : interface_->methods) {
-    for (const ArgumentDescription& argument : method.in) {
-      if (argument.kind == ArgumentKind::kDescriptor) return true;
-    }
-  }
-  return false;
+  return std::ranges::any_of(interface_->methods, passesDescriptor);
 }
 
 void ConnectionCore::transmit(Call call) {
@@ -157,6 +158,16 @@ void ConnectionCore::transmit(Call call) {
   if (problem.empty()) return;
   forgetOne();
   fail(std::move(call), {kErrorDisconnected, problem});
+}
+
+/// A peer takes no more than this side would, and ends the connection of whoever sends it: what one
+/// client asks must not cost others their service.
+std::string ConnectionCore::sizeProblem(const Call& call, std::size_t bytes) const {
+  if (bytes <= limits_.message_bytes) return "";
+  logProblem("%s %@ is not called, its arguments have %llu bytes and a message %llu at most",
+             "send", call.method->name, bytes, limits_.message_bytes);
+  return "the arguments have " + std::to_string(bytes) + " bytes, and a message " +
+         std::to_string(limits_.message_bytes) + " at most";
 }
 
 /// Answers what went wrong; `call` then is as it was.
@@ -171,10 +182,12 @@ std::string ConnectionCore::send(Call& call) {
   WireWriter writer(message);
   std::string problem = "the arguments do not fit into a message";
   if (writer.write(call.method->in, call.arguments)) {
+    problem = sizeProblem(call, writer.bytes());
+  }
+  if (problem.empty()) {
     if (const auto serial = link_.send(message, writer.bytes())) {
       call.arguments.clear();
       pending_.emplace(*serial, std::move(call));
-      problem.clear();
     } else {
       problem = "the message cannot be sent";
     }

@@ -33,6 +33,7 @@ class ConnectionCore final : public BusLink::Owner,
   void setRemoteInterface(const InterfaceDescription& interface);
   void resume();
   void invalidate();
+  [[nodiscard]] bool ended() const;
   void call(std::string_view member, Arguments arguments, RemoteProxy::ReplyHandler reply,
             const SharedErrorHandler& on_error);
 
@@ -64,6 +65,7 @@ class ConnectionCore final : public BusLink::Owner,
   void start(std::deque<Call> held);
   void transmit(Call call);
   std::string send(Call& call);
+  [[nodiscard]] std::string sizeProblem(const Call& call, std::size_t bytes) const;
   void answered(sd_bus_message* message, Call call);
   void refuse(sd_bus_message* request);
   void failPending(const Error& error);
@@ -73,7 +75,7 @@ class ConnectionCore final : public BusLink::Owner,
   ConcurrentQueue& global_;
   const ConnectionLimits limits_;
 
-  rt::Mutex mutex_;
+  mutable rt::Mutex mutex_;
   // Protected by mutex_.
   const InterfaceDescription* interface_ = nullptr;
   Connection::Handler on_invalidation_;

@@ -41,6 +41,7 @@ class BusConnection final : public Connection, public std::enable_shared_from_th
   }
   void resume() override { core_->resume(); }
   void invalidate() override { core_->invalidate(); }
+  [[nodiscard]] bool ended() const override { return core_->ended(); }
   std::shared_ptr<RemoteProxy> remoteProxy(RemoteProxy::ErrorHandler on_error) override {
     return std::make_shared<Proxy>(shared_from_this(), std::move(on_error));
   }
@@ -139,10 +140,14 @@ std::shared_ptr<Connection> LinuxConnector::connectionToDeclared(
     logProblem("%s \"%@\" is no safe file name, so it has no socket", kOperation, service_id);
     return nullptr;
   }
+  std::shared_ptr<Connection> dropped;  // destroyed without the lock
   const std::scoped_lock lock(declared_->mutex);
   if (const auto open = declared_->connections.find(service_id);
       open != declared_->connections.end()) {
-    return open->second;
+    if (!open->second->ended()) return open->second;
+    // A service that ends when it is idle is started again by a new connection.
+    dropped = std::move(open->second);
+    declared_->connections.erase(open);
   }
   if (const std::string wrong = directoryProblem(services_directory_); !wrong.empty()) {
     logProblem("%s The directory %@ cannot be trusted: %@", kOperation, services_directory_, wrong);

@@ -25,7 +25,9 @@ constexpr std::size_t kTasksPerTurn = 8;  // then the sockets are looked at
 
 IpcLoop::IpcLoop() {
   wake_fd_ = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-  if (wake_fd_ < 0 || sd_event_new(&event_) < 0) rt::panic("IPC: no descriptor for the event loop");
+  silent_ = makeSocketPair();
+  if (wake_fd_ < 0 || silent_.first == nullptr || sd_event_new(&event_) < 0)
+    rt::panic("IPC: no descriptor for the event loop");
   if (sd_event_add_io(event_, nullptr, wake_fd_, EPOLLIN, &IpcLoop::onWake, this) < 0) {
     rt::panic("IPC: the event loop takes no wake-up source");
   }

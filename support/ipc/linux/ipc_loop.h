@@ -17,6 +17,7 @@
 #include <utility>
 #include <vector>
 
+#include "support/ipc/linux/sockets.h"
 #include "support/queues/concurrent_queue.h"
 #include "support/runtime/runtime.h"
 
@@ -77,6 +78,9 @@ class IpcLoop {
   /// IPC thread.
   [[nodiscard]] sd_event* event() const { return event_; }
 
+  /// IPC thread. A connected socket from which nothing ever comes.
+  [[nodiscard]] int silentSocket() const { return silent_.first->fd(); }
+
   /// How often the thread has woken up, for tests of idleness.
   [[nodiscard]] std::uint64_t wakeups() const { return wakeups_.load(std::memory_order_relaxed); }
 
@@ -99,6 +103,7 @@ class IpcLoop {
 
   sd_event* event_ = nullptr;
   int wake_fd_ = -1;
+  SocketPair silent_;
   std::shared_ptr<Inbox> inbox_;
   // IPC thread.
   bool stopping_ = false;

@@ -10,7 +10,12 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <fstream>
+#include <iterator>
 #include <memory>
+#include <optional>
+#include <sstream>
+#include <string>
 #include <utility>
 
 namespace spacekeep::ipc {
@@ -39,13 +44,39 @@ bool isDead(int pidfd) {
   return ::poll(&state, 1, 0) > 0;
 }
 
+/// 0 when it is not known.
+pid_t peerPid(int socket) {
+  ucred peer{};
+  socklen_t length = sizeof peer;
+  return ::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &peer, &length) == 0 ? peer.pid : 0;
+}
+
+/// Whether the process has begun to exit, by its flags in /proc/PID/stat (proc(5)); none when they
+/// cannot be read. The kernel sets PF_EXITING before it closes the descriptors of a process.
+std::optional<bool> isExiting(pid_t pid) {
+  constexpr unsigned long kExiting = 0x4;  // PF_EXITING of the kernel's sched.h
+  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
+  std::string text((std::istreambuf_iterator<char>(file)), {});
+  // The name of the program stands in parentheses and may hold anything, these included.
+  const std::size_t name_end = text.rfind(')');
+  if (name_end == std::string::npos) return std::nullopt;
+  std::istringstream fields(text.substr(name_end + 1));
+  std::string skipped;
+  for (int i = 0; i < 6; ++i) fields >> skipped;  // state to tpgid
+  unsigned long flags = 0;
+  if (!(fields >> flags)) return std::nullopt;
+  return (flags & kExiting) != 0;
+}
+
 }  // namespace
 
 PeerProcess::~PeerProcess() { stopWatching(); }
 
 void PeerProcess::remember(int socket) {
   const int pidfd = openPeerPidfd(socket);
-  died_already_ = pidfd < 0 && errno == ESRCH;
+  const int problem = errno;
+  died_already_ = pidfd < 0 && problem == ESRCH;
+  pid_ = peerPid(socket);
   if (pidfd >= 0) pidfd_ = std::make_shared<Descriptor>(pidfd);
 }
 
@@ -53,6 +84,15 @@ void PeerProcess::whenKnown(std::uint64_t patience_ns, std::function<void(bool)>
   done_ = std::move(done);
   if (pidfd_ == nullptr) {
     tell(died_already_);
+    return;
+  }
+  const std::optional<bool> is_exiting = pid_ > 0 ? isExiting(pid_) : std::nullopt;
+  if (isDead(pidfd_->fd())) {  // so that the number may be another one's by now
+    tell(true);
+    return;
+  }
+  if (is_exiting) {
+    tell(*is_exiting);
     return;
   }
   const std::uint64_t patience_usec = std::max<std::uint64_t>(patience_ns / 1000, 1);

@@ -1,9 +1,11 @@
 // Thread safety: confined to the IPC thread.
 //
 // Whether the process behind a closed connection has died, or has only closed its end. A process
-// that dies closes its descriptors before the kernel announces its death, so the question has to
-// wait for a moment.
+// that dies closes its descriptors before the kernel announces its death; that it is about to is
+// written in proc(5). Where that cannot be read, the question has to wait for a moment.
 #pragma once
+
+#include <sys/types.h>
 
 #include <cstdint>
 #include <functional>
@@ -22,8 +24,8 @@ class PeerProcess {
 
   /// Remembers who holds the other end of the connected socket.
   void remember(int socket);
-  /// Runs `done` once: with true as soon as the process is known to be dead, with false when it
-  /// still lives after `patience_ns` or was never known. Possibly within this call.
+  /// Runs `done` once: with true when the process is dead or dying, with false when it lives or was
+  /// never known. Within this call wherever proc(5) tells; else after at most `patience_ns`.
   void whenKnown(std::uint64_t patience_ns, std::function<void(bool died)> done);
   /// `done` is not run any more.
   void forget();
@@ -36,6 +38,7 @@ class PeerProcess {
 
   IpcLoop& loop_;
   SharedDescriptor pidfd_;
+  pid_t pid_ = 0;  // of the same process, as long as pidfd_ says that it was not replaced
   bool died_already_ = false;
   std::function<void(bool)> done_;
   sd_event_source* death_ = nullptr;

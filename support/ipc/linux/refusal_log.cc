@@ -1,26 +1,62 @@
 #include "support/ipc/linux/refusal_log.h"
 
+#include <systemd/sd-event.h>
+#include <time.h>
+
+#include <algorithm>
+#include <utility>
+
 #include "support/logging/log.h"
-#include "support/runtime/runtime.h"
 
 namespace spacekeep::ipc {
 
-void RefusalLog::write(const std::string& who, const std::string& why) {
-  constexpr const char* kOperation = "SpacekeepListener";
-  if (rt::ticks() >= window_ends_) {
-    if (left_out_ > 0) {
-      logProblem("%s %llu more connections were refused or ended", kOperation, left_out_);
+namespace {
+
+constexpr const char* kOperation = "SpacekeepListener";
+
+}  // namespace
+
+void RefusalLog::write(std::string_view who, std::string_view why) {
+  if (mayWrite()) logProblem("%s Connection of %@ refused or ended: %@", kOperation, who, why);
+}
+
+void RefusalLog::writeCall(std::string_view who, std::string_view member, std::string_view why) {
+  if (mayWrite()) logProblem("%s %@ of %@ refused: %@", kOperation, member, who, why);
+}
+
+bool RefusalLog::mayWrite() {
+  if (closed_) return true;
+  if (window_end_ == nullptr) {
+    const std::uint64_t usec = std::max<std::uint64_t>(window_ns_ / 1000, 1);
+    if (sd_event_add_time_relative(loop_.event(), &window_end_, CLOCK_MONOTONIC, usec, 0,
+                                   &RefusalLog::onWindowEnd, this) < 0) {
+      return true;  // without a clock nothing is left out
     }
-    window_ends_ = rt::deadlineAfterNs(kWindowNs);
     written_ = 0;
-    left_out_ = 0;
   }
-  if (written_ >= kLinesPerWindow) {
-    ++left_out_;
-    return;
+  if (written_ < kLinesPerWindow) {
+    ++written_;
+    return true;
   }
-  ++written_;
-  logProblem("%s Connection of %@ refused or ended: %@", kOperation, who, why);
+  ++left_out_;
+  return false;
+}
+
+int RefusalLog::onWindowEnd(sd_event_source*, std::uint64_t, void* self) {
+  static_cast<RefusalLog*>(self)->endWindow();
+  return 0;
+}
+
+void RefusalLog::close() {
+  closed_ = true;
+  endWindow();
+}
+
+void RefusalLog::endWindow() {
+  window_end_ = sd_event_source_disable_unref(window_end_);
+  const std::uint64_t left_out = std::exchange(left_out_, 0);
+  if (left_out > 0)
+    logProblem("%s %llu more calls or connections were refused", kOperation, left_out);
 }
 
 }  // namespace spacekeep::ipc

@@ -1,11 +1,15 @@
 // Thread safety: confined to the IPC thread.
 //
-// Log lines about connections that were refused or cut off. Whoever can cause them can cause any
-// number of them, so only so many go out in a while.
+// Log lines about calls that were refused and connections that were refused or cut off. Whoever can
+// cause them can cause any number of them, so only so many go out in a while; how many were left out
+// is told when that time is over.
 #pragma once
 
 #include <cstdint>
 #include <string>
+#include <string_view>
+
+#include "support/ipc/linux/ipc_loop.h"
 
 namespace spacekeep::ipc {
 
@@ -14,12 +18,27 @@ class RefusalLog {
   static constexpr unsigned kLinesPerWindow = 20;
   static constexpr std::uint64_t kWindowNs = 10'000'000'000;
 
-  void write(const std::string& who, const std::string& why);
+  explicit RefusalLog(IpcLoop& loop, std::uint64_t window_ns = kWindowNs)
+      : loop_(loop), window_ns_(window_ns) {}
+  RefusalLog(const RefusalLog&) = delete;
+  RefusalLog& operator=(const RefusalLog&) = delete;
+
+  void write(std::string_view who, std::string_view why);
+  void writeCall(std::string_view who, std::string_view member, std::string_view why);
+  /// Tells what was left out so far. What comes later is written at once.
+  void close();
 
  private:
-  std::uint64_t window_ends_ = 0;  // in ticks
-  unsigned written_ = 0;
+  static int onWindowEnd(sd_event_source*, std::uint64_t usec, void* self);
+  bool mayWrite();
+  void endWindow();
+
+  IpcLoop& loop_;
+  const std::uint64_t window_ns_;
+  sd_event_source* window_end_ = nullptr;  // while a window is open
+  unsigned written_ = 0;                   // in it
   std::uint64_t left_out_ = 0;
+  bool closed_ = false;
 };
 
 }  // namespace spacekeep::ipc

@@ -11,6 +11,7 @@
 #include "support/ipc/lanes.h"
 #include "support/ipc/linux/bus_server.h"
 #include "support/ipc/linux/ipc_loop.h"
+#include "support/ipc/linux/lane_budget.h"
 #include "support/ipc/linux/refusal_log.h"
 #include "support/ipc/linux/sockets.h"
 #include "support/ipc/linux/user_pace.h"
@@ -28,8 +29,10 @@ struct ServerContext {
         interface(std::move(served)),
         options(std::move(server_options)),
         lanes(std::make_shared<Lanes>(global_queue)),
+        lane_budget(std::make_shared<LaneBudget>(options.limits.lanes)),
         turns(options.limits.turns),
-        pace(loop, options.limits.shares) {
+        pace(loop, options.limits.shares),
+        refusals(loop) {
     endpoint_rules.refuse_own_process = options.refuse_own_process;
   }
 
@@ -45,12 +48,13 @@ struct ServerContext {
   ConcurrentQueue& global;
   const ServedInterface interface;
   const ServerOptions options;
-  const std::shared_ptr<Lanes> lanes;  ///< any thread
-  ServingGate gate;                    ///< any thread; loop is there at least while one is inside
-  UserTurns turns;                     ///< IPC thread
-  UserPace pace;                       ///< IPC thread
-  EndpointRules endpoint_rules;        ///< IPC thread
-  RefusalLog refusals;                 ///< IPC thread
+  const std::shared_ptr<Lanes> lanes;             ///< any thread
+  const std::shared_ptr<LaneBudget> lane_budget;  ///< any thread
+  ServingGate gate;              ///< any thread; loop is there at least while one is inside
+  UserTurns turns;               ///< IPC thread
+  UserPace pace;                 ///< IPC thread
+  EndpointRules endpoint_rules;  ///< IPC thread
+  RefusalLog refusals;           ///< IPC thread
 };
 
 /// The peer of an accepted connection, as handlers see it.

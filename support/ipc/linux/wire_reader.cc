@@ -141,9 +141,9 @@ std::optional<Argument> WireReader::readOptional(const char* contents, Read read
 std::optional<Argument> WireReader::readDescriptor() {
   int fd = -1;
   if (sd_bus_message_read_basic(message_, 'h', &fd) <= 0) return malformed();
-  if (const std::string wrong = endpointProblem(fd, rules_); !wrong.empty()) {
-    problem_ = "cannot be used: " + wrong;
-    return std::nullopt;
+  // What becomes of a call with a useless endpoint is for its handler to say.
+  if (std::string wrong = endpointProblem(fd, rules_); !wrong.empty()) {
+    return Argument(std::make_shared<Descriptor>(std::move(wrong)));
   }
   const int own = ::fcntl(fd, F_DUPFD_CLOEXEC, 3);
   if (own < 0) return refuse("cannot be kept: this process has no descriptor left");

@@ -25,7 +25,7 @@ inline constexpr std::size_t kMaxValuesInMessage = 65'536;
 
 class WireReader {
  public:
-  /// Every descriptor argument has to satisfy `rules`.
+  /// A descriptor argument that does not satisfy `rules` is read as one with a problem.
   WireReader(sd_bus_message* message, const EndpointRules& rules)
       : message_(message), rules_(rules) {}
 

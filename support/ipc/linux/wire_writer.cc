@@ -1,6 +1,7 @@
 #include "support/ipc/linux/wire_writer.h"
 
 #include <cstdint>
+#include <cstring>
 #include <string>
 #include <type_traits>
 #include <variant>
@@ -94,7 +95,7 @@ bool WireWriter::writeContent(const Value& value, int depth) {
     return close();
   }
   if (const Data* data = value.data()) {
-    bytes_ += data->bytes.size() + 8;
+    count(4, 4 + data->bytes.size());
     return sd_bus_message_append_array(message_, 'y', data->bytes.data(), data->bytes.size()) >= 0;
   }
   if (const Date* date = value.date()) {
@@ -111,20 +112,34 @@ bool WireWriter::writeContent(const Value& value, int depth) {
 }
 
 bool WireWriter::writeText(std::string_view text) {
-  bytes_ += text.size() + 8;
-  return sd_bus_message_append_basic(message_, 's', wireText(text).c_str()) >= 0;
+  const std::string sendable = wireText(text);
+  count(4, 4 + sendable.size() + 1);
+  return sd_bus_message_append_basic(message_, 's', sendable.c_str()) >= 0;
 }
 
 bool WireWriter::writeBasic(char type, const void* value) {
-  bytes_ += 8;
+  const std::size_t size = type == 'x' || type == 't' || type == 'd' ? 8 : 4;
+  count(size, size);
   return sd_bus_message_append_basic(message_, type, value) >= 0;
 }
 
 bool WireWriter::open(char type, const char* contents) {
-  bytes_ += 8;
+  if (type == 'v') {
+    count(1, 1 + std::strlen(contents) + 1);  // the signature
+  } else if (type == 'a') {
+    count(4, 4);
+    count(contents[0] == '{' ? 8 : 1, 0);  // up to the first element
+  } else {
+    count(8, 0);
+  }
   return sd_bus_message_open_container(message_, type, contents) >= 0;
 }
 
 bool WireWriter::close() { return sd_bus_message_close_container(message_) >= 0; }
+
+/// As the D-Bus specification lays bodies out: padding to the alignment, then the bytes.
+void WireWriter::count(std::size_t alignment, std::size_t bytes) {
+  body_bytes_ = (body_bytes_ + alignment - 1) / alignment * alignment + bytes;
+}
 
 }  // namespace spacekeep::ipc

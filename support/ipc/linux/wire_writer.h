@@ -25,8 +25,10 @@ class WireWriter {
   /// False when an argument is of another kind than described, is nested deeper than
   /// kMaxValueDepth, or does not fit into a message. The message is then of no use.
   bool write(const std::vector<ArgumentDescription>& described, const Arguments& arguments);
-  /// About how large the message has become.
-  [[nodiscard]] std::size_t bytes() const { return bytes_; }
+  /// How large the message has become: its body to the byte, its header at most.
+  [[nodiscard]] std::size_t bytes() const { return kMostHeaderBytes + body_bytes_; }
+  /// Path, interface, member or error, destination, signature and numbers of any message.
+  static constexpr std::size_t kMostHeaderBytes = 512;
 
  private:
   bool writeArgument(ArgumentKind kind, const Argument& argument);
@@ -37,9 +39,10 @@ class WireWriter {
   bool writeBasic(char type, const void* value);
   bool open(char type, const char* contents);
   bool close();
+  void count(std::size_t alignment, std::size_t bytes);
 
   sd_bus_message* message_;
-  std::size_t bytes_ = 128;  // the header
+  std::size_t body_bytes_ = 0;
 };
 
 }  // namespace spacekeep::ipc

@@ -144,7 +144,8 @@ TEST(Calls, OfOneLaneRunSideBySideUpToItsWidth) {
   EXPECT_EQ(server.mostBlocked(), 2U);
 }
 
-TEST(Calls, BeyondTheUnansweredLimitAreRefusedByName) {
+TEST(Calls, BeyondTheUnansweredLimitAreRefusedByNameAndLogged) {
+  spacekeep::test::LogCapture log;
   ServerOptions options = TestServer::defaultOptions();
   options.limits.unanswered_calls = 3;
   TestServer server(options);
@@ -155,6 +156,10 @@ TEST(Calls, BeyondTheUnansweredLimitAreRefusedByName) {
   const Outcome refused = callAndWait(connection, "number", {std::int32_t{1}});
   ASSERT_TRUE(refused.error);
   EXPECT_EQ(refused.error->name, "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_EQ(log.count(kLogProblem, "SpacekeepListener number of "), 1U);
+  EXPECT_EQ(
+      log.count(kLogProblem, " refused: 3 calls of this connection are unanswered; wait for them"),
+      1U);
   expectHonestClientIsServed(server);
   server.takeHeld().reply({std::string()});
   EXPECT_TRUE(held[0].wait().reply);

@@ -1,5 +1,6 @@
 // How connections end, and that each end is told once and under its right name.
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
@@ -53,6 +54,19 @@ TEST(ConnectionEnd, APeerThatClosesWhileItLivesIsAnInvalidation) {
   EXPECT_TRUE(eventually([&] { return ends.all() == 1; }));
   EXPECT_EQ(ends.invalidations, 1);
   EXPECT_EQ(pending.ends(), 1U);
+}
+
+// A service that closes its connection may check in again at once, and must not find its old record.
+TEST(ConnectionEnd, APeerThatClosesWhileItLivesIsToldWithoutWaitingForItsDeath) {
+  TestServer server;
+  Ends ends;
+  ConnectionLimits limits;
+  limits.peer_death_ns = 3600'000'000'000;
+  const auto connection =
+      watched(server.loop, server.global, connectedTo(server.path()), ends, limits);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+  server.stop();
+  EXPECT_TRUE(eventually([&] { return ends.invalidations == 1; }));
 }
 
 enum class Does { kServe, kNeverAccept };
@@ -204,19 +218,33 @@ TEST(ConnectionEnd, APeerThatNeverAuthenticatesIsGivenUp) {
   EXPECT_TRUE(eventually([&] { return ends.invalidations == 1; }));
 }
 
-TEST(ConnectionEnd, AServedSocketPairWorksAndItsEndIsTold) {
+TEST(ConnectionEnd, OfASocketPairIsToldToTheOtherSideThoughBothEndsAreKept) {
   TestServer server;
   Ends ends;
-  SocketPair pair = makeSocketPair();
+  const SocketPair pair = makeSocketPair();
   std::atomic<int> served_ends = 0;
   server.server().serveConnected(pair.first, [&served_ends] { ++served_ends; });
   auto connection = watched(server.loop, server.global, pair.second, ends);
   EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
   connection->invalidate();
   EXPECT_TRUE(eventually([&] { return ends.invalidations == 1; }));
-  pair = {};
   EXPECT_TRUE(eventually([&] { return served_ends == 1; }));
   EXPECT_EQ(server.server().connections(), 0U);
+}
+
+// Who is cut off shall know it at once, since it has to check in again.
+TEST(ConnectionEnd, ThatALimitBringsIsSeenByThePeerThoughTheDescriptorIsKept) {
+  ConcurrentQueue global{{}};
+  IpcLoop loop;
+  Ends ends;
+  const SocketPair pair = makeSocketPair();
+  ConnectionLimits limits;
+  limits.authentication_ns = 50'000'000;
+  const auto connection = watched(loop, global, pair.first, ends, limits);
+  EXPECT_TRUE(eventually([&] {
+    pollfd state = {pair.second->fd(), 0, 0};
+    return ::poll(&state, 1, 0) == 1 && (state.revents & POLLHUP) != 0;
+  }));
 }
 
 }  // namespace

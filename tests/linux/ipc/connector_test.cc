@@ -61,6 +61,23 @@ TEST_F(Declared, AnEndedConnectionIsReplacedByANewOne) {
   EXPECT_TRUE(callAndWait(connectTo("svc"), "number", {std::int32_t{2}}).reply);
 }
 
+// A service that ends when it is idle is started again by the next connection.
+TEST_F(Declared, AConnectionThatTheServiceEndedIsReplacedAtOnce) {
+  TestServer next;
+  declare("svc");
+  const auto first = connectTo("svc");
+  PendingCall held(first, "hold", {});
+  ASSERT_TRUE(eventually([&] { return server.held() == 1; }));
+  server.stop();
+  std::string why;
+  next.server().serveListening(bindListeningSocket(directory / "svc.sock", 0600, why));
+  ASSERT_EQ(why, "");
+  ASSERT_TRUE(held.wait().error);
+  const auto second = connectTo("svc");
+  ASSERT_NE(second, first);
+  EXPECT_TRUE(callAndWait(second, "number", {std::int32_t{1}}).reply);
+}
+
 TEST_F(Declared, NobodyListeningIsNoConnection) { EXPECT_EQ(connectTo("svc"), nullptr); }
 
 TEST_F(Declared, AnUnsafeIdIsNoConnectionAndIsLogged) {

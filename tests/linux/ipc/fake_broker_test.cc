@@ -61,22 +61,29 @@ class FakeBroker {
   /// A call of "number" by the sender of that name. The name of the error, empty for success.
   std::string numberFrom(const char* sender) {
     sendNumberFrom(sender);
+    return errorOfLastCall();
+  }
+  void sendNumberFrom(const char* sender) {
+    sendFrom(sender, "number",
+             [](sd_bus_message* call) { EXPECT_GE(sd_bus_message_append(call, "i", 7), 0); });
+  }
+  void sendFrom(const char* sender, const char* member, const Fill& fill) {
+    sd_bus_message* made = nullptr;
+    EXPECT_GE(sd_bus_message_new_method_call(bus_, &made, nullptr, kObjectPath,
+                                             "com.quorvel.IpcTest", member),
+              0);
+    const OwnedMessage call(made);
+    fill(made);
+    EXPECT_GE(sd_bus_message_set_sender(made, sender), 0);
+    answered_ = false;
+    EXPECT_GE(sd_bus_send(bus_, made, &call_), 0);
+  }
+  std::string errorOfLastCall() {
     EXPECT_TRUE(eventually([this] {
       pump();
       return answered_;
     }));
     return error_;
-  }
-  void sendNumberFrom(const char* sender) {
-    sd_bus_message* made = nullptr;
-    EXPECT_GE(sd_bus_message_new_method_call(bus_, &made, nullptr, kObjectPath,
-                                             "com.quorvel.IpcTest", "number"),
-              0);
-    const OwnedMessage call(made);
-    EXPECT_GE(sd_bus_message_append(made, "i", 7), 0);
-    EXPECT_GE(sd_bus_message_set_sender(made, sender), 0);
-    answered_ = false;
-    EXPECT_GE(sd_bus_send(bus_, made, &call_), 0);
   }
 
  private:
@@ -220,6 +227,40 @@ TEST_F(FakeBrokerTest, AnAnswerThatSomebodyElseSendsCountsForNothing) {
   EXPECT_EQ(broker.numberFrom(":1.7"), "");
   EXPECT_EQ(asked, 2);
   EXPECT_EQ(server->served(), 1U);
+}
+
+/// An answer that was written in several parts, while nothing came.
+class AfterALargeAnswer : public FakeBrokerTest {
+ protected:
+  void SetUp() override {
+    broker.setCredentials([](sd_bus_message* answer) {
+      EXPECT_GE(sd_bus_message_append(answer, "a{sv}", 1, "UnixUserID", "u", 0), 0);
+    });
+    serve();
+    ASSERT_EQ(broker.numberFrom(":1.7"), "");
+    broker.sendFrom(":1.7", "hold", [](sd_bus_message*) {});
+    ASSERT_TRUE(eventually([this] { return server->held() == 1; }));
+    server->takeHeld().reply({std::string(900'000, 'x')});
+    server->loop.runAndWait([] {});
+    ASSERT_EQ(broker.errorOfLastCall(), "");
+  }
+};
+
+TEST_F(AfterALargeAnswer, ACallWithADescriptorIsRefusedAndTheBusIsServedOn) {
+  const SocketPair pair = makeSocketPair();
+  broker.sendFrom(":1.7", "takeDescriptor", [&pair](sd_bus_message* call) {
+    EXPECT_GE(sd_bus_message_append(call, "hs", pair.first->fd(), "text"), 0);
+  });
+  EXPECT_EQ(broker.errorOfLastCall(), "org.freedesktop.DBus.Error.NotSupported");
+  EXPECT_EQ(broker.numberFrom(":1.8"), "");
+}
+
+TEST_F(AfterALargeAnswer, ACallBeyondTheSizeLimitIsRefusedAndTheBusIsServedOn) {
+  broker.sendFrom(":1.7", "takeDescriptor", [](sd_bus_message* call) {
+    EXPECT_GE(sd_bus_message_append(call, "s", std::string(2 * 1024 * 1024, 'x').c_str()), 0);
+  });
+  EXPECT_EQ(broker.errorOfLastCall(), "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_EQ(broker.numberFrom(":1.8"), "");
 }
 
 TEST_F(FakeBrokerTest, ANameAnswerThatNobodyKnowsIsAProblemAndTriedAgain) {

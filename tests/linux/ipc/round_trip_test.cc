@@ -4,6 +4,7 @@
 
 #include <limits>
 
+#include "tests/helpers/log_capture.h"
 #include "tests/linux/ipc/ipc_world.h"
 
 namespace spacekeep::ipc::test {
@@ -118,12 +119,48 @@ TEST_F(RoundTrip, AMessageNearTheSizeLimitPasses) {
   EXPECT_EQ(echo(sent), sent);
 }
 
-TEST_F(RoundTrip, AnAnswerBeyondTheSizeLimitEndsTheConnection) {
+/// Numbers that come in two bytes each and go out in sixteen.
+Dictionary growing() { return {{"numbers", Array(std::vector<Value>(60'000, Value(7)))}}; }
+
+TEST_F(RoundTrip, ACallBeyondTheSizeLimitFailsAndNothingElse) {
+  spacekeep::test::LogCapture log;
+  const auto connection = server.connect();
+  PendingCall before(connection, "hold", {});
+  ASSERT_TRUE(eventually([this] { return server.held() == 1; }));
+  const Outcome outcome =
+      callAndWait(connection, "echo",
+                  arguments({{"large", std::string(600'000, 'x')}, {"numbers", growing()}}));
+  ASSERT_TRUE(outcome.error);
+  EXPECT_NE(outcome.error->text.find("and a message 1048576 at most"), std::string::npos)
+      << outcome.error->text;
+  EXPECT_EQ(log.count(kLogProblem, "send echo is not called, its arguments have "), 1U);
+  EXPECT_EQ(server.served(), 1U);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+  server.takeHeld().reply({std::string()});
+  EXPECT_TRUE(before.wait().reply);
+}
+
+TEST_F(RoundTrip, AnAnswerBeyondTheSizeLimitIsAnErrorAndNothingElse) {
+  spacekeep::test::LogCapture log;
+  const auto connection = server.connect();
+  PendingCall held(connection, "hold", {});
+  ASSERT_TRUE(eventually([this] { return server.held() == 1; }));
+  server.takeHeld().reply({std::string(1024 * 1024, 'x')});
+  const Outcome outcome = held.wait();
+  ASSERT_TRUE(outcome.error);
+  EXPECT_EQ(outcome.error->name, "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_EQ(log.count(kLogProblem, "refused: The answer has "), 1U);
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{1}}).reply);
+}
+
+TEST_F(RoundTrip, AnAnswerThatAPeerTakesNotEndsTheConnection) {
   ConnectionLimits limits;
   limits.message_bytes = 4096;
   const auto connection = server.connect(limits);
-  const Outcome outcome =
-      callAndWait(connection, "echo", arguments({{"large", std::string(8192, 'x')}}));
+  PendingCall held(connection, "hold", {});
+  ASSERT_TRUE(eventually([this] { return server.held() == 1; }));
+  server.takeHeld().reply({std::string(8192, 'x')});
+  const Outcome outcome = held.wait();
   ASSERT_TRUE(outcome.error);
   EXPECT_NE(outcome.error->text.find("more than 4096"), std::string::npos) << outcome.error->text;
 }

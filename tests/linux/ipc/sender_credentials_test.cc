@@ -19,7 +19,7 @@ namespace {
 
 class Credentials : public ::testing::Test {
  protected:
-  Credentials() : bus_(makeAuthenticatedBus(pair_.first->fd())) {}
+  Credentials() : bus_(makeAuthenticatedBus(pair_.first->fd()).bus) {}
   ~Credentials() override { sd_bus_close_unref(bus_); }
 
   /// From an answer that `fill` has put the entries into.

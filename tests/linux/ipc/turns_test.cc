@@ -66,6 +66,28 @@ TEST(Turns, AWritingEndClosedAfterACallIsNoticedAsTheEnd) {
   EXPECT_TRUE(eventually([&] { return server.server().connections() == 0; }));
 }
 
+// The answer goes out in several parts while nothing comes; what comes then is judged as ever.
+TEST(Turns, AClientThatTakesALargeAnswerLateMayPassADescriptorAfterwards) {
+  TestServer server;
+  BareClient client(server.path());
+  callNumber(client, 1);
+  sd_bus_message* call = client.newCall("hold");
+  std::uint64_t serial = 0;
+  ASSERT_GE(sd_bus_send(client.bus(), call, &serial), 0);
+  sd_bus_message_unref(call);
+  ASSERT_GE(sd_bus_flush(client.bus()), 0);
+  ASSERT_TRUE(eventually([&] { return server.held() == 1; }));
+  server.takeHeld().reply({std::string(900'000, 'x')});
+  server.loop.runAndWait([] {});
+  callNumber(client, 2);  // reads everything that is before its answer
+  const SocketPair pair = makeSocketPair();
+  sd_bus_message* passing = client.newCall("takeDescriptor");
+  ASSERT_GE(sd_bus_message_append(passing, "hs", pair.first->fd(), "text"), 0);
+  EXPECT_EQ(client.errorOf(passing), "");
+  ASSERT_NE(server.descriptor(), nullptr);
+  EXPECT_EQ(server.descriptor()->problem(), "");
+}
+
 TEST(Turns, ManyConnectionsWithWorkAtOnceAreAllServed) {
   constexpr int kClients = 60;
   TestServer server;

@@ -1,0 +1,67 @@
+// What the calls of one user may hold that wait in lanes, whatever becomes of their connections.
+#include <gtest/gtest.h>
+
+#include "support/ipc/linux/lane_budget.h"
+#include "tests/linux/ipc/ipc_world.h"
+
+namespace spacekeep::ipc::test {
+namespace {
+
+constexpr uid_t kUser = 7;
+
+TEST(LaneBudget, HoldsSoManyCallsOfAUserAndNoMore) {
+  const auto budget = std::make_shared<LaneBudget>(UserTurnLimits{2, 1000});
+  std::string why;
+  const auto first = budget->take(kUser, 10, why);
+  auto second = budget->take(kUser, 10, why);
+  EXPECT_NE(first, nullptr);
+  EXPECT_NE(second, nullptr);
+  EXPECT_EQ(budget->take(kUser, 10, why), nullptr);
+  EXPECT_EQ(why, "2 calls of this user with 20 bytes wait or are served; wait for answers");
+  EXPECT_NE(budget->take(kUser + 1, 10, why), nullptr);
+  second = nullptr;
+  EXPECT_NE(budget->take(kUser, 10, why), nullptr);
+}
+
+TEST(LaneBudget, HoldsExactlySoManyBytes) {
+  const auto budget = std::make_shared<LaneBudget>(UserTurnLimits{10, 100});
+  std::string why;
+  const auto first = budget->take(kUser, 60, why);
+  EXPECT_EQ(budget->take(kUser, 41, why), nullptr);
+  EXPECT_NE(budget->take(kUser, 40, why), nullptr);
+  EXPECT_EQ(budget->take(kUser, 101, why), nullptr);
+}
+
+TEST(LaneBudget, ARoomMayOutliveTheBudget) {
+  auto budget = std::make_shared<LaneBudget>(UserTurnLimits{1, 100});
+  std::string why;
+  auto room = budget->take(kUser, 60, why);
+  budget = nullptr;
+  room = nullptr;
+}
+
+TEST(CallsInALane, OfAUserWhoComesAndGoesAreBounded) {
+  ServerOptions options = TestServer::defaultOptions();
+  options.limits.lanes.waiting_calls = 5;
+  TestServer server(options);
+  std::vector<PendingCall> calls;
+  for (int i = 0; i < 5; ++i) {
+    const auto connection = server.connect();
+    calls.emplace_back(connection, "block", Arguments{});
+    // In order behind it on the same connection: so it was taken.
+    ASSERT_TRUE(callAndWait(connection, "number", {std::int32_t{i}}).reply);
+    connection->invalidate();
+  }
+  const auto connection = server.connect();
+  const Outcome refused = callAndWait(connection, "block", {});
+  ASSERT_TRUE(refused.error);
+  EXPECT_EQ(refused.error->name, "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_TRUE(callAndWait(connection, "number", {std::int32_t{9}}).reply);
+  server.releaseBlocked(5);
+  EXPECT_TRUE(eventually([&] { return server.blocked() == 0; }));
+  server.releaseBlocked(1);
+  EXPECT_TRUE(eventually([&] { return callAndWait(connection, "block", {}).reply.has_value(); }));
+}
+
+}  // namespace
+}  // namespace spacekeep::ipc::test

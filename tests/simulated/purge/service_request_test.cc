@@ -9,6 +9,10 @@
 namespace spacekeep::test {
 namespace {
 
+constexpr const char* kDonation =
+    "%s donation (%lld) = (amount needed[%llu] - amount_purged[%llu]) / "
+    "viable_purging_services[%llu])";
+
 TEST(PurgeRequest, TenMissingBytesAmongThreeServicesAreAskedAsThreeEach) {
   inEverySchedule(kSchedules, [] {
     PurgeWorld world;
@@ -153,6 +157,47 @@ TEST(PurgeRequest, AServiceThatIsAskedTwiceAtOneUrgencyKeepsItsLastAnswerInTheRe
     EXPECT_EQ(unsignedAt(outcome, keys::kAmountReported), 140U);
   });
   EXPECT_GT(asked_again, 0);
+}
+
+TEST(PurgeRequest, AShareThatIsNotYetComputedWhenThePurgeIsCancelledIsNotOffered) {
+  inEverySchedule(kSchedules, [] {
+    PurgeWorld world;
+    const auto gives = world.add("a", ownsAndAnswersAfter(1000, 1500 * kMs));
+    world.add("b", answers(sim::Answer::kNever));
+    const auto operation = world.make({{keys::kAmount, 100}, {keys::kUrgency, 1}});
+    world.world.after(1 * kSecond, [operation] { operation->cancelOperation(); });
+    world.run(*operation);
+    EXPECT_EQ(operation->purge_amount_reported(), 50U);
+    // The one that gave its share stood in the queue once more.
+    EXPECT_EQ(world.lines("%s queuing service: %@"), 3U);
+    EXPECT_EQ(world.lines(kDonation), 2U);
+    EXPECT_EQ(gives->callCount("servicePurge"), 1U);
+  });
+}
+
+// All three time out, so nobody is left to divide among; the first late answer takes one more away.
+// Whether the second offer to b finds it out of flight already is up to the schedule.
+TEST(PurgeRequest, ALateAnswerBelowItsShareMakesTheDivisorPassZero) {
+  std::atomic<int> offered_nothing = 0;
+  inEverySchedule(kSchedules, [&] {
+    PurgeWorld world;
+    world.add("a", ownsAndAnswersAfter(10, 3 * kSecond));
+    const auto whole = world.add("b", ownsAndAnswersAfter(1000, 3500 * kMs));
+    world.add("c", answers(sim::Answer::kNever));
+    const Dictionary outcome = world.purge({{keys::kAmount, 90}, {keys::kUrgency, 2}});
+    EXPECT_TRUE(world.world.trace().hasLine(
+        "queueServiceRequest donation (0) = (amount needed[90] - amount_purged[40]) / "
+        "viable_purging_services[18446744073709551615])"));
+    EXPECT_EQ(world.lines(kDonation), 4U);
+    EXPECT_EQ(whole->callCount("servicePurge"), 1U);
+    const Dictionary record = dictionaryAt(outcome, "SPACEKEEP_URGENCY_2_OPERATION_INFO");
+    ASSERT_TRUE(record.contains(keys::kServicesInFlight));
+    const Value in_flight = *record.find(keys::kServicesInFlight);
+    if (in_flight == Value(Array{"c"})) return;
+    EXPECT_EQ(in_flight, Value(Array{"b", "c"}));
+    ++offered_nothing;
+  });
+  EXPECT_GT(offered_nothing, 0);
 }
 
 }  // namespace

@@ -1,6 +1,8 @@
 // How long a purge takes, to the nanosecond of virtual time.
 #include <gtest/gtest.h>
 
+#include <algorithm>
+
 #include "tests/both/purge/purge_world.h"
 #include "tests/helpers/schedules.h"
 
@@ -128,10 +130,19 @@ TEST(PurgeWaits, ASilentServiceIsNamedInEachRecordAndAskedToStopAtTheEnd) {
       EXPECT_EQ(*record.find(keys::kServicesInFlight), Value(Array{"silent"}));
       EXPECT_TRUE(record.contains("SPACEKEEP_URGENCY_" + number + "_TIMEOUT_SECONDS"));
     }
-    EXPECT_TRUE(world.world.trace().hasLine("startOperation timed out waiting for: [\"silent\"]"));
+    const auto problems = world.world.trace().linesOfLevel(kLogProblem);
+    EXPECT_EQ(std::ranges::count(problems, "startOperation timed out waiting for: [\"silent\"]"),
+              3);
     EXPECT_TRUE(world.world.trace().hasLine("startOperation cancelling purge"));
     EXPECT_TRUE(world.eventually([&] { return silent->callCount("serviceCancelPurge") == 1; }));
     EXPECT_EQ(silent->callCount("servicePurge"), 1U);
+    // From the second urgency on there is nobody to divide among: the request ends with its first
+    // line and does not reach the services in flight.
+    EXPECT_EQ(world.lines("%s queuing service: %@"), 3U);
+    EXPECT_EQ(world.lines("%s donation (%lld) = (amount needed[%llu] - amount_purged[%llu]) / "
+                          "viable_purging_services[%llu])"),
+              1U);
+    EXPECT_EQ(world.lines("%s trying to add \"%@\", which is already inFlight"), 0U);
   });
 }
 

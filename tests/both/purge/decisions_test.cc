@@ -61,6 +61,12 @@ TEST(PurgeBucket, InSinglePrecisionTheLastOfAHundredMillionBytesIsNotSeen) {
   EXPECT_EQ(percentBucket(100'000'000, 99'999'999), 100);
 }
 
+// In double precision, or multiplied in single precision, they would be 70 and 90.
+TEST(PurgeBucket, InSinglePrecisionSevenAndNineTenthsAreNotQuiteReached) {
+  EXPECT_EQ(percentBucket(1000, 700), 60);
+  EXPECT_EQ(percentBucket(1000, 900), 80);
+}
+
 TEST(PurgeBucket, HasNoUpperLimitButThatOfItsType) {
   EXPECT_EQ(percentBucket(1, INT64_MAX), 2'147'483'640);
 }

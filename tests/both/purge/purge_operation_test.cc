@@ -189,6 +189,31 @@ TEST(Purge, EveryServiceAnswerReachesTheCompletionBeforeTheOutcome) {
   });
 }
 
+TEST(Purge, RunsWithoutACompletionAsWell) {
+  inEverySchedule(kSchedules, [] {
+    PurgeWorld world;
+    const auto cache = world.add("cache", sim::ownsBytes("/", 5000));
+    const auto operation = world.make(
+        {{keys::kAmount, 1000}, {keys::kUrgency, 1}, {keys::kPurgeTimeout, kPatientSeconds}});
+    operation->startOperation(nullptr);
+    EXPECT_EQ(world.lines("%s result %@"), 1U);
+    EXPECT_EQ(operation->purge_amount_reported(), 1000U);
+    EXPECT_EQ(cache->callCount("servicePurge"), 1U);
+    EXPECT_TRUE(
+        world.eventually([&] { return world.lines("%s %@ took %f seconds, purged: %@") == 1; }));
+    EXPECT_EQ(world.lines("%s %@ calling completion with: %@"), 0U);
+  });
+}
+
+TEST(Purge, WithoutACompletionAnAmountThatIsNoNumberIsRefusedInSilence) {
+  inEverySchedule(kSchedules, [] {
+    PurgeWorld world;
+    world.make({{keys::kAmount, "lots"}})->startOperation(nullptr);
+    EXPECT_EQ(world.lines("%s %d amount is not a number: %@"), 1U);
+    EXPECT_EQ(world.lines("%s result %@"), 0U);
+  });
+}
+
 TEST(Purge, LogsItsCourseInTheExactFormats) {
   inEverySchedule(kSchedules, [] {
     PurgeWorld world;
@@ -306,10 +331,10 @@ TEST(PurgeProgress, CountsTheBucketOnceAndTheBytes) {
     const auto& statistics = world.world.statistics();
     EXPECT_EQ(statistics.reported("cache.purged.150.percent"), 1);
     EXPECT_EQ(statistics.reported("cache.purged"), 1500);
-    EXPECT_TRUE(
-        world.world.trace().hasLine("reportPercentageForAmountRequested cache.purged.150.percent"));
-    EXPECT_TRUE(world.world.trace().hasLine(
-        "reportPercentageForAmountRequested cache donated 1500 of 1000"));
+    EXPECT_EQ(world.world.trace().linesOfLevel(kLogTrace),
+              (std::vector<std::string>{
+                  "reportPercentageForAmountRequested cache.purged.150.percent",
+                  "reportPercentageForAmountRequested cache donated 1500 of 1000"}));
   });
 }
 

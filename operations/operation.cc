@@ -32,7 +32,7 @@ bool SpacekeepOperation::initWithInfo(const Value& info, ServiceSnapshot service
     logProblem("%s info is not a dictionary!", "initWithInfo");
     return refuse("Parameter error, info is not a dict");
   }
-  if (const Value* volume = request->find(keys::kVolume)) volume_ = *volume;
+  if (const Value* volume = request->find(keys::kVolume)) setVolume(*volume);
   if (!volume_ || volume_->string() == nullptr) {
     logProblem("%s No Volume key in info: %@", "initWithInfo", *request);
     return refuse("Parameter error, no Volume key in info dict");
@@ -41,19 +41,20 @@ bool SpacekeepOperation::initWithInfo(const Value& info, ServiceSnapshot service
     logProblem("%s Unable to validate volume: %@", "initWithInfo", *volume_);
     return refuse("Parameter error, Unable to validate volume in info dict");
   }
-  collection_queue_ =
-      SerialQueue::create("com.quorvel.spacekeep_operation_collection", platform_.global);
-  message_queue_ = SerialQueue::create("com.quorvel.spacekeep_operation_message", platform_.global);
-  in_flight_.clear();
-  result_ = *request;
-  services_ = std::move(services);
-  info_ = *request;
-  urgency_limit_ = urgencyLimitOf(*request);
+  setCollection_queue(
+      SerialQueue::create("com.quorvel.spacekeep_operation_collection", platform_.global));
+  setMessage_queue(
+      SerialQueue::create("com.quorvel.spacekeep_operation_message", platform_.global));
+  setInFlight({});
+  setResult(*request);
+  setServices(std::move(services));
+  setInfo(*request);
+  setUrgencyLimit(urgencyLimitOf(*request));
   return true;
 }
 
 bool SpacekeepOperation::refuse(const char* error_text) {
-  result_ = Dictionary{{keys::kError, error_text}};
+  setResult({{keys::kError, error_text}});
   return false;
 }
 

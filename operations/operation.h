@@ -84,8 +84,16 @@ class SpacekeepOperation : public OperationInterface,
 
  protected:
   // Before the operation is started.
+  void setInfo(Dictionary info) { info_ = std::move(info); }
   void setServices(ServiceSnapshot services) { services_ = std::move(services); }
+  void setResult(Dictionary result) { result_ = std::move(result); }
+  void setInFlight(std::set<std::string> service_ids) { in_flight_ = std::move(service_ids); }
+  void setVolume(std::optional<Value> volume) { volume_ = std::move(volume); }
   void setUrgencyLimit(std::int32_t urgency_limit) { urgency_limit_ = urgency_limit; }
+  void setCollection_queue(std::shared_ptr<SerialQueue> queue) {
+    collection_queue_ = std::move(queue);
+  }
+  void setMessage_queue(std::shared_ptr<SerialQueue> queue) { message_queue_ = std::move(queue); }
 
   /// Null when the snapshot does not hold the ID.
   [[nodiscard]] std::shared_ptr<SKService> serviceFor(const std::string& service_id) const;

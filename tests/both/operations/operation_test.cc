@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+
 #include "operations/info_keys.h"
 #include "sim/world/world.h"
 #include "tests/helpers/schedules.h"
@@ -18,6 +20,20 @@ class IdleOperation : public SpacekeepOperation {
  public:
   using SpacekeepOperation::SpacekeepOperation;
   void startOperation(OperationCompletion completion) override { completion(result()); }
+};
+
+/// Lets a test set what only operations themselves may set.
+class OpenOperation : public IdleOperation {
+ public:
+  using IdleOperation::IdleOperation;
+  using SpacekeepOperation::setCollection_queue;
+  using SpacekeepOperation::setInFlight;
+  using SpacekeepOperation::setInfo;
+  using SpacekeepOperation::setMessage_queue;
+  using SpacekeepOperation::setResult;
+  using SpacekeepOperation::setServices;
+  using SpacekeepOperation::setUrgencyLimit;
+  using SpacekeepOperation::setVolume;
 };
 
 struct OperationWorld {
@@ -44,11 +60,16 @@ struct OperationWorld {
   }
   std::vector<std::string> problems() { return world.trace().linesOfLevel(kLogProblem); }
 
+  /// How often this line was written for tracing.
+  [[nodiscard]] std::ptrdiff_t traces(std::string_view text) const {
+    return std::ranges::count(world.trace().linesOfLevel(kLogTrace), text);
+  }
+
   [[nodiscard]] bool eventually(const std::function<bool()>& condition) {
     return world.eventually(condition, kPatienceNs);
   }
 
-  sim::World world;
+  mutable sim::World world;
   Platform& platform = world.platform();
   ServiceMap services;
 };
@@ -83,6 +104,17 @@ TEST(OperationConstruction, AVolumeThatIsANumberIsRefused) {
   });
 }
 
+TEST(OperationConstruction, TheVolumeOfARefusedRequestIsKeptAsItCame) {
+  inEverySchedule(kSchedules, [] {
+    OperationWorld world;
+    for (const Value& volume : {Value(7), Value("/gone")}) {
+      const auto operation = std::make_shared<IdleOperation>(world.platform);
+      EXPECT_FALSE(operation->initWithInfo(Dictionary{{keys::kVolume, volume}}, world.services));
+      EXPECT_EQ(operation->volume(), volume);
+    }
+  });
+}
+
 TEST(OperationConstruction, AVolumeThatIsNotMountedIsRefused) {
   inEverySchedule(kSchedules, [] {
     OperationWorld world;
@@ -109,6 +141,32 @@ TEST(OperationConstruction, TheResultStartsAsTheRequestKeyForKey) {
     EXPECT_EQ(operation->inFlightCount(), 0U);
     EXPECT_EQ(operation->collection_queue()->label(), "com.quorvel.spacekeep_operation_collection");
     EXPECT_EQ(operation->message_queue()->label(), "com.quorvel.spacekeep_operation_message");
+  });
+}
+
+TEST(OperationProperties, EachIsWhatItWasSetTo) {
+  inEverySchedule(kSchedules, [] {
+    OperationWorld world;
+    const auto operation = makeOperation<OpenOperation>(
+        world.platform, Dictionary{{keys::kVolume, "/"}}, world.services);
+    const auto collection = SerialQueue::create("collection", world.world.global());
+    const auto message = SerialQueue::create("message", world.world.global());
+    operation->setInfo({{"INFO", 1}});
+    operation->setServices(ServiceMap{{"cache", std::make_shared<SKService>("cache")}});
+    operation->setResult({{"RESULT", 2}});
+    operation->setInFlight({"a", "b"});
+    operation->setVolume(Value("/data"));
+    operation->setUrgencyLimit(4);
+    operation->setCollection_queue(collection);
+    operation->setMessage_queue(message);
+    EXPECT_EQ(operation->info(), (Dictionary{{"INFO", 1}}));
+    EXPECT_TRUE(operation->services().contains("cache"));
+    EXPECT_EQ(operation->result(), (Dictionary{{"RESULT", 2}}));
+    EXPECT_EQ(operation->copyInFlight(), (std::set<std::string>{"a", "b"}));
+    EXPECT_EQ(operation->volume(), Value("/data"));
+    EXPECT_EQ(operation->urgencyLimit(), 4);
+    EXPECT_EQ(operation->collection_queue(), collection);
+    EXPECT_EQ(operation->message_queue(), message);
   });
 }
 
@@ -143,6 +201,20 @@ TEST(UrgencyLimit, TheSecondKeyIsReadOnlyWhenTheFirstIsAbsent) {
 TEST(UrgencyLimit, ATextIsNoNumberAndStillHidesTheSecondKey) {
   EXPECT_EQ(urgencyLimitOf({{keys::kUrgency, "2"}, {keys::kUrgencyLimit, 1}}), 3);
   EXPECT_EQ(urgencyLimitOf({{keys::kUrgency, true}, {keys::kUrgencyLimit, 1}}), 3);
+}
+
+TEST(UrgencyLimit, AnOperationTakesItFromItsRequest) {
+  inEverySchedule(kSchedules, [] {
+    OperationWorld world;
+    const auto limitOf = [&](Dictionary info) {
+      info.set(keys::kVolume, "/");
+      return world.make(info)->urgencyLimit();
+    };
+    EXPECT_EQ(limitOf({}), 3);
+    EXPECT_EQ(limitOf({{keys::kUrgency, 4}}), 4);
+    EXPECT_EQ(limitOf({{keys::kUrgencyLimit, 2}}), 2);
+    EXPECT_EQ(limitOf({{keys::kUrgency, "2"}, {keys::kUrgencyLimit, 1}}), 3);
+  });
 }
 
 TEST(InFlight, AddingTwiceAnswersTrueThenFalseAndComplains) {
@@ -225,7 +297,7 @@ TEST(OperationCancel, AServiceWhoseConnectionFailsLeavesTheSet) {
     operation->updateInFlight("broken", true);
     operation->cancelOperation();
     EXPECT_TRUE(world.eventually([&] { return operation->inFlightCount() == 0; }));
-    EXPECT_TRUE(world.world.trace().hasLine("cancelOperation connection invalidated: broken"));
+    EXPECT_EQ(world.traces("cancelOperation connection invalidated: broken"), 1);
   });
 }
 
@@ -236,7 +308,7 @@ TEST(OperationCancel, AServiceWithoutARecordLeavesTheSetAsIfItsConnectionHadFail
     operation->updateInFlight("nobody", true);
     operation->cancelOperation();
     EXPECT_TRUE(world.eventually([&] { return operation->inFlightCount() == 0; }));
-    EXPECT_TRUE(world.world.trace().hasLine("cancelOperation connection invalidated: nobody"));
+    EXPECT_EQ(world.traces("cancelOperation connection invalidated: nobody"), 1);
   });
 }
 

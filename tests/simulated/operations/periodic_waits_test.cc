@@ -74,6 +74,8 @@ TEST(PeriodicWaits, AFailedConnectionStaysInFlightUntilTheLimit) {
       EXPECT_EQ(durationOf(world, amountOf(0)), 15 * kSecond);
       EXPECT_EQ(world.world.trace().linesWithFormat("%s connection invalidated"),
                 std::vector<std::string>{"startOperation connection invalidated"});
+      const auto traces = world.world.trace().linesOfLevel(kLogTrace);
+      EXPECT_EQ(std::ranges::count(traces, "startOperation connection invalidated"), 1);
       EXPECT_TRUE(
           world.world.trace().hasLine("startOperation timed out waiting for: [\"broken\"]"));
     });

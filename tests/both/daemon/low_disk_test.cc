@@ -202,25 +202,75 @@ TEST(LowDisk, APurgeThatFreesNothingIsStillCountedAndTheNextVolumeStillPurged) {
   });
 }
 
-TEST(LowDisk, TheKeepAliveTransactionLastsUntilTheLastPurgeHasEnded) {
-  inEverySchedule(20, [] {
-    LowDiskWorld world({"/data"});
-    sim::ServiceBehaviour silent = world.cache->behaviour();
+/// The one daemon of the process, with a service that holds each call until it is told to answer.
+struct HeldLowDiskWorld : LowDiskWorld {
+  explicit HeldLowDiskWorld(const std::vector<std::string>& low_volumes)
+      : LowDiskWorld(low_volumes) {
+    sim::ServiceBehaviour silent = cache->behaviour();
     silent.purge = {sim::CallBehaviour{.answer = sim::Answer::kNever}};
-    world.cache->setBehaviour(silent);
-    Spacekeep::setSharedPlatform(world.platform);
+    cache->setBehaviour(silent);
+    Spacekeep::setSharedPlatform(platform);
     Spacekeep::sharedSpacekeep()->clientSetState(Value(true), keys::kFinishEarly, [] {}, {});
     Spacekeep::sharedSpacekeep()->defaults_queue()->sync([] {});
-    sim::CountingKeepAlive& keep_alive = world.world.keepAlive();
-    rt::Thread handling("handling", [&] { handleStreamEvent(keep_alive, {{"_Flags", 0x4U}}); });
-    EXPECT_TRUE(world.eventually([&] { return !world.requests().empty(); }));
+  }
+  ~HeldLowDiskWorld() {
+    world.shutDown();
+    Spacekeep::resetSharedSpacekeep();
+  }
+  HeldLowDiskWorld(const HeldLowDiskWorld&) = delete;
+  HeldLowDiskWorld& operator=(const HeldLowDiskWorld&) = delete;
+
+  /// Handles one event as the stream has it handled.
+  rt::Thread handle(const std::string& thread) {
+    return {thread, [this] { handleStreamEvent(world.keepAlive(), {{"_Flags", 0x4U}}); }};
+  }
+  /// True once so many purges have asked the service.
+  [[nodiscard]] bool hasAsked(std::size_t times) {
+    return eventually([&] { return requests().size() == times; });
+  }
+};
+
+TEST(LowDisk, TheKeepAliveTransactionLastsUntilTheLastPurgeHasEnded) {
+  inEverySchedule(20, [] {
+    HeldLowDiskWorld world({"/data", "/z"});
+    const sim::CountingKeepAlive& keep_alive = world.world.keepAlive();
+    rt::Thread handling = world.handle("handling");
+    EXPECT_TRUE(world.hasAsked(1));
+    EXPECT_EQ(keep_alive.open(), 1);
+    world.cache->answerHeldCalls();
+    EXPECT_TRUE(world.hasAsked(2));
     EXPECT_EQ(keep_alive.open(), 1);
     world.cache->answerHeldCalls();
     handling.join();
     EXPECT_EQ(keep_alive.open(), 0);
     EXPECT_EQ(keep_alive.begun(), 1U);
-    world.world.shutDown();
-    Spacekeep::resetSharedSpacekeep();
+  });
+}
+
+TEST(LowDisk, TwoEventsAtTheSameTimeEachCountAndTheirPurgesRunOneAfterTheOther) {
+  inEverySchedule(20, [] {
+    HeldLowDiskWorld world({"/data"});
+    const sim::CountingKeepAlive& keep_alive = world.world.keepAlive();
+    rt::Thread one = world.handle("one");
+    rt::Thread other = world.handle("other");
+    EXPECT_TRUE(world.eventually([&] { return keep_alive.open() == 2; }));
+    EXPECT_TRUE(world.hasAsked(1));
+    world.cache->answerHeldCalls();
+    EXPECT_TRUE(world.hasAsked(2));
+    world.cache->answerHeldCalls();
+    one.join();
+    other.join();
+    const auto calls = world.cache->callsOf("servicePurge");
+    ASSERT_EQ(calls.size(), 2U);
+    EXPECT_GE(calls[1].arrived_ns, calls[0].ended_ns);
+    // Neither purge did anything before the other had its outcome.
+    std::vector<std::string> course;
+    for (const std::string& line : world.world.trace().linesOfLevel(kLogTrace)) {
+      if (line.starts_with("startOperation user_timeout_seconds")) course.emplace_back("begins");
+      if (line.starts_with("startOperation result")) course.emplace_back("ends");
+    }
+    EXPECT_EQ(course, (std::vector<std::string>{"begins", "ends", "begins", "ends"}));
+    EXPECT_EQ(world.world.statistics().timesReported("SK_LOWDISK_EVENT"), 2U);
   });
 }
 

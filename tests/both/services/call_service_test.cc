@@ -168,6 +168,38 @@ TEST(CallServiceAsync, RunsNothingFromWithinTheCall) {
   });
 }
 
+/// Each thread has slots of its own, so their address tells threads apart.
+const void* currentThread() { return &rt::threadSlot(rt::ThreadSlot::kPoolWorker); }
+
+TEST(CallServiceAsync, RunsNeitherHandlerOnTheThreadOfTheCaller) {
+  inEverySchedule(200, [] {
+    World world;
+    const void* const caller = currentThread();
+    std::atomic<const void*> called_on = nullptr;
+    std::atomic<const void*> failed_on = nullptr;
+    const auto call = [&](const std::shared_ptr<RemoteProxy>&, const ServiceCaller::Done& done) {
+      called_on = currentThread();
+      done();
+      world.called.signal();
+    };
+    const auto failure = [&] {
+      failed_on = currentThread();
+      world.failed.signal();
+    };
+    world.caller.CallServiceAsync(world.service, call, nullptr);
+    world.called.wait();
+    EXPECT_NE(called_on, caller);
+    for (const auto& unreachable :
+         {std::shared_ptr<const ServiceReference>(),
+          std::make_shared<const ServiceReference>(ServiceReference{"nobody", nullptr})}) {
+      failed_on = nullptr;
+      world.caller.CallServiceAsync(unreachable, world.askHandler(), failure);
+      world.failed.wait();
+      EXPECT_NE(failed_on, caller);
+    }
+  });
+}
+
 TEST(CallServiceAsync, KeepsTheOrderOfCallsToOneService) {
   inEverySchedule(300, [] {
     World world;

@@ -112,6 +112,15 @@ TEST_F(LinuxPlatformInADirectory, NamesAServiceThatDoesNotExistAsUnreachable) {
             nullptr);
 }
 
+TEST_F(LinuxPlatformInADirectory, MakesAFreshTokenEachTimeThatComparesByValue) {
+  LinuxPlatform linux_platform(noMethods(), paths_);
+  const Value one = linux_platform.platform().createSpacekeepToken();
+  const Value other = linux_platform.platform().createSpacekeepToken();
+  EXPECT_NE(one, other);
+  ASSERT_NE(one.string(), nullptr);
+  EXPECT_EQ(one, Value(*one.string()));
+}
+
 /// A tmpfs of that size over `directory`, in a mount namespace of this process.
 void mountSmall(const std::string& directory, const std::string& size) {
   ASSERT_EQ(::geteuid(), 0U) << "tests of a full volume mount, and have to run as root";

@@ -174,6 +174,16 @@ TEST_F(Volumes, ASecondMountOfAFileSystemIsValidButCountsOnce) {
   EXPECT_EQ(freeBytes(volumes_, first), freeBytes(volumes_, second));
 }
 
+TEST_F(Volumes, AFileSystemThatIsShortIsNamedOnceHoweverOftenItIsMounted) {
+  const std::string first = world_.mountFresh("tmpfs", "first", 100);
+  const std::string second = world_.directory("second");
+  world_.bind(first, second);
+  VolumeWorld::fill(first + "/file", 97 * kMiB);
+  const auto low = volumes_.lowSpaceVolumes();
+  EXPECT_EQ(std::ranges::count(low, first), 1);
+  EXPECT_FALSE(holds(low, second));
+}
+
 TEST_F(Volumes, TwoSubvolumesOfOneBtrfsCountOnce) {
   const std::string first = world_.mountFresh("btrfs", "first", 400);
   VolumeWorld::run("btrfs -q subvolume create " + first + "/sub");

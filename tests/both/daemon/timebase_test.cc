@@ -1,0 +1,45 @@
+// Elapsed time, from two readings of the tick counter.
+#include "support/timebase.h"
+
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <limits>
+
+namespace spacekeep::test {
+namespace {
+
+class ElapsedTime : public testing::Test {
+ protected:
+  ~ElapsedTime() override { gTimebaseConversion = before_; }
+
+  const double before_ = gTimebaseConversion;
+};
+
+TEST_F(ElapsedTime, IsTheTicksBetweenTimesTheConversion) {
+  gTimebaseConversion = 125.0 / 3.0;
+  EXPECT_DOUBLE_EQ(elapsedNs(1000, 1024), 1000.0);
+  EXPECT_EQ(elapsedNs(1000, 1000), 0.0);
+}
+
+TEST_F(ElapsedTime, OfASingleTickIsKeptHoweverLongTheCounterHasRun) {
+  gTimebaseConversion = 1.0;
+  constexpr std::uint64_t kMoreThanADoubleTellsApart = 9'007'199'254'740'992;
+  EXPECT_EQ(elapsedNs(kMoreThanADoubleTellsApart, kMoreThanADoubleTellsApart + 1), 1.0);
+  constexpr std::uint64_t kLast = std::numeric_limits<std::uint64_t>::max();
+  EXPECT_EQ(elapsedNs(kLast - 1, kLast), 1.0);
+}
+
+TEST_F(ElapsedTime, OfAStartAheadOfNowIsNegative) {
+  gTimebaseConversion = 2.0;
+  EXPECT_EQ(elapsedNs(10, 3), -14.0);
+  EXPECT_EQ(elapsedNs(9'007'199'254'740'993, 9'007'199'254'740'992), -2.0);
+}
+
+TEST_F(ElapsedTime, IsNothingWithoutATimebase) {
+  gTimebaseConversion = 0.0;
+  EXPECT_EQ(elapsedNs(0, 1'000'000'000), 0.0);
+}
+
+}  // namespace
+}  // namespace spacekeep::test

@@ -111,9 +111,11 @@ int LinuxEventSources::postNotification(const std::string& name) {
   // The signal is for whoever listens, nobody need, and the bus may be slow: not awaited.
   global_.async([socket = options_.system_bus_socket, name] {
     const int error = emitSystemSignal(socket, name);
-    if (error != 0) {
-      logTrace("%s no signal %s on the system bus: %s", "postNotification", name,
-               std::strerror(error));
+    if (error == ENOENT) {
+      logTrace("%s no system bus to send %s on", "postNotification", name);
+    } else if (error != 0) {
+      logProblem("%s no signal %s on the system bus: %s", "postNotification", name,
+                 std::strerror(error));
     }
   });
   if (name != kLaunchedNotification) return 0;

@@ -20,25 +20,40 @@ class NoVolumes final : public SpaceSource {
   void setThresholdsChangedHandler(std::function<void()>) override {}
 };
 
-TEST(LaunchSignal, WhenTheBusDoesNotListenATraceNamesTheSignalAndTheReason) {
-  ::unsetenv("NOTIFY_SOCKET");
-  const LogCapture log;
-  const ScratchDirectory directory;
-  directory.write("bus", "no socket");
-  NoVolumes space;
-  ConcurrentQueue global{ConcurrentQueue::Options{}};
-  LinuxEventSources events(
-      std::make_shared<EventLoop>(), global, space,
+class LaunchSignal : public testing::Test {
+ protected:
+  LaunchSignal() { ::unsetenv("NOTIFY_SOCKET"); }
+
+  LogCapture log_;
+  const ScratchDirectory directory_;
+  NoVolumes space_;
+  ConcurrentQueue global_{ConcurrentQueue::Options{}};
+  LinuxEventSources events_{
+      std::make_shared<EventLoop>(), global_, space_,
       LinuxEventSources::Options{.launch_directories = {},
-                                 .state_directory = directory.path(),
-                                 .power_supply_directory = directory.path() + "/power",
-                                 .system_bus_socket = directory.path() + "/bus"});
-  EXPECT_EQ(events.postNotification("com.quorvel.spacekeep.launched"), 0);
+                                 .state_directory = directory_.path(),
+                                 .power_supply_directory = directory_.path() + "/power",
+                                 .system_bus_socket = directory_.path() + "/bus"}};
+};
+
+TEST_F(LaunchSignal, WhenTheBusDoesNotListenAProblemNamesTheSignalAndTheReason) {
+  directory_.write("bus", "no socket");
+  EXPECT_EQ(events_.postNotification("com.quorvel.spacekeep.launched"), 0);
   EXPECT_TRUE(comesTrue([&] {
-    return log.countExact(kLogTrace,
-                          "postNotification no signal com.quorvel.spacekeep.launched on the system "
-                          "bus: Connection refused") == 1;
+    return log_.countExact(kLogProblem,
+                           "postNotification no signal com.quorvel.spacekeep.launched on the "
+                           "system bus: Connection refused") == 1;
   }));
+}
+
+TEST_F(LaunchSignal, WithoutABusThereIsATraceAndNoProblem) {
+  EXPECT_EQ(events_.postNotification("com.quorvel.spacekeep.launched"), 0);
+  EXPECT_TRUE(comesTrue([&] {
+    return log_.countExact(kLogTrace,
+                           "postNotification no system bus to send com.quorvel.spacekeep.launched "
+                           "on") == 1;
+  }));
+  EXPECT_TRUE(log_.texts(kLogProblem).empty());
 }
 
 }  // namespace

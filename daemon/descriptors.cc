@@ -51,6 +51,13 @@ void logParseFailure(const DescriptorError& error) {
   }
 }
 
+/// Without an ID a document is no descriptor. With one that is no string it was meant as one.
+void logUnusableId(const std::string& path, const Dictionary& descriptor) {
+  const Value* service_id = descriptor.find(keys::kServiceId);
+  if (service_id == nullptr || service_id->string() != nullptr) return;
+  logProblem("%s the ID in %@ is no string: %@", "scanPlistsAtPath", path, *service_id);
+}
+
 }  // namespace
 
 std::variant<Dictionary, DescriptorError> readDescriptor(DirectoryReader& files,
@@ -73,7 +80,9 @@ void Spacekeep::scanPlistsAtPath(const std::string& path,
     if (const auto* error = std::get_if<DescriptorError>(&descriptor)) {
       logParseFailure(*error);
     } else {
-      execBlock(std::get<Dictionary>(descriptor));
+      const auto& content = std::get<Dictionary>(descriptor);
+      logUnusableId(full_path, content);
+      execBlock(content);
     }
   }
 }

@@ -28,7 +28,8 @@ struct DescribedServices {
   std::vector<std::string> service_ids;  ///< in the order of the scan, an ID once per descriptor
 };
 
-/// Adds the service that `descriptor` declares. One without "SPACEKEEP_ID" is dropped silently.
+/// Adds the service that `descriptor` declares. One without "SPACEKEEP_ID", or with one that is no
+/// string, is dropped silently.
 void collectService(const Dictionary& descriptor, DescribedServices& found);
 
 }  // namespace spacekeep

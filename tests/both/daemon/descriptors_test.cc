@@ -100,15 +100,16 @@ TEST(Descriptors, WhatIsNoDictionaryIsLoggedAndSkippedAndSubdirectoriesAreRead) 
     world.start();
     EXPECT_EQ(world.services().size(), 1U);
     EXPECT_TRUE(world.services().contains("b"));
-    // The text, the array, the unreadable file and the directory.
-    const auto problems = world.world.trace().linesOfLevel(kLogProblem);
-    EXPECT_EQ(problems.size(), 4U);
-    EXPECT_TRUE(world.world.trace().hasLine("scanPlistsAtPath property list parse failed: (none)"));
-    EXPECT_TRUE(world.world.trace().hasLine(
-        "scanPlistsAtPath property list parse failed: permission denied"));
-    for (const std::string& problem : problems) {
-      EXPECT_EQ(problem.find("scanPlistsAtPath property list parse failed: "), 0U) << problem;
-    }
+    // The text, the array, the unreadable file and the directory: each with its reason, and none
+    // for the array alone, which is a document.
+    EXPECT_EQ(
+        world.world.trace().linesOfLevel(kLogProblem),
+        (std::vector<std::string>{
+            "scanPlistsAtPath property list parse failed: not a property list: it is not well "
+            "formed",
+            "scanPlistsAtPath property list parse failed: (none)",
+            "scanPlistsAtPath property list parse failed: permission denied",
+            "scanPlistsAtPath property list parse failed: not a regular file"}));
   });
 }
 
@@ -133,6 +134,24 @@ TEST(Descriptors, WithoutAnIdADocumentIsDroppedWithoutAMessage) {
     world.start();
     EXPECT_TRUE(world.services().empty());
     EXPECT_TRUE(world.world.trace().linesOfLevel(kLogProblem).empty());
+  });
+}
+
+TEST(Descriptors, AnIdThatIsNoStringIsLoggedAndTheFileSkipped) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    addDescriptor(world, std::string(kSystem) + "number.plist", {{"SPACEKEEP_ID", 5}});
+    addDescriptor(world, std::string(kSystem) + "list.plist", {{"SPACEKEEP_ID", Array{"a"}}});
+    addDescriptor(world, std::string(kSystem) + "b.plist", {{"SPACEKEEP_ID", "b"}});
+    world.start();
+    EXPECT_EQ(world.daemons(), std::set<std::string>{"b"});
+    EXPECT_EQ(world.services().size(), 1U);
+    EXPECT_EQ(world.world.trace().linesOfLevel(kLogProblem),
+              (std::vector<std::string>{
+                  "scanPlistsAtPath the ID in //System/Library/Spacekeep//number.plist is no "
+                  "string: 5",
+                  "scanPlistsAtPath the ID in //System/Library/Spacekeep//list.plist is no string: "
+                  "[\"a\"]"}));
   });
 }
 

@@ -1,5 +1,6 @@
 // Thread safety: every member may be called from any thread unless it says otherwise. Each guarded
-// collection is touched on its own queue only, and its accessor checks that.
+// collection is touched on its own queue only, and its accessor checks that. What may be set without
+// a queue is set while nobody else uses the object.
 //
 // The one long-lived object of the daemon. It owns the serial queues on which all work is ordered,
 // the service registry, the preferences suite and the listener, and it is what the listener
@@ -70,7 +71,7 @@ class Spacekeep : public SpacekeepClientProtocol,
   /// Forgets the object and the platform. For tests, which have many worlds in one process.
   static void resetSharedSpacekeep();
 
-  // Fields. The queues, rootPath and default_values are constant after init.
+  // Fields. The queues and rootPath are constant after init.
   [[nodiscard]] const std::shared_ptr<SerialQueue>& collection_queue() const;
   [[nodiscard]] const std::shared_ptr<SerialQueue>& defaults_queue() const;
   [[nodiscard]] const std::shared_ptr<SerialQueue>& purge_queue() const;
@@ -78,9 +79,11 @@ class Spacekeep : public SpacekeepClientProtocol,
   [[nodiscard]] const std::shared_ptr<SerialQueue>& periodic_queue() const;
   [[nodiscard]] const std::shared_ptr<SerialQueue>& notify_queue() const;
   [[nodiscard]] const std::shared_ptr<SerialQueue>& daemons_queue() const;
+  [[nodiscard]] const std::string& rootPath() const { return root_path_; }
+  // The next four lie on no queue. The daemon sets them in init alone; set them before the first
+  // client comes or after the last one has gone, from one thread.
   [[nodiscard]] SpacekeepListener* listener() const { return listener_.get(); }
   void setListener(std::unique_ptr<SpacekeepListener> listener) { listener_ = std::move(listener); }
-  [[nodiscard]] const std::string& rootPath() const { return root_path_; }
   [[nodiscard]] const Dictionary& default_values() const { return default_values_; }
   void setDefault_values(Dictionary values) { default_values_ = std::move(values); }
   /// Declared, never used by the daemon: stays absent.

@@ -69,6 +69,17 @@ TEST(StartUp, TheTimebaseGivesNanosecondsPerTick) {
   });
 }
 
+TEST(StartUp, ReadsTheTimebaseOfTheMachine) {
+  inEverySchedule(kSchedules, [] {
+    StartedWorld world;
+    gTimebaseConversion = 0.0;
+    world.startProcess();
+    EXPECT_EQ(gTimebaseConversion, 1.0);
+    EXPECT_TRUE(
+        world.world.trace().hasLine("main timebaseInfo:  1 / 1, gTimebaseConversion: 1.000000"));
+  });
+}
+
 TEST(StartUp, WithoutATimebaseTheConversionStaysAsItIs) {
   inEverySchedule(kSchedules, [] {
     DaemonWorld world;
@@ -85,10 +96,19 @@ TEST(DailyActivity, InAnyStateButRunDoesNothingInsideItsTransaction) {
                            ActivityState::kContinue, ActivityState::kDone}) {
     inEverySchedule(kSchedules, [&] {
       StartedWorld world;
+      sim::ServiceBehaviour silent;  // a pass that asks it lasts to the pass's limit
+      silent.periodic.answer = sim::Answer::kNever;
+      const auto purging = world.world.declareService("purging", silent);
       world.startProcess();
+      const std::uint64_t before_ns = world.world.nowNs();
       ASSERT_TRUE(world.world.events().runActivity(kDaily, state));
       EXPECT_TRUE(world.eventually([&] { return world.world.keepAlive().begun() == 2; }));
       EXPECT_TRUE(world.eventually([&] { return world.world.keepAlive().open() == 0; }));
+      if (!onRealThreads()) {
+        EXPECT_LT(world.world.nowNs(), before_ns + 1'000'000'000);
+      }
+      EXPECT_EQ(purging->callCount("servicePeriodic"), 0U);
+      EXPECT_EQ(world.lines("%s result: %@"), 0U);
       EXPECT_FALSE(world.world.keepAlive().wentNegative());
       EXPECT_TRUE(world.world.trace().linesOfLevel(kLogProblem).empty());
     });

@@ -93,7 +93,7 @@ void DailyActivity::wakeNext(std::uint64_t boot_ns) {
 void DailyActivity::run(const RunRecord& record) {
   plan_.record = record;
   keepRecord();
-  logTrace("%s runs %s", "DailyActivity", options_.name);
+  logTrace("%s runs %s", "run", options_.name);
   call(ActivityState::kRun);
 }
 
@@ -111,7 +111,7 @@ void DailyActivity::keepRecord() {
   plan_.record = recordAsOf(plan_.record, now);
   kept_boot_ns_ = now.boot_ns;
   if (const auto reason = host_->saveRecord(plan_.record)) {
-    logProblem("%s cannot keep the run times of %s: %s", "DailyActivity", options_.name, *reason);
+    logProblem("%s cannot keep the run times of %s: %s", "keepRecord", options_.name, *reason);
   }
 }
 

@@ -51,39 +51,40 @@ ServiceCaller::ServiceCaller(ConcurrentQueue& global, ipc::Connector& connector,
 
 void ServiceCaller::CallServiceAsync(std::shared_ptr<const ServiceReference> service,
                                      CallHandler call, FailureHandler failure) {
-  start(std::move(service), std::move(call), std::move(failure), nullptr);
+  start("CallServiceAsync", std::move(service), std::move(call), std::move(failure), nullptr);
 }
 
 void ServiceCaller::CallService(std::shared_ptr<const ServiceReference> service, CallHandler call,
                                 FailureHandler failure) {
   // Shared, because the one that signals may still be inside signal() when the wait has ended.
   const auto returned = std::make_shared<CountingSemaphore>(0U);
-  start(std::move(service), std::move(call), std::move(failure),
+  start("CallService", std::move(service), std::move(call), std::move(failure),
         [returned] { returned->signal(); });
   returned->wait();
 }
 
 /// Nothing runs on the caller's thread. Failures run on the global queue and not in the service's
 /// order: they may wait for queues of the operation.
-void ServiceCaller::start(std::shared_ptr<const ServiceReference> service, CallHandler call,
-                          FailureHandler failure, Invoked invoked) {
+void ServiceCaller::start(const char* operation, std::shared_ptr<const ServiceReference> service,
+                          CallHandler call, FailureHandler failure, Invoked invoked) {
   auto attempt = std::make_shared<Attempt>(std::move(failure), std::move(invoked));
   if (service == nullptr) {
     global_.async([attempt] { attempt->fail(); });
     return;
   }
   const auto order = orderOf(service->ID);
-  order->async([this, service = std::move(service), call = std::move(call), attempt] {
+  order->async([this, operation, service = std::move(service), call = std::move(call), attempt] {
     const auto connection = reach(*service);
     if (connection == nullptr) {
-      logTrace("%s %@ cannot be reached", "CallService", service->ID);
+      logTrace("%s %@ cannot be reached", operation, service->ID);
       global_.async([attempt] { attempt->fail(); });
       return;
     }
-    auto proxy = connection->remoteProxy([id = service->ID, attempt](const ipc::Error& error) {
-      logTrace("%s calling %@ failed: %@", "CallService", id, error.text);
-      attempt->fail();
-    });
+    auto proxy =
+        connection->remoteProxy([operation, id = service->ID, attempt](const ipc::Error& error) {
+          logTrace("%s calling %@ failed: %@", operation, id, error.text);
+          attempt->fail();
+        });
     call(std::move(proxy), [attempt] { attempt->done(); });
     attempt->invoked();
   });
@@ -100,7 +101,7 @@ std::shared_ptr<SerialQueue> ServiceCaller::orderOf(const std::string& service_i
   if (const auto found = orders_.find(service_id); found != orders_.end()) {
     if (auto order = found->second.lock()) return order;
   }
-  auto order = SerialQueue::create("services." + service_id, global_);
+  auto order = SerialQueue::create("com.quorvel.spacekeep_services." + service_id, global_);
   orders_[service_id] = order;
   return order;
 }

@@ -49,8 +49,9 @@ class ServiceCaller {
   class Attempt;
   using Invoked = std::function<void()>;
 
-  void start(std::shared_ptr<const ServiceReference> service, CallHandler call,
-             FailureHandler failure, Invoked invoked);
+  /// `operation` is the literal by which the log names the form of the call.
+  void start(const char* operation, std::shared_ptr<const ServiceReference> service,
+             CallHandler call, FailureHandler failure, Invoked invoked);
   [[nodiscard]] std::shared_ptr<ipc::Connection> reach(const ServiceReference& service) const;
   [[nodiscard]] std::shared_ptr<SerialQueue> orderOf(const std::string& service_id);
   void forgetUnusedOrders();

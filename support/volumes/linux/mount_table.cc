@@ -19,8 +19,6 @@
 namespace spacekeep {
 namespace {
 
-constexpr const char* kOperation = "MountTable";
-
 struct FreeTable {
   void operator()(libmnt_table* table) const { mnt_unref_table(table); }
 };
@@ -125,7 +123,7 @@ void MountTable::readAgain() {
   const auto table = readTable(path_);
   stale_ = !table.has_value();
   if (!table) {
-    logProblem("%s cannot read the mount table %s: %s", kOperation, path_,
+    logProblem("%s cannot read the mount table %s: %s", "readAgain", path_,
                std::generic_category().message(errno));
     return;
   }

@@ -73,6 +73,17 @@ TEST_F(DailyActivityAtWork, KeepsTheRunOnDiskBeforeItStarts) {
   EXPECT_LE(record->boot_ns, bootClockNs());
 }
 
+TEST_F(DailyActivityAtWork, ARunIsLoggedAndSoIsARecordThatCannotBeKept) {
+  const LogCapture log;
+  directory_.write("daily.run/in the way", "");
+  const auto activity = start({.interval_seconds = 86400});
+  called_.wait();
+  called_.wait();
+  loop_->stop();
+  EXPECT_EQ(log.countExact(kLogTrace, "run runs daily"), 1U);
+  EXPECT_TRUE(log.contains(kLogProblem, "keepRecord cannot keep the run times of daily: "));
+}
+
 TEST_F(DailyActivityAtWork, ARestartDoesNotRunAgainBeforeItIsDue) {
   const Clocks now = readSystemClocks();
   ASSERT_EQ(saveRunRecord(record_path_,

@@ -40,13 +40,38 @@ TEST(CheckIn, UnderAnIdOfADescriptorIsAnsweredWithNeitherResultNorError) {
     world.start();
     const auto impostor = world.world.addService("declared");
     const auto before = world.services();
-    const auto call = world.world.checkIn(impostor, kPurges);
+    const auto call = world.world.checkIn(
+        impostor,
+        {{"PURGE", false}, {"PERIODIC", true}, {"SPACEKEEP_NOTIFICATIONS", Array{"news"}}});
     EXPECT_EQ(call->wait(), std::nullopt);
     EXPECT_EQ(call->state(), CallState::kAnswered);
     EXPECT_EQ(std::get<ipc::OptionalString>(call->answer()[1]), std::nullopt);
     EXPECT_EQ(world.services(), before);
+    const auto record = world.services().at("declared");
+    EXPECT_TRUE(record->doesPurge());
+    EXPECT_FALSE(record->doesPeriodic());
+    EXPECT_EQ(record->desiredNotifications(), std::nullopt);
+    EXPECT_EQ(record->connection, nullptr);
     EXPECT_TRUE(impostor->calls().empty());
     EXPECT_TRUE(world.world.trace().linesOfLevel(kLogProblem).empty());
+  });
+}
+
+TEST(CheckIn, UnderAnIdOfADescriptorIsAnsweredWithNothingAlsoWithoutTheEntitlement) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.world.declareService("declared", {});
+    world.start();
+    const std::size_t lines_before = world.world.trace().linesOfLevel(kLogTrace).size();
+    const auto impostor = world.world.addService("declared");
+    const auto call =
+        world.world.call(world.world.client("nobody"), "clientCheckin",
+                         {std::string("declared"), world.world.endpointOf(impostor), kPurges});
+    EXPECT_EQ(call->wait(), std::nullopt);
+    EXPECT_EQ(call->state(), CallState::kAnswered);
+    EXPECT_EQ(std::get<ipc::OptionalString>(call->answer()[1]), std::nullopt);
+    EXPECT_TRUE(world.world.trace().linesOfLevel(kLogProblem).empty());
+    EXPECT_EQ(world.world.trace().linesOfLevel(kLogTrace).size(), lines_before);
   });
 }
 
@@ -118,15 +143,23 @@ TEST(CheckIn, AServiceThatClosesItsConnectionIsRemovedAndMayComeBack) {
   });
 }
 
-TEST(CheckIn, AServiceWhoseProcessDiesIsRemoved) {
+TEST(CheckIn, AServiceWhoseProcessDiesIsRemovedAndMayComeBack) {
   inEverySchedule(kSchedules, [] {
     DaemonWorld world;
     world.start();
     const auto cache = world.world.addService("cache");
     world.world.checkIn(cache, kPurges)->wait();
+    const auto first = world.services().at("cache");
     cache->die();
     EXPECT_TRUE(world.eventually([&] { return world.services().empty(); }));
     EXPECT_TRUE(world.world.trace().hasLine("clientCheckin interruptionHandler ENTRY"));
+    cache->start();
+    EXPECT_EQ(world.world.checkIn(cache, kPurges)->wait(),
+              (Dictionary{{"SPACEKEEP_ID", "cache"}, {"ANON", true}}));
+    const auto second = world.services().at("cache");
+    EXPECT_NE(second, first);
+    EXPECT_NE(second->connection, first->connection);
+    EXPECT_EQ(cache->callCount("servicePing"), 2U);
   });
 }
 

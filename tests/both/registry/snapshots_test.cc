@@ -13,6 +13,7 @@ TEST(ServiceRecord, StartsWithEverythingFalseOrAbsent) {
   EXPECT_FALSE(service.doesPurge());
   EXPECT_FALSE(service.doesPeriodic());
   EXPECT_FALSE(service.doNotQuery());
+  EXPECT_EQ(service.desiredNotifications(), std::nullopt);
   EXPECT_EQ(service.endpoint(), nullptr);
   EXPECT_EQ(service.connection, nullptr);
 }

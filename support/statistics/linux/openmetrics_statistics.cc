@@ -1,9 +1,12 @@
 #include "support/statistics/linux/openmetrics_statistics.h"
 
+#include <algorithm>
+#include <array>
 #include <cmath>
 #include <mutex>
 #include <optional>
 #include <span>
+#include <string_view>
 
 #include "support/files/linux/atomic_file.h"
 #include "support/statistics/linux/openmetrics_text.h"
@@ -27,6 +30,16 @@ std::optional<Key> keyOf(std::string_view domain, std::string_view key) {
   constexpr std::size_t kMost = OpenMetricsStatistics::kMaxNameBytes;
   if (domain.size() > kMost || key.size() > kMost) return std::nullopt;
   return Key(lineOf(domain), lineOf(key));
+}
+
+/// By its end, which the daemon puts behind the ID of a service. The ID itself may be anything.
+bool isOfService(const Key& key) {
+  constexpr std::string_view kSumOfAll = "total.purged";
+  constexpr std::array<std::string_view, 3> kEnds = {".purged", "_purgeElapsedNanoseconds",
+                                                     "_purgeableElapsedNanoseconds"};
+  return key.second != kSumOfAll &&
+         std::any_of(kEnds.begin(), kEnds.end(),
+                     [&key](std::string_view end) { return key.second.ends_with(end); });
 }
 
 prometheus::Labels labelsOf(const Key& key) { return {{"domain", key.first}, {"key", key.second}}; }
@@ -69,15 +82,17 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
 
  private:
   [[nodiscard]] bool fullOfPercentages() const { return percent_keys_ >= kMaxPercentKeys; }
-  [[nodiscard]] bool full() const {
-    return counters_.size() - percent_keys_ + histograms_.size() >= kMaxKeys;
+  [[nodiscard]] bool fullFor(const Key& key) const {
+    if (counters_.size() - percent_keys_ + histograms_.size() >= kMaxKeys) return true;
+    return isOfService(key) && service_keys_ >= kMaxKeys - kOwnKeys;
   }
 
   prometheus::Counter* counterOf(const Key& key) {
     if (const auto found = counters_.find(key); found != counters_.end()) return found->second;
     const bool is_percentage = key.second.ends_with(kPercentEnd);
-    if (is_percentage ? fullOfPercentages() : full()) return nullptr;
+    if (is_percentage ? fullOfPercentages() : fullFor(key)) return nullptr;
     if (is_percentage) ++percent_keys_;
+    if (isOfService(key)) ++service_keys_;
     prometheus::Counter& counter = reports_.Add(labelsOf(key));
     counters_.emplace(key, &counter);
     return &counter;
@@ -85,7 +100,8 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
 
   prometheus::Histogram* histogramOf(const Key& key) {
     if (const auto found = histograms_.find(key); found != histograms_.end()) return found->second;
-    if (full()) return nullptr;
+    if (fullFor(key)) return nullptr;
+    if (isOfService(key)) ++service_keys_;
     prometheus::Histogram& histogram = distributions_.Add(labelsOf(key), buckets());
     histograms_.emplace(key, &histogram);
     return &histogram;
@@ -132,6 +148,7 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
           .Register(registry_);
   std::map<Key, prometheus::Counter*> counters_;
   std::size_t percent_keys_ = 0;  // among the counters
+  std::size_t service_keys_ = 0;  // of services, percentages left out
   std::map<Key, prometheus::Histogram*> histograms_;
 };
 

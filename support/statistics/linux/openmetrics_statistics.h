@@ -32,8 +32,11 @@ class OpenMetricsStatistics : public Statistics {
   /// Between a change and the file that shows it, and so between two files.
   static constexpr std::uint64_t kWriteDelayNs = 10'000'000'000;
   /// Distinct pairs of domain and key, counters and distributions together; further ones are
-  /// dropped. Room for a sum of each of the 4,096 services, and for the daemon's own.
+  /// dropped. Enough for a sum of each of the 4,096 services while few of them bring distributions.
   static constexpr std::size_t kMaxKeys = 4608;
+  /// Of these, places that no key of a service takes: what the daemon counts of itself, such as
+  /// events of low space, is never dropped for the sake of services, however many there are.
+  static constexpr std::size_t kOwnKeys = 64;
   /// Counters of how often a percentage came, which end so, have a bound of their own: each service
   /// may bring any number of them, and would soon leave no room for a sum.
   static constexpr std::string_view kPercentEnd = ".percent";

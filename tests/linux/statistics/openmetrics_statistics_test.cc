@@ -147,6 +147,26 @@ TEST_F(Statistic, PercentagesWithoutEndLeaveRoomForSumsAndDistributions) {
                       "\"cache.purged.10.percent\"} 2"));
 }
 
+TEST_F(Statistic, ManyServicesLeaveRoomForWhatTheDaemonCountsOfItself) {
+  for (std::size_t i = 0; i < OpenMetricsStatistics::kMaxKeys / 2; ++i) {
+    report("service" + std::to_string(i) + ".purged", 1);
+    observe("service" + std::to_string(i) + "_purgeElapsedNanoseconds", 1);
+  }
+  observe("one more_purgeableElapsedNanoseconds", 1);
+  report("SK_LOWDISK_EVENT", 1);
+  observe("SpacekeepPurgeElapsedNanoseconds", 1);
+  report("service0.purged", 1);
+  const std::string file = text();
+  EXPECT_EQ(linesWith(file, ".purged\"} ") + linesWith(file, "_count{") - 1,
+            OpenMetricsStatistics::kMaxKeys - OpenMetricsStatistics::kOwnKeys);
+  EXPECT_EQ(linesWith(file, "one more"), 0U);
+  const std::string domain = "{domain=\"com.quorvel.spacekeep\",key=";
+  EXPECT_TRUE(hasLine(file, "spacekeep_report_total" + domain + "\"SK_LOWDISK_EVENT\"} 1"));
+  EXPECT_TRUE(hasLine(
+      file, "spacekeep_distribution_count" + domain + "\"SpacekeepPurgeElapsedNanoseconds\"} 1"));
+  EXPECT_TRUE(hasLine(file, "spacekeep_report_total" + domain + "\"service0.purged\"} 2"));
+}
+
 TEST_F(Statistic, NothingIsScheduledOrWrittenWhileNothingChanges) {
   EXPECT_TRUE(schedule_.tasks.empty());
   EXPECT_FALSE(std::filesystem::exists(path_));

@@ -68,7 +68,7 @@ TEST(CheckIn, UnderAnIdOfADescriptorIsAnsweredWithNothingAlsoWithoutTheEntitleme
         world.world.call(world.world.client("nobody"), "clientCheckin",
                          {std::string("declared"), world.world.endpointOf(impostor), kPurges});
     EXPECT_EQ(call->wait(), std::nullopt);
-    EXPECT_EQ(call->state(), CallState::kAnswered);
+    ASSERT_EQ(call->state(), CallState::kAnswered);
     EXPECT_EQ(std::get<ipc::OptionalString>(call->answer()[1]), std::nullopt);
     EXPECT_TRUE(world.world.trace().linesOfLevel(kLogProblem).empty());
     EXPECT_EQ(world.world.trace().linesOfLevel(kLogTrace).size(), lines_before);

@@ -141,6 +141,20 @@ std::vector<LineRule> aboutHeaders() {
   return {names, defaults, null, free_blocks, regexes};
 }
 
+std::vector<LineRule> aboutQueues() {
+  LineRule labels = rule("QueueLabelsOfTheirOwn", Where::kProduction, Look::kText,
+                         "SerialQueue::create\\(\"(?!com\\.quorvel\\.spacekeep_[a-z])",
+                         "\"com.quorvel.spacekeep_\" and the role: who watches queues finds all");
+  labels.words = {"SerialQueue::create"};
+  labels.exceptions = {{"sim/", "queues of the world around the daemon"}};
+  labels.planted = {"SerialQueue::create(\"services.\" + id, global_);",
+                    "SerialQueue::create(\"com.quorvel.spacekeep_\", global);"};
+  labels.harmless = {"SerialQueue::create(\"com.quorvel.spacekeep_purge\", global);",
+                     "SerialQueue::create(\"com.quorvel.spacekeep_services.\" + id, global);",
+                     "SerialQueue::create(std::string label, ConcurrentQueue& global);"};
+  return {labels};
+}
+
 std::vector<LineRule> aboutEveryText() {
   LineRule open = rule("ThingsLeftOpen", Where::kAllTexts, Look::kText,
                        "(^|[^A-Za-z])(TO"
@@ -189,7 +203,8 @@ std::vector<LineRule> aboutEveryText() {
 
 std::vector<LineRule> bannedTexts() {
   std::vector<LineRule> all;
-  for (const auto& group : {aboutTheSeam(), aboutOwners(), aboutHeaders(), aboutEveryText()}) {
+  for (const auto& group :
+       {aboutTheSeam(), aboutOwners(), aboutHeaders(), aboutQueues(), aboutEveryText()}) {
     all.insert(all.end(), group.begin(), group.end());
   }
   return all;

@@ -11,9 +11,7 @@
 namespace spacekeep::cachedir {
 namespace {
 
-std::int64_t nsOfStatx(const statx_timestamp& time) {
-  return time.tv_sec * kNsPerSecond + static_cast<std::int64_t>(time.tv_nsec);
-}
+std::int64_t nsOfStatx(const statx_timestamp& time) { return nsOf(time.tv_sec, time.tv_nsec); }
 
 Entry::Kind kindOf(const struct statx& facts, const Root& root) {
   if (S_ISDIR(facts.stx_mode)) return Entry::Kind::kDirectory;

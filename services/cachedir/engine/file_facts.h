@@ -6,6 +6,7 @@
 #include <compare>
 #include <cstddef>
 #include <cstdint>
+#include <limits>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -56,8 +57,17 @@ struct FoundFile {
   return {static_cast<std::uint64_t>(facts.st_dev), static_cast<std::uint64_t>(facts.st_ino)};
 }
 
+/// Nanoseconds reach from 1677 to 2262; what lies beyond counts as the end on its side. The
+/// smallest number of all is no time of a file: it stands for what comes before every file.
+[[nodiscard]] inline std::int64_t nsOf(std::int64_t seconds, std::int64_t nanoseconds) {
+  constexpr std::int64_t kLatest = std::numeric_limits<std::int64_t>::max();
+  if (seconds >= kLatest / kNsPerSecond) return kLatest;
+  if (seconds <= -kLatest / kNsPerSecond) return -kLatest;
+  return seconds * kNsPerSecond + nanoseconds;
+}
+
 [[nodiscard]] inline std::int64_t nsOf(const timespec& time) {
-  return static_cast<std::int64_t>(time.tv_sec) * kNsPerSecond + time.tv_nsec;
+  return nsOf(time.tv_sec, time.tv_nsec);
 }
 
 /// A file system that keeps no access times still tells when the content was written.

@@ -11,11 +11,10 @@
 #include <limits>
 
 #include "services/cachedir/engine/beneath.h"
+#include "services/cachedir/engine/file_facts.h"
 
 namespace spacekeep::command {
 namespace {
-
-constexpr std::int64_t kNsPerSecond = 1'000'000'000;
 
 std::optional<std::uint64_t> hexadecimal(std::string_view text) {
   std::uint64_t number = 0;
@@ -73,7 +72,7 @@ std::optional<std::int64_t> deletionTimeNs(std::string_view record) {
   date.tm_isdst = -1;  // whatever held then
   const std::time_t seconds = std::mktime(&date);
   if (seconds == -1) return std::nullopt;
-  return static_cast<std::int64_t>(seconds) * kNsPerSecond;
+  return cachedir::nsOf(seconds, 0);
 }
 
 std::optional<std::int64_t> trashTimeNs(int trash_fd, std::string_view path) {

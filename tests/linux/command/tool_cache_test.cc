@@ -274,6 +274,7 @@ TEST(TrashTime, WhatWasThrownAwayIsAsOldAsItsRecordSays) {
                           "\nDeletionDate=2024-1-31T23:59:59\n", "\nDeletionDate=2024-01-31\n"}) {
     EXPECT_EQ(deletionTimeNs(bad), std::nullopt) << bad;
   }
+  EXPECT_EQ(deletionTimeNs("\nDeletionDate=2300-01-31T23:59:59\n"), INT64_MAX);
   const std::string trash = temporaryDirectory();
   writeFile(trash + "/files/a/deep/file", 1);
   writeFile(trash + "/files/orphan", 1);

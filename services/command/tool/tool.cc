@@ -144,25 +144,16 @@ class Running {
   }
 
   void drain(ToolRun& run) {
-    std::array<char, 16384> part;
-    for (ssize_t got; (got = readFrom(output_, part)) > 0;) {
+    readSome(output_, [&run](std::string_view part) {
       const std::size_t room = kMaxOutputBytes - run.output.size();
-      run.cut = run.cut || static_cast<std::size_t>(got) > room;
-      run.output.append(part.data(), std::min(static_cast<std::size_t>(got), room));
-    }
-    for (ssize_t got; (got = readFrom(complaint_, part)) > 0;) {
-      run.complaint.append(part.data(), static_cast<std::size_t>(got));
-      if (run.complaint.size() <= kMaxComplaintBytes) continue;
+      run.cut = run.cut || part.size() > room;
+      run.output += part.substr(0, room);
+    });
+    readSome(complaint_, [&run](std::string_view part) {
+      run.complaint += part;
+      if (run.complaint.size() <= kMaxComplaintBytes) return;
       run.complaint.erase(0, run.complaint.size() - kMaxComplaintBytes);
-    }
-  }
-
-  /// A closed end is no longer watched: it would be ready for ever.
-  static ssize_t readFrom(UniqueFd& fd, std::array<char, 16384>& part) {
-    if (!fd) return 0;
-    const ssize_t got = ::read(fd.get(), part.data(), part.size());
-    if (got == 0) fd.reset();
-    return got;
+    });
   }
 
   const pid_t pid_;
@@ -173,6 +164,20 @@ class Running {
 };
 
 }  // namespace
+
+void readSome(UniqueFd& fd, const std::function<void(std::string_view)>& keep) {
+  std::array<char, 16384> part;
+  // As much as a pipe holds at most, so that nothing stays when the other end has gone.
+  for (std::size_t reads = 0; fd && reads < kMaxOutputBytes / part.size(); ++reads) {
+    const ssize_t got = ::read(fd.get(), part.data(), part.size());
+    if (got < 0) return;
+    if (got == 0) {
+      fd.reset();
+    } else {
+      keep({part.data(), static_cast<std::size_t>(got)});
+    }
+  }
+}
 
 std::string whereIs(const std::string& name) {
   if (name.find('/') != std::string::npos) return isProgram(name) ? name : "";

@@ -5,10 +5,13 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "services/cachedir/engine/cancel_token.h"
+#include "services/cachedir/engine/unique_fd.h"
 #include "services/command/base/user_folders.h"
 
 namespace spacekeep::command {
@@ -48,6 +51,10 @@ struct ToolRun {
 
 [[nodiscard]] ToolRun runTool(const Words& words, const std::vector<std::string>& environment,
                               std::uint64_t limit_ns, const cachedir::CancelToken& cancel);
+
+/// Reads what is there, at most a MiB, so that a tool that writes faster than anybody reads can still
+/// be stopped in between. At its end `fd` is closed: it would be ready for ever.
+void readSome(cachedir::UniqueFd& fd, const std::function<void(std::string_view)>& keep);
 
 /// "journalctl --vacuum-time=30d", with quotation marks where a word needs them.
 [[nodiscard]] std::string textOf(const Words& words);

@@ -1,9 +1,11 @@
 // Running other programs: what they get, and how they end.
 #include "services/command/tool/tool.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <signal.h>
+#include <unistd.h>
 
 #include <fstream>
 
@@ -102,6 +104,38 @@ TEST(Tool, MoreOutputThanThereIsRoomForIsCutAndSaid) {
   EXPECT_TRUE(run.cut);
   EXPECT_EQ(run.output.size(), kMaxOutputBytes);
   EXPECT_EQ(run.complaint.size(), kMaxComplaintBytes);
+}
+
+TEST(Tool, OfOutputThatNeverEndsOneTurnReadsAPartOnly) {
+  cachedir::UniqueFd endless(::open("/dev/zero", O_RDONLY | O_CLOEXEC));
+  std::size_t read = 0;
+  readSome(endless, [&read](std::string_view part) { read += part.size(); });
+  EXPECT_EQ(read, kMaxOutputBytes);
+  EXPECT_TRUE(endless);
+}
+
+TEST(Tool, OneTurnReadsAllThatAPipeHolds) {
+  int ends[2];
+  ASSERT_EQ(::pipe2(ends, O_CLOEXEC | O_NONBLOCK), 0);
+  cachedir::UniqueFd reading(ends[0]);
+  cachedir::UniqueFd writing(ends[1]);
+  ASSERT_GE(::fcntl(writing.get(), F_SETPIPE_SZ, kMaxOutputBytes), 0);
+  const std::string all(kMaxOutputBytes, 'x');
+  ASSERT_EQ(::write(writing.get(), all.data(), all.size()), static_cast<ssize_t>(all.size()));
+  std::size_t read = 0;
+  readSome(reading, [&read](std::string_view part) { read += part.size(); });
+  EXPECT_EQ(read, kMaxOutputBytes);
+  EXPECT_TRUE(reading);
+  writing.reset();
+  readSome(reading, [](std::string_view) { ADD_FAILURE(); });
+  EXPECT_FALSE(reading) << "an end that is closed would be ready for ever";
+}
+
+TEST(Tool, OneThatWritesWithoutEndIsEndedInTime) {
+  const std::uint64_t begin = rt::ticks();
+  const ToolRun run = play({"yes"}, kSecondNs / 5);
+  EXPECT_EQ(run.end, ToolEnd::kTimedOut);
+  EXPECT_LT(cachedir::elapsedNs(begin), 10 * kSecondNs);
 }
 
 TEST(Tool, OneThatTakesTooLongIsEndedWithItsWholeGroup) {

@@ -21,7 +21,7 @@ class FileGuard {
  public:
   enum class Verdict {
     kAlone,     // nobody has it: the lease is ours
-    kUnproven,  // no lock, and leases are not to be had here; what /proc shows must do
+    kUnproven,  // no lock, and leases are not to be had here; /proc must tell, and show all
     kLocked,
     kOpen,
   };

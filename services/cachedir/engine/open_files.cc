@@ -30,6 +30,8 @@ File openText(const std::string& path) { return File(std::fopen(path.c_str(), "r
 
 bool isNumber(const char* name) { return name[0] >= '0' && name[0] <= '9'; }
 
+bool isRefusal(int error) { return error == EACCES || error == EPERM; }
+
 std::vector<std::uint64_t> devicesOf(const std::vector<Root>& roots) {
   std::vector<std::uint64_t> devices;
   for (const Root& root : roots) {
@@ -54,10 +56,15 @@ bool OpenFiles::scan(const std::vector<Root>& roots, const CancelToken& cancel) 
   devices_ = devicesOf(roots);
   const Directory processes(::opendir(proc_.c_str()));
   if (!processes) return false;
+  bool first_seen = false;
   while (const dirent* entry = ::readdir(processes.get())) {
     if (cancel.cancelled() || held_.size() > kMaxHeldFiles) return false;
-    if (isNumber(entry->d_name)) scanProcess(proc_ + "/" + entry->d_name);
+    if (!isNumber(entry->d_name)) continue;
+    first_seen = first_seen || std::string_view(entry->d_name) == "1";
+    scanProcess(proc_ + "/" + entry->d_name);
   }
+  // Where whole processes are left out (hidepid, proc(5)) the first one is, too.
+  if (!first_seen) ++hidden_;
   scanLocks();
   std::ranges::sort(held_);
   held_.erase(std::unique(held_.begin(), held_.end()), held_.end());
@@ -67,35 +74,37 @@ bool OpenFiles::scan(const std::vector<Root>& roots, const CancelToken& cancel) 
 }
 
 void OpenFiles::scanProcess(const std::string& process) {
-  scanDescriptors(process);
-  scanMappings(process);
+  const bool descriptors = mayScanDescriptors(process);
+  const bool mappings = mayScanMappings(process);
+  if (!descriptors || !mappings) ++hidden_;
 }
 
-void OpenFiles::scanDescriptors(const std::string& process) {
+/// Who may list the descriptors may not always ask what they are: a process with privileges that we
+/// lack shows their numbers alone.
+bool OpenFiles::mayScanDescriptors(const std::string& process) {
   const Directory descriptors(::opendir((process + "/fd").c_str()));
-  if (!descriptors) {
-    if (errno == EACCES || errno == EPERM) ++hidden_;
-    return;
-  }
+  if (!descriptors) return !isRefusal(errno);
+  bool allowed = true;
   const int fd = ::dirfd(descriptors.get());
   while (const dirent* entry = ::readdir(descriptors.get())) {
+    if (!isNumber(entry->d_name)) continue;
     char first = 0;
+    const ssize_t size = ::readlinkat(fd, entry->d_name, &first, 1);
+    if (size < 0 && isRefusal(errno)) allowed = false;
     // Only what has a path is a file; asking a socket or a pipe further would be a waste.
-    if (!isNumber(entry->d_name) || ::readlinkat(fd, entry->d_name, &first, 1) != 1 ||
-        first != '/') {
-      continue;
-    }
+    if (size != 1 || first != '/') continue;
     struct statx facts {};
     // Without a question to a server: a descriptor on a dead network mount must not hold us up.
     if (::statx(fd, entry->d_name, AT_STATX_DONT_SYNC | AT_NO_AUTOMOUNT, STATX_INO, &facts) == 0) {
       remember({makedev(facts.stx_dev_major, facts.stx_dev_minor), facts.stx_ino});
     }
   }
+  return allowed;
 }
 
-void OpenFiles::scanMappings(const std::string& process) {
+bool OpenFiles::mayScanMappings(const std::string& process) {
   const File maps = openText(process + "/maps");
-  if (!maps) return;
+  if (!maps) return !isRefusal(errno);
   char line[512];
   bool at_start = true;
   while (std::fgets(line, sizeof line, maps.get()) != nullptr) {
@@ -110,6 +119,7 @@ void OpenFiles::scanMappings(const std::string& process) {
       remember({makedev(major_number, minor_number), inode});
     }
   }
+  return true;
 }
 
 /// Lines as "1: FLOCK  ADVISORY  WRITE 660 08:02:12345 0 EOF"; the device is hexadecimal

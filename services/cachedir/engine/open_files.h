@@ -34,13 +34,14 @@ class OpenFiles {
   [[nodiscard]] bool holds(const Inode& inode, std::uint64_t file_system) const;
   /// The inode numbers on the file system of `root` that somebody held at the scan.
   [[nodiscard]] std::set<std::uint64_t> heldOn(const Root& root) const;
-  /// Processes whose descriptors could not be read.
+  /// Processes that could not be looked into at the scan. Who owns a process may, if it has no
+  /// privileges that the one who looks has not; for others it takes CAP_SYS_PTRACE.
   [[nodiscard]] std::uint64_t hiddenProcesses() const { return hidden_; }
 
  private:
   void scanProcess(const std::string& process);
-  void scanDescriptors(const std::string& process);
-  void scanMappings(const std::string& process);
+  [[nodiscard]] bool mayScanDescriptors(const std::string& process);
+  [[nodiscard]] bool mayScanMappings(const std::string& process);
   void scanLocks();
   void remember(const Inode& inode);
 

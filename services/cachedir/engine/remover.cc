@@ -92,6 +92,7 @@ std::variant<Removal, Left> Remover::take(const Candidate& candidate, const Canc
       return Left::kOpen;
     case FileGuard::Verdict::kUnproven:
       if (seenOpen(candidate, false, cancel)) return Left::kOpen;
+      if (open_files_.hiddenProcesses() > 0) return Left::kUnproven;
       break;
     case FileGuard::Verdict::kAlone:
       break;

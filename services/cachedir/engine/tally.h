@@ -18,6 +18,7 @@ enum class Left : std::size_t {
   kNothingBack,  // its blocks are shared or not allocated: deleting it would give nothing
   kUsedSince,    // used, replaced or linked after it was chosen
   kUnreadable,   // cannot be opened, so nobody can tell whether it is in use
+  kUnproven,     // no lease is to be had on it, and /proc hides who may have it open
   kTooDeep,      // below kMaxDepth directories, or its path is too long
   kFailed,       // the file system refused
   kCount,
@@ -30,6 +31,7 @@ inline constexpr std::array<std::string_view, static_cast<std::size_t>(Left::kCo
     "nothing to give back",
     "used since chosen",
     "unreadable",
+    "not known to be unused",
     "too deep",
     "refused by the file system"};
 

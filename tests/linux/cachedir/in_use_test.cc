@@ -2,16 +2,21 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <linux/capability.h>
 #include <sys/file.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
 
 #include "services/cachedir/engine/file_guard.h"
+#include "services/cachedir/engine/link_groups.h"
 #include "services/cachedir/engine/open_files.h"
+#include "services/cachedir/engine/remover.h"
+#include "services/cachedir/engine/tree_walk.h"
 #include "tests/linux/cachedir/cache_world.h"
 
 namespace spacekeep::cachedir {
@@ -167,23 +172,118 @@ TEST_P(InUse, AFileLinkedAfterTheWalkIsSpared) {
   EXPECT_TRUE(exists(held_));
 }
 
-/// Runs `body` in another process under the user `nobody`; answers whether it said true.
-bool asNobody(const std::function<bool()>& body) {
-  constexpr uid_t kNobody = 65534;
-  const pid_t child = ::fork();
-  if (child == 0) {
-    if (::setresgid(kNobody, kNobody, kNobody) != 0) ::_exit(2);
-    if (::setresuid(kNobody, kNobody, kNobody) != 0) ::_exit(2);
-    ::_exit(body() ? 0 : 1);
+constexpr uid_t kNobody = 65534;
+
+bool becomeNobody() {
+  return ::setresgid(kNobody, kNobody, kNobody) == 0 && ::setresuid(kNobody, kNobody, kNobody) == 0;
+}
+
+/// Keeps the privileges of which `keep` says so.
+bool limitPrivileges(const std::function<bool(unsigned)>& keep) {
+  __user_cap_header_struct about{_LINUX_CAPABILITY_VERSION_3, 0};
+  __user_cap_data_struct sets[2]{};
+  if (::syscall(SYS_capget, &about, sets) != 0) return false;
+  for (unsigned each = 0; each < 64; ++each) {
+    if (keep(each)) continue;
+    sets[each / 32].effective &= ~(1U << (each % 32));
+    sets[each / 32].permitted &= ~(1U << (each % 32));
   }
+  return ::syscall(SYS_capset, &about, sets) == 0;
+}
+
+/// Runs `body` in another process once it has become what `become` makes of it; answers whether both
+/// said true.
+bool asAnother(const std::function<bool()>& become, const std::function<bool()>& body) {
+  const pid_t child = ::fork();
+  if (child == 0) ::_exit(become() && body() ? 0 : 1);
   int status = 0;
   EXPECT_EQ(::waitpid(child, &status, 0), child);
   return WIFEXITED(status) && WEXITSTATUS(status) == 0;
 }
 
-TEST_P(InUse, WithoutTheRightToALeaseWhatProcShowsDecides) {
+bool asNobody(const std::function<bool()>& body) { return asAnother(becomeNobody, body); }
+
+bool asRootWith(const std::function<bool(unsigned)>& privileges,
+                const std::function<bool()>& body) {
+  return asAnother([&] { return limitPrivileges(privileges); }, body);
+}
+
+bool openAsNobody(const char* path) { return becomeNobody() && holdOpen(path); }
+
+/// Deletes the file `path` below the directory of `rules`, with `proc` in the place of /proc; why not,
+/// none when it went.
+std::optional<Left> objectionTo(const std::string& path, const Rules& rules,
+                                const std::string& proc) {
+  const OpenedRoots opened = openRoots(rules, {});
+  OpenFiles open_files(proc);
+  if (!open_files.scan(opened.roots, {})) return Left::kFailed;
+  Remover remover(opened.roots, open_files, {});
+  std::optional<Left> why = Left::kFailed;
+  const auto visit = [&](const FoundFile& found) {
+    if (!path.ends_with("/" + std::string(found.name))) return;
+    const auto outcome = remover.take(candidateOf(found, 0), {});
+    const auto* left = std::get_if<Left>(&outcome);
+    why = left != nullptr ? std::optional(*left) : std::nullopt;
+  };
+  Tally tally;
+  TreeWalk(opened.roots).forEachFile(visit, {}, tally);
+  return why;
+}
+
+TEST_P(InUse, WithoutTheRightToALeaseWhatProcShowsDecidesIfItShowsEveryProcess) {
+  for (const std::string& file : {held_, free_}) {
+    ASSERT_EQ(::chown(file.c_str(), kNobody, kNobody), 0);
+  }
+  const std::string proc = temporaryDirectory();
+  run("mkdir -p " + proc + "/17/fd && ln -s " + held_ + " " + proc + "/17/fd/3");
+  const auto allButLeases = [](unsigned each) { return each != CAP_LEASE; };
+  const Rules rules = rulesFor(volume_.path());
+  EXPECT_TRUE(asRootWith(allButLeases, [&] {
+    return objectionTo(free_, rules, proc) == Left::kUnproven &&
+           objectionTo(held_, rules, proc) == Left::kOpen;
+  }));
+  run("mkdir -p " + proc + "/1/fd");
+  EXPECT_TRUE(asRootWith(allButLeases, [&] {
+    return objectionTo(free_, rules, proc) == std::nullopt &&
+           objectionTo(held_, rules, proc) == Left::kOpen;
+  }));
+  EXPECT_TRUE(exists(held_));
+  EXPECT_FALSE(exists(free_));
+}
+
+TEST_P(InUse, AFileOfAnotherUserStaysWhenNeitherALeaseNorProcCanTell) {
+  ASSERT_EQ(::chown(held_.c_str(), kNobody, kNobody), 0);
+  const Holder holder([this] { return openAsNobody(held_.c_str()); });
+  // Of its own files a lease still tells.
+  EXPECT_TRUE(asRootWith([](unsigned) { return false; },
+                         [this] {
+                           const Observed seen = freeIn(volume_.path(), 2 * kMiB);
+                           return seen.paths == std::vector<std::string>{free_} &&
+                                  seen.result.left.of(Left::kUnproven) == 1;
+                         }));
+  EXPECT_TRUE(exists(held_));
+  EXPECT_FALSE(exists(free_));
+}
+
+TEST_P(InUse, ThePrivilegeOfLeasesAloneTellsOfFilesOfOtherUsers) {
+  for (const std::string& file : {held_, free_}) {
+    ASSERT_EQ(::chown(file.c_str(), kNobody, kNobody), 0);
+  }
+  const Holder holder([this] { return openAsNobody(held_.c_str()); });
+  EXPECT_TRUE(asRootWith([](unsigned each) { return each == CAP_LEASE; },
+                         [this] {
+                           const Observed seen = freeIn(volume_.path(), 2 * kMiB);
+                           return seen.paths == std::vector<std::string>{free_} &&
+                                  seen.result.left.of(Left::kOpen) == 1;
+                         }));
+  EXPECT_TRUE(exists(held_));
+  EXPECT_FALSE(exists(free_));
+}
+
+TEST_P(InUse, WithoutTheRightToALeaseAFileStaysWhereProcHidesProcesses) {
   // Files of root in a directory of another user, who may delete them and gets no lease on them.
   ASSERT_EQ(::chmod((volume_ / "").c_str(), 0777), 0);
+  ::rmdir((volume_ / "lost+found").c_str());  // ext4's own, which cannot be read
   EXPECT_TRUE(asNobody([this] {
     const UniqueFd fd(::open(free_.c_str(), O_RDONLY | O_CLOEXEC));
     return FileGuard(fd.get()).verdict() == FileGuard::Verdict::kUnproven;
@@ -191,14 +291,16 @@ TEST_P(InUse, WithoutTheRightToALeaseWhatProcShowsDecides) {
   EXPECT_TRUE(asNobody([this] {
     const UniqueFd user(::open(held_.c_str(), O_RDONLY | O_CLOEXEC));
     const Observed seen = freeIn(volume_.path(), 2 * kMiB);
-    return seen.paths == std::vector<std::string>{free_} && seen.result.left.of(Left::kOpen) == 1;
+    return seen.paths.empty() && seen.result.left.of(Left::kOpen) == 1 &&
+           seen.result.left.of(Left::kUnproven) == 1;
   }));
   EXPECT_TRUE(exists(held_));
-  EXPECT_FALSE(exists(free_));
+  EXPECT_TRUE(exists(free_));
 }
 
 TEST_P(InUse, AFileThatCannotBeReadStays) {
   ASSERT_EQ(::chmod((volume_ / "").c_str(), 0777), 0);
+  ASSERT_EQ(::chown(free_.c_str(), kNobody, kNobody), 0);  // on which it gets a lease
   ASSERT_EQ(::chmod(held_.c_str(), 0600), 0);
   ::rmdir((volume_ / "lost+found").c_str());  // ext4's own, which cannot be read either
   EXPECT_TRUE(asNobody([this] {
@@ -212,6 +314,17 @@ TEST_P(InUse, AFileThatCannotBeReadStays) {
 TEST(OpenFilesScan, WithoutProcNobodyIsTakenForUnused) {
   OpenFiles files("/nowhere");
   EXPECT_FALSE(files.scan({}, {}));
+}
+
+TEST(OpenFilesScan, WhereTheFirstProcessIsNotShownOthersAreHiddenToo) {
+  const std::string proc = temporaryDirectory();
+  run("mkdir -p " + proc + "/17/fd");
+  OpenFiles files(proc);
+  ASSERT_TRUE(files.scan({}, {}));
+  EXPECT_EQ(files.hiddenProcesses(), 1U);
+  run("mkdir -p " + proc + "/1/fd");
+  ASSERT_TRUE(files.scan({}, {}));
+  EXPECT_EQ(files.hiddenProcesses(), 0U);
 }
 
 TEST(OpenFilesScan, TheScanIsKeptForARequestThatFollowsClosely) {

@@ -118,6 +118,11 @@ TEST(Units, TheServicesKeepTheCallByWhichTheyStayBeneathACacheDirectory) {
   }
 }
 
+TEST(Units, WhereOtherUsersLeaveFilesTheServiceCanTellWhetherTheyAreOpen) {
+  EXPECT_THAT(linesOf(kUnits / "spacekeep-service@crash-reports.service.d/rights.conf"),
+              testing::Contains("CapabilityBoundingSet=CAP_LEASE"));
+}
+
 TEST(Units, NoRightsAreGivenForARuleThatDoesNotShip) {
   for (const auto& entry : fs::directory_iterator(kUnits)) {
     if (!entry.is_directory()) continue;

@@ -19,6 +19,7 @@ enum class Left : std::size_t {
   kUsedSince,    // used, replaced or linked after it was chosen
   kUnreadable,   // cannot be opened, so nobody can tell whether it is in use
   kUnproven,     // no lease is to be had on it, and /proc hides who may have it open
+  kElsewhere,    // a directory of another mount or subvolume, or a file that is mounted here
   kTooDeep,      // below kMaxDepth directories, or its path is too long
   kFailed,       // the file system refused
   kCount,
@@ -32,6 +33,7 @@ inline constexpr std::array<std::string_view, static_cast<std::size_t>(Left::kCo
     "used since chosen",
     "unreadable",
     "not known to be unused",
+    "another file system",
     "too deep",
     "refused by the file system"};
 

@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 
 #include <cerrno>
+#include <optional>
 
 #include "services/cachedir/engine/beneath.h"
 
@@ -14,6 +15,23 @@ namespace {
 struct DirectoryCloser {
   void operator()(DIR* directory) const { ::closedir(directory); }
 };
+
+/// Why a directory that was listed cannot be opened; none when it has gone meanwhile, or something
+/// else stands there, which is none of ours.
+std::optional<Left> reasonOf(int error) {
+  switch (error) {
+    case ENOENT:
+    case ELOOP:
+    case ENOTDIR:
+      return std::nullopt;
+    case EXDEV:
+      return Left::kElsewhere;
+    case EACCES:
+      return Left::kUnreadable;
+    default:
+      return Left::kFailed;
+  }
+}
 
 }  // namespace
 
@@ -81,14 +99,15 @@ void TreeWalk::descend(std::vector<Level>& levels, const char* name, Tally& tall
   UniqueFd fd = openBeneath(above.fd(), name, O_RDONLY | O_DIRECTORY);
   struct stat facts {};
   if (!fd || ::fstat(fd.get(), &facts) != 0) {
-    // EXDEV is another mount, ELOOP a link put there meanwhile: both are none of ours.
-    if (errno == EACCES) tally.add(Left::kUnreadable);
+    if (const auto why = reasonOf(errno)) tally.add(*why);
     return;
   }
   // A subvolume inside is a file system of its own in all that counts here, snapshots above all.
-  if (inodeOf(facts).device == root.inode.device) {
-    enter(levels, std::move(fd), {above.folder->root, std::move(path)}, tally);
+  if (inodeOf(facts).device != root.inode.device) {
+    tally.add(Left::kElsewhere);
+    return;
   }
+  enter(levels, std::move(fd), {above.folder->root, std::move(path)}, tally);
 }
 
 void TreeWalk::meet(const Level& level, const char* name,
@@ -97,6 +116,7 @@ void TreeWalk::meet(const Level& level, const char* name,
   if (!root.rule->keep.empty() && isKept(*root.rule, joined(level.folder->path, name))) return;
   const Entry entry = entryAt(level.fd(), name, root);
   if (entry.kind == Entry::Kind::kFailed) tally.add(Left::kFailed);
+  if (entry.kind == Entry::Kind::kOther) tally.add(Left::kElsewhere);  // mounted here
   if (entry.kind != Entry::Kind::kFile) return;
   visit(FoundFile{.folder = level.folder,
                   .name = name,

@@ -76,6 +76,7 @@ TEST(Containment, FileSystemsAndFilesMountedInsideAreLeftAlone) {
   run("mount --bind " + volume / "outside/precious" + " " + volume / "cache/single");
   const Observed seen = freeIn(volume / "cache", kAll);
   EXPECT_THAT(seen.paths, IsEmpty());
+  EXPECT_EQ(seen.result.left.of(Left::kElsewhere), 3U);
   EXPECT_EQ(CacheCleaner(rulesFor(volume / "cache")).estimate({}).bytes[3], 0U);
   for (const char* name : {"cache/other", "cache/same", "cache/single"}) {
     run("umount " + volume / name);
@@ -90,7 +91,9 @@ TEST(Containment, ASubvolumeInsideIsAFileSystemOfItsOwn) {
   run("btrfs subvolume create " + volume / "cache/inner");
   writeFile(volume / "cache/inner/precious", kMiB);
   volume.settle();
-  EXPECT_THAT(freeIn(volume / "cache", kAll).paths, ElementsAre(volume / "cache/file"));
+  const Observed seen = freeIn(volume / "cache", kAll);
+  EXPECT_THAT(seen.paths, ElementsAre(volume / "cache/file"));
+  EXPECT_EQ(seen.result.left.of(Left::kElsewhere), 1U);
   EXPECT_TRUE(exists(volume / "cache/inner/precious"));
 }
 

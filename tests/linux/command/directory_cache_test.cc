@@ -196,6 +196,22 @@ TEST_F(WholeDirectories, OneInWhichAProcessStandsIsKept) {
   EXPECT_TRUE(exists(volume_ / "all/oldest/g"));
 }
 
+TEST_F(WholeDirectories, ASubvolumeInsideKeepsAllOfIt) {
+  const Volume volume("btrfs");
+  writeFile(volume / "all/one/f", kMiB, 300);
+  cachedir::run("btrfs subvolume create " + (volume / "all/one/inner"));
+  writeFile(volume / "all/one/inner/f", kMiB, 300);
+  writeFile(volume / "all/two/f", kMiB, 300);
+  volume.settle();
+  const auto all = makeCache(
+      ruleFrom(directory(volume / "all/*", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
+  Request on = request(4);
+  on.volume = volume.path();
+  EXPECT_THAT(freeAsForetold(*all, on).what, ElementsAre(volume / "all/two/"));
+  EXPECT_TRUE(exists(volume / "all/one/f"));
+  EXPECT_TRUE(exists(volume / "all/one/inner/f"));
+}
+
 TEST_F(WholeDirectories, WhatACrashLeftIsFinishedFirstAndCounts) {
   const std::string left = volume_ / ("all/" + std::string(kGoingPrefix) + "gone");
   writeFile(left + "/f", kMiB, 1);

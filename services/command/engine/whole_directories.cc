@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <limits>
 #include <set>
 
 #include "services/cachedir/engine/ages.h"
@@ -56,6 +57,17 @@ Unit look(const std::vector<Root>& roots, std::size_t index, const cachedir::Ope
   return unit;
 }
 
+/// Where processes stand and something is mounted.
+std::set<std::string> placesLivedIn() {
+  std::set<std::string> places = mountPoints();
+  places.merge(workingDirectories());
+  return places;
+}
+
+bool isLivedIn(const Root& root, const std::set<std::string>& places) {
+  return isAnyWithin(places, root.rule->path) || hasMeetingPoint(root.fd.get());
+}
+
 /// All that could go, with what they were found by.
 struct Units {
   cachedir::OpenedRoots opened;
@@ -71,12 +83,10 @@ Units unitsOf(const cachedir::Rules& rules, const std::optional<std::string>& vo
   cachedir::OpenFiles open_files;
   const auto& roots = found.opened.roots;
   if (roots.empty() || !open_files.scan(roots, cancel)) return found;
-  std::set<std::string> lived_in = mountPoints();
-  lived_in.merge(workingDirectories());
+  const std::set<std::string> places = placesLivedIn();
   for (std::size_t i = 0; i < roots.size() && !cancel.cancelled(); ++i) {
     Unit unit = look(roots, i, open_files, cancel);
-    if (unit.bytes == 0 || !unit.whole || unit.in_use) continue;
-    if (isAnyWithin(lived_in, unit.rule->path) || hasMeetingPoint(roots[i].fd.get())) continue;
+    if (unit.bytes == 0 || !unit.whole || unit.in_use || isLivedIn(roots[i], places)) continue;
     found.units.push_back(unit);
   }
   return found;
@@ -85,33 +95,48 @@ Units unitsOf(const cachedir::Rules& rules, const std::optional<std::string>& vo
 std::string folderOf(const std::string& path) { return path.substr(0, path.rfind('/')); }
 std::string nameOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
 
+/// What a directory must be to go.
+struct Terms {
+  std::optional<std::string> volume = {};  // a mount point; absent means any
+  /// Nothing in it was used later.
+  std::int64_t latest_ns = std::numeric_limits<std::int64_t>::max();
+};
+
 /// Whether every single file could go now, by the checks that come right before a deletion.
 struct Checked {
   bool all = false;
   std::uint64_t bytes = 0;  // that would come back
 };
 
+/// What was seen when the directory was chosen may be long ago: all of it is looked at again.
 class Check {
  public:
-  Check(const std::string& path, cachedir::OpenFiles& open_files, const CancelToken& cancel)
-      : cancel_(cancel), open_files_(open_files) {
+  Check(const std::string& path, const Terms& terms, cachedir::OpenFiles& open_files,
+        const CancelToken& cancel)
+      : latest_ns_(terms.latest_ns), cancel_(cancel), open_files_(open_files) {
     rules_.directories.push_back({.path = path});
-    opened_ = openRoots(rules_, std::nullopt);
+    opened_ = openRoots(rules_, terms.volume);
   }
+
+  /// It is there, and on the volume.
+  [[nodiscard]] bool takesPart() const { return !opened_.roots.empty(); }
 
   Checked result() {
     if (opened_.roots.empty() || !open_files_.ensure(opened_.roots, kScanKeptNs, cancel_))
       return {};
     cachedir::Remover remover(opened_.roots, open_files_, {.dry_run = true, .take_empty = true});
     Checked checked{.all = true};
-    for (const cachedir::Candidate& candidate : candidates()) {
+    const std::vector<cachedir::Candidate> files = candidates();
+    if (!whole_ || youngest_ns_ > latest_ns_) return {};
+    for (const cachedir::Candidate& candidate : files) {
       if (cancel_.cancelled()) return {};
       const auto outcome = remover.take(candidate, cancel_);
       const auto* removal = std::get_if<cachedir::Removal>(&outcome);
       if (removal == nullptr) return {};
       checked.bytes += removal->bytes;
     }
-    checked.all = checked.all && whole_;
+    // Last: who stands in it could make new files while the others were looked at.
+    if (isLivedIn(opened_.roots.front(), placesLivedIn())) return {};
     return checked;
   }
 
@@ -122,6 +147,7 @@ class Check {
     cachedir::LinkGroups groups;
     cachedir::Tally tally;
     const auto visit = [&](const cachedir::FoundFile& file) {
+      youngest_ns_ = std::max(youngest_ns_, file.used_ns);
       if (file.links == 1) {
         found.push_back(cachedir::candidateOf(file, 0));
       } else if (auto group = groups.offer(file, 0)) {
@@ -133,10 +159,12 @@ class Check {
     return found;
   }
 
+  const std::int64_t latest_ns_;
   const CancelToken& cancel_;
   cachedir::OpenFiles& open_files_;
   cachedir::Rules rules_;
   cachedir::OpenedRoots opened_;
+  std::int64_t youngest_ns_ = std::numeric_limits<std::int64_t>::min();
   bool whole_ = false;
 };
 
@@ -147,49 +175,86 @@ std::uint64_t occupiedBy(const std::string& path) {
   return measure(opened.roots, CancelToken()).bytes;
 }
 
-/// Removes one directory; the bytes that come back, 0 when it is in use after all. After a cancel
-/// the rest waits for the next request, under a name that nobody looks for.
-std::uint64_t removeUnit(const std::string& path, cachedir::OpenFiles& open_files,
-                         const CancelToken& cancel, std::vector<std::string>& problems) {
-  const std::string name = nameOf(path);
-  const std::string going = kGoingPrefix + name;
-  const std::string going_path = folderOf(path) + "/" + going;
-  const cachedir::UniqueFd folder = cachedir::openDirectoryWithoutLinks(folderOf(path));
-  const auto rename = [&folder](const std::string& from, const std::string& to) {
-    return ::renameat2(folder.get(), from.c_str(), folder.get(), to.c_str(), RENAME_NOREPLACE) == 0;
-  };
-  if (!folder || !rename(name, going)) {
-    problems.push_back(path + ": cannot be renamed: " + cachedir::errnoText(errno));
-    return 0;
-  }
-  const Checked checked = Check(going_path, open_files, cancel).result();
-  if (!checked.all) {
-    if (!rename(going, name)) {
-      problems.push_back(path + ": in use, and made anew meanwhile; the old one is " + going_path);
-    }
-    return 0;
-  }
-  if (removeTree(folder.get(), going.c_str(), cancel)) return checked.bytes;
-  if (!cancel.cancelled()) problems.push_back(going_path + ": not all of it could be removed");
-  return checked.bytes - std::min(checked.bytes, occupiedBy(going_path));
+bool renameIn(int folder, const std::string& from, const std::string& to) {
+  return ::renameat2(folder, from.c_str(), folder, to.c_str(), RENAME_NOREPLACE) == 0;
 }
 
-/// What a cancel or a crash left half removed, next to the directories of these rules.
-std::uint64_t finishOldWork(const cachedir::Rules& rules, const CancelToken& cancel) {
-  std::set<std::string> folders;
-  for (const auto& rule : rules.directories) folders.insert(folderOf(rule.path));
-  std::uint64_t freed = 0;
-  for (const std::string& folder : folders) {
-    for (const std::string& path : matchesOf(folder + "/" + kGoingPrefix + "*")) {
-      const cachedir::UniqueFd fd = cachedir::openDirectoryWithoutLinks(folder);
-      const std::uint64_t before = occupiedBy(path);
-      if (!fd || cancel.cancelled()) return freed;
-      const bool gone = removeTree(fd.get(), nameOf(path).c_str(), cancel);
-      freed += gone ? before : before - std::min(before, occupiedBy(path));
+/// One request's removing of directories.
+class Removing {
+ public:
+  Removing(const std::optional<std::string>& volume, cachedir::OpenFiles& open_files,
+           const CancelToken& cancel, std::vector<std::string>& problems)
+      : volume_(volume), open_files_(open_files), cancel_(cancel), problems_(problems) {}
+
+  /// The bytes that come back, 0 when it is in use after all. After a cancel the rest waits for the
+  /// next request, under a name that nobody looks for.
+  std::uint64_t remove(const Unit& unit) {
+    const std::string& path = unit.rule->path;
+    const std::string name = nameOf(path);
+    const std::string going = kGoingPrefix + name;
+    const std::string going_path = folderOf(path) + "/" + going;
+    const cachedir::UniqueFd folder = cachedir::openDirectoryWithoutLinks(folderOf(path));
+    if (!folder || !renameIn(folder.get(), name, going)) {
+      problems_.push_back(path + ": cannot be renamed: " + cachedir::errnoText(errno));
+      return 0;
     }
+    const Terms terms{.latest_ns = unit.used_ns};
+    const Checked checked = Check(going_path, terms, open_files_, cancel_).result();
+    if (checked.all && renameIn(folder.get(), going, kHalfPrefix + name)) {
+      return removeHalf(folder.get(), folderOf(path) + "/" + kHalfPrefix + name, checked.bytes);
+    }
+    if (checked.all) problems_.push_back(path + ": what is left of an earlier one is in the way");
+    if (!renameIn(folder.get(), going, name)) {
+      problems_.push_back(path + ": in use, and made anew meanwhile; the old one is " + going_path);
+    }
+    return 0;
   }
-  return freed;
-}
+
+  /// What a cancel or a crash left, next to the directories of these rules.
+  std::uint64_t finishOldWork(const cachedir::Rules& rules) {
+    std::set<std::string> folders;
+    for (const auto& rule : rules.directories) folders.insert(folderOf(rule.path));
+    std::uint64_t freed = 0;
+    for (const std::string& folder : folders) {
+      const cachedir::UniqueFd fd = cachedir::openDirectoryWithoutLinks(folder);
+      for (const char* prefix : {kHalfPrefix, kGoingPrefix}) {
+        for (const std::string& path : matchesOf(folder + "/" + prefix + "*")) {
+          if (!fd || cancel_.cancelled()) return freed;
+          freed += finish(fd.get(), path, prefix);
+        }
+      }
+    }
+    return freed;
+  }
+
+ private:
+  /// Nobody may have looked at it before the crash, or its name had been taken when it was found in
+  /// use. No time of use speaks for it, since nobody looks for it there; all else does.
+  std::uint64_t finish(int folder, const std::string& path, std::string_view prefix) {
+    Check check(path, {.volume = volume_}, open_files_, cancel_);
+    if (!check.takesPart()) return 0;
+    const Checked checked = check.result();
+    if (prefix == kHalfPrefix) return checked.all ? removeHalf(folder, path, checked.bytes) : 0;
+    const std::string going = nameOf(path);
+    const std::string name = going.substr(prefix.size());
+    if (checked.all && renameIn(folder, going, kHalfPrefix + name)) {
+      return removeHalf(folder, folderOf(path) + "/" + kHalfPrefix + name, checked.bytes);
+    }
+    if (!checked.all && !cancel_.cancelled()) static_cast<void>(renameIn(folder, going, name));
+    return 0;
+  }
+
+  std::uint64_t removeHalf(int folder, const std::string& path, std::uint64_t bytes) {
+    if (removeTree(folder, nameOf(path).c_str(), cancel_)) return bytes;
+    if (!cancel_.cancelled()) problems_.push_back(path + ": not all of it could be removed");
+    return bytes - std::min(bytes, occupiedBy(path));
+  }
+
+  const std::optional<std::string>& volume_;
+  cachedir::OpenFiles& open_files_;
+  const CancelToken& cancel_;
+  std::vector<std::string>& problems_;
+};
 
 }  // namespace
 
@@ -213,14 +278,15 @@ cachedir::Estimate estimateWhole(const cachedir::Rules& rules,
 WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::FreeRequest& request,
                       const CancelToken& cancel, const Visitor& visit) {
   WholeResult result;
-  if (!request.dry_run) result.bytes = finishOldWork(rules, cancel);
+  cachedir::OpenFiles open_files;
+  Removing removing(request.volume, open_files, cancel, result.problems);
+  if (!request.dry_run) result.bytes = removing.finishOldWork(rules);
   Units found = unitsOf(rules, request.volume, cancel);
-  result.problems = std::move(found.problems);
+  result.problems.insert(result.problems.end(), found.problems.begin(), found.problems.end());
   std::ranges::sort(found.units, {}, [](const Unit& unit) { return unit.used_ns; });
   const std::int64_t now_ns = rt::wallClockNs();
   if (found.units.empty()) return result;
   const std::uint64_t old_work = result.bytes;
-  cachedir::OpenFiles open_files;
   cachedir::SpaceReturn space(found.opened.roots.front().fd.get());
   for (const Unit& unit : found.units) {
     if (result.bytes >= request.amount || cancel.cancelled()) break;
@@ -228,10 +294,11 @@ WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::FreeRequest&
     const std::string& path = unit.rule->path;
     std::uint64_t bytes = 0;
     if (request.dry_run) {
-      const Checked checked = Check(path, open_files, cancel).result();
+      const Terms terms{.latest_ns = unit.used_ns};
+      const Checked checked = Check(path, terms, open_files, cancel).result();
       bytes = checked.all ? checked.bytes : 0;
     } else {
-      bytes = removeUnit(path, open_files, cancel, result.problems);
+      bytes = removing.remove(unit);
     }
     result.bytes += bytes;
     if (visit && bytes > 0) visit(path + "/", bytes);

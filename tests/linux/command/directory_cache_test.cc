@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include "services/command/engine/directory_cache.h"
@@ -14,6 +15,7 @@ namespace spacekeep::command {
 namespace {
 
 using testing::ElementsAre;
+using testing::IsEmpty;
 
 std::string directory(const std::string& path, const std::string& more = "") {
   return "<key>DIRECTORIES</key><array><dict><key>PATH</key><string>" + path + "</string>" + more +
@@ -118,6 +120,22 @@ class WholeDirectories : public DirectoryCacheTest {
         ruleFrom(directory(volume_ / "all/*", "<key>WHOLE_DIRECTORIES</key><true/>" + more)),
         nullptr);
   }
+  /// Frees at `urgency`, and has `happen` run once the first directory has gone; all that went.
+  [[nodiscard]] std::vector<std::string> goneWhile(int urgency,
+                                                   const std::function<void()>& happen) const {
+    std::vector<std::string> gone;
+    const auto visit = [&](const std::string& what, std::optional<std::uint64_t>) {
+      gone.push_back(what);
+      if (gone.size() == 1) happen();
+    };
+    static_cast<void>(cache()->free(request(urgency), CancelToken(), visit));
+    return gone;
+  }
+  /// What an earlier request left of the directory of that name.
+  [[nodiscard]] std::string leftOf(const std::string& name,
+                                   const char* prefix = kGoingPrefix) const {
+    return volume_ / ("all/" + std::string(prefix) + name);
+  }
 };
 
 TEST_F(WholeDirectories, ADirectoryIsAsYoungAsItsYoungestFileAndTheOldestGoesFirst) {
@@ -196,6 +214,86 @@ TEST_F(WholeDirectories, OneInWhichAProcessStandsIsKept) {
   EXPECT_TRUE(exists(volume_ / "all/oldest/g"));
 }
 
+TEST_F(WholeDirectories, OneThatGetsAFileWhileAnotherGoesIsKeptAtAnyUrgency) {
+  EXPECT_THAT(goneWhile(4, [this] { writeFile(volume_ / "all/older/new", 4096, 0); }),
+              ElementsAre(volume_ / "all/oldest/", volume_ / "all/mixed/"));
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+  EXPECT_TRUE(exists(volume_ / "all/older/new"));
+}
+
+TEST_F(WholeDirectories, OneInWhichAProgramBeginsToWaitWhileAnotherGoesIsKept) {
+  EXPECT_THAT(goneWhile(2, [this] { cachedir::run("mkfifo " + (volume_ / "all/older/pipe")); }),
+              ElementsAre(volume_ / "all/oldest/"));
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+}
+
+TEST_F(WholeDirectories, OneThatAProcessEntersWhileAnotherGoesIsKept) {
+  std::optional<cachedir::Holder> holder;
+  const auto enter = [this] { return ::chdir((volume_ / "all/older").c_str()) == 0; };
+  EXPECT_THAT(goneWhile(2, [&] { holder.emplace(enter); }), ElementsAre(volume_ / "all/oldest/"));
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+}
+
+TEST_F(WholeDirectories, OneInWhichSomethingIsMountedWhileAnotherGoesIsKept) {
+  const std::string place = volume_ / "all/older/mount";
+  EXPECT_THAT(
+      goneWhile(2,
+                [&place] { cachedir::run("mkdir " + place + " && mount -t tmpfs none " + place); }),
+      ElementsAre(volume_ / "all/oldest/"));
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+  cachedir::run("umount " + place);
+}
+
+TEST_F(WholeDirectories, WhatWasLeftIsKeptWhileItIsInUseAndGetsItsNameBackIfThatIsFree) {
+  const std::function<bool(const std::string&)> uses[] = {
+      [](const std::string& left) { return ::open((left + "/f").c_str(), O_RDONLY) >= 0; },
+      [](const std::string& left) {
+        return ::flock(::open((left + "/f").c_str(), O_RDONLY), LOCK_SH) == 0;
+      },
+      [](const std::string& left) { return ::chdir(left.c_str()) == 0; },
+      [](const std::string& left) { return ::mkfifo((left + "/pipe").c_str(), 0600) == 0; }};
+  for (const auto& use : uses) {
+    writeFile(leftOf("free") + "/f", kMiB, 1);
+    writeFile(leftOf("taken") + "/f", kMiB, 1);
+    writeFile(volume_ / "all/taken/new", kMiB, 0);
+    volume_.settle();
+    {
+      const cachedir::Holder holder([&] { return use(leftOf("free")); });
+      const cachedir::Holder another([&] { return use(leftOf("taken")); });
+      EXPECT_THAT(cache()->free(request(1), CancelToken(), {}).problems, IsEmpty());
+    }
+    EXPECT_TRUE(exists(volume_ / "all/free/f"));
+    EXPECT_TRUE(exists(leftOf("taken") + "/f"));
+    EXPECT_TRUE(exists(volume_ / "all/taken/new"));
+    cachedir::run("rm -rf " + (volume_ / "all/free") + " " + leftOf("taken"));
+  }
+}
+
+TEST_F(WholeDirectories, AfterACancelTheRestNeverGetsItsNameBackAndGoesOnceNobodyUsesIt) {
+  const std::string rest = leftOf("oldest", kHalfPrefix);
+  const CancelToken once_it_goes([&rest] { return exists(rest); });
+  EXPECT_EQ(cache()->free(request(1), once_it_goes, {}).bytes, 0U);
+  ASSERT_TRUE(exists(rest + "/g"));
+  EXPECT_FALSE(exists(volume_ / "all/oldest"));
+  {
+    const cachedir::Holder holder([&rest] { return ::open((rest + "/g").c_str(), O_RDONLY) >= 0; });
+    EXPECT_EQ(cache()->free(request(1), CancelToken(), {}).bytes, kMiB) << "of another one";
+    EXPECT_TRUE(exists(rest + "/g"));
+    EXPECT_FALSE(exists(volume_ / "all/oldest"));
+  }
+  EXPECT_EQ(cache()->free(request(3), CancelToken(), {}).bytes, 4 * kMiB);
+  EXPECT_FALSE(exists(rest));
+}
+
+TEST_F(WholeDirectories, WhatWasLeftOnAnotherVolumeStaysAndDoesNotCount) {
+  const Volume other("tmpfs");
+  writeFile(leftOf("gone") + "/f", kMiB, 1);
+  Request elsewhere = request(4);
+  elsewhere.volume = other.path();
+  EXPECT_EQ(cache()->free(elsewhere, CancelToken(), {}).bytes, 0U);
+  EXPECT_TRUE(exists(leftOf("gone") + "/f"));
+}
+
 TEST_F(WholeDirectories, ASubvolumeInsideKeepsAllOfIt) {
   const Volume volume("btrfs");
   writeFile(volume / "all/one/f", kMiB, 300);
@@ -213,7 +311,7 @@ TEST_F(WholeDirectories, ASubvolumeInsideKeepsAllOfIt) {
 }
 
 TEST_F(WholeDirectories, WhatACrashLeftIsFinishedFirstAndCounts) {
-  const std::string left = volume_ / ("all/" + std::string(kGoingPrefix) + "gone");
+  const std::string left = leftOf("gone");
   writeFile(left + "/f", kMiB, 1);
   volume_.settle();
   const Went went{cache()->free(request(1, kMiB), CancelToken(), {}), {}, 0};

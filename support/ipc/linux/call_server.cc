@@ -157,7 +157,8 @@ void CallServer::run(const ServedMethod& method, std::size_t bytes, Task task) {
 void CallServer::schedule(const ServedMethod& method, Task task) {
   switch (method.mode) {
     case ServeMode::kInOrder:
-      if (in_order_ == nullptr) in_order_ = SerialQueue::create("ipc.connection", context_->global);
+      if (in_order_ == nullptr)
+        in_order_ = SerialQueue::create("com.quorvel.spacekeep_ipc_connection", context_->global);
       in_order_->async(std::move(task));
       return;
     case ServeMode::kLane:

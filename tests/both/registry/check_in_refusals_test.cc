@@ -35,9 +35,10 @@ TEST(UselessEndpoint, OfANewServiceIsAnsweredWithTheReasonAndLogged) {
     EXPECT_EQ(call->wait(), std::nullopt);
     EXPECT_EQ(errorOf(*call), "its endpoint cannot be used: it is not connected");
     EXPECT_TRUE(world.services().empty());
-    EXPECT_EQ(world.world.trace().linesOfLevel(kLogProblem),
-              std::vector<std::string>{
-                  "clientCheckin refusing cache, its endpoint cannot be used: it is not connected"});
+    EXPECT_EQ(
+        world.world.trace().linesOfLevel(kLogProblem),
+        std::vector<std::string>{
+            "clientCheckin refusing cache, its endpoint cannot be used: it is not connected"});
   });
 }
 

@@ -143,6 +143,7 @@ class FakeBrokerTest : public ::testing::Test {
  protected:
   void serve() {
     ServerOptions options = TestServer::defaultOptions();
+    options.limits.connections = callers;
     options.admit = [this](PeerConnection& peer, std::string&) {
       has_process_ = peer.identity().pidfd() != nullptr;
       unclear_ = peer.identity().unclear();
@@ -159,6 +160,7 @@ class FakeBrokerTest : public ::testing::Test {
 
   FakeBroker broker;
   std::unique_ptr<TestServer> server;
+  std::size_t callers = 1024;  // that are remembered
   bool has_process_ = false;
   access::UnclearFacts unclear_;
 };
@@ -213,6 +215,24 @@ TEST_F(FakeBrokerTest, WhoASenderIsIsAskedOnce) {
   EXPECT_EQ(asked, 1);
   EXPECT_EQ(broker.numberFrom(":1.8"), "");
   EXPECT_EQ(asked, 2);
+}
+
+TEST_F(FakeBrokerTest, WhoWasQuietForLongestIsForgottenForANewCaller) {
+  callers = 2;
+  serve();
+  int asked = 0;
+  broker.setCredentials([&asked](sd_bus_message* answer) {
+    ++asked;
+    EXPECT_GE(sd_bus_message_append(answer, "a{sv}", 1, "UnixUserID", "u", 0), 0);
+  });
+  for (const char* caller : {":1.7", ":1.8", ":1.7", ":1.9"}) {
+    EXPECT_EQ(broker.numberFrom(caller), "") << caller;
+  }
+  EXPECT_EQ(asked, 3);
+  EXPECT_EQ(broker.numberFrom(":1.7"), "");
+  EXPECT_EQ(asked, 3);
+  EXPECT_EQ(broker.numberFrom(":1.8"), "");
+  EXPECT_EQ(asked, 4);
 }
 
 TEST_F(FakeBrokerTest, AnAnswerThatSomebodyElseSendsCountsForNothing) {

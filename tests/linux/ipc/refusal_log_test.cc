@@ -32,10 +32,10 @@ TEST_F(Refusals, OfCallsAndConnectionsAreToldWithWhoAndWhy) {
     refusals.write("uid 7", "too many");
     refusals.writeCall("uid 8", "clientPurge", "no room");
   });
-  EXPECT_EQ(log.texts(kLogProblem),
-            (std::vector<std::string>{
-                "SpacekeepListener Connection of uid 7 refused or ended: too many",
-                "SpacekeepListener clientPurge of uid 8 refused: no room"}));
+  EXPECT_EQ(
+      log.texts(kLogProblem),
+      (std::vector<std::string>{"SpacekeepListener Connection of uid 7 refused or ended: too many",
+                                "SpacekeepListener clientPurge of uid 8 refused: no room"}));
   close(refusals);
 }
 

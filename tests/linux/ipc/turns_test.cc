@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
+#include <algorithm>
 #include <memory>
 #include <vector>
 
@@ -64,6 +65,23 @@ TEST(Turns, AWritingEndClosedAfterACallIsNoticedAsTheEnd) {
   ::shutdown(sd_bus_get_fd(client.bus()), SHUT_WR);
   busy.letGo();
   EXPECT_TRUE(eventually([&] { return server.server().connections() == 0; }));
+}
+
+TEST(Turns, AConnectionWithMuchToSayLetsOthersInAfterAFewMessages) {
+  constexpr int kCalls = 60;
+  constexpr int kOther = 1000;
+  TestServer server;
+  BareClient much(server.path());
+  BareClient little(server.path());
+  callNumber(much, -1);
+  callNumber(little, -1);
+  BusyLoop busy(server.loop);
+  for (int i = 0; i < kCalls; ++i) sendNumber(much, i, "numberBriefly");
+  sendNumber(little, kOther, "numberBriefly");
+  busy.letGo();
+  ASSERT_TRUE(eventually([&] { return server.numbers().size() == kCalls + 3; }));
+  const std::vector<std::int32_t> numbers = server.numbers();
+  EXPECT_LE(std::ranges::find(numbers, kOther) - numbers.begin(), 2 + 16);
 }
 
 // The answer goes out in several parts while nothing comes; what comes then is judged as ever.

@@ -29,12 +29,9 @@ Sizes sizesOf(const Dictionary& info) {
                                            "echo"),
             0);
   WireWriter writer(call);
-  const Arguments arguments = {std::int32_t{1},
-                               std::string("text"),
-                               info,
-                               OptionalDictionary(info),
-                               OptionalValue(Value(1.5)),
-                               OptionalString("four")};
+  const Arguments arguments = {
+      std::int32_t{1},          std::string("text"),       info,
+      OptionalDictionary(info), OptionalValue(Value(1.5)), OptionalString("four")};
   EXPECT_TRUE(writer.write(testInterface().method("echo")->in, arguments));
   EXPECT_GE(sd_bus_send(bus, call, nullptr), 0);
   std::array<char, kWireFixedBytes> bytes{};
@@ -49,10 +46,11 @@ Sizes sizesOf(const Dictionary& info) {
 }
 
 TEST(WireSize, OfTheBodyIsKnownToTheByteForEveryKindOfValue) {
-  for (const Value& value : {Value("text"), Value(""), Value("a\xC3("), Value(true), Value(-1),
-                             Value(std::uint64_t{7}), Value(0.25), Value(Data{{1, 2, 3}}),
-                             Value(Data{}), Value(Date{5}), Value(Array{}), Value(Array{1, "b", 2.0}),
-                             Value(Dictionary{}), Value(Dictionary{{"k", 1}, {"list", Array{"x"}}})}) {
+  for (const Value& value :
+       {Value("text"), Value(""), Value("a\xC3("), Value(true), Value(-1), Value(std::uint64_t{7}),
+        Value(0.25), Value(Data{{1, 2, 3}}), Value(Data{}), Value(Date{5}), Value(Array{}),
+        Value(Array{1, "b", 2.0}), Value(Dictionary{}),
+        Value(Dictionary{{"k", 1}, {"list", Array{"x"}}})}) {
     for (const std::string key : {"", "a", "ab", "abc", "abcd", "abcde", "abcdef", "abcdefg"}) {
       const Sizes sizes = sizesOf({{key, value}, {"then", value}});
       EXPECT_EQ(sizes.told, sizes.body) << key;

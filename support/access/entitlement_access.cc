@@ -6,28 +6,6 @@
 #include "support/logging/log.h"
 
 namespace spacekeep::access {
-namespace {
-
-void logVerdict(const PeerIdentity& identity, std::string_view entitlement,
-                const Verdict& verdict) {
-  const std::string peer = identity.describe();
-  switch (verdict.decision) {
-    case Decision::kGranted:
-      logTrace("%s peer %s holds %s by rule %s", "connectionIsEntitled", peer, entitlement,
-               verdict.rule);
-      return;
-    case Decision::kDenied:
-      logProblem("%s peer %s is denied %s by rule %s", "connectionIsEntitled", peer, entitlement,
-                 verdict.rule);
-      return;
-    case Decision::kSilent:
-      logProblem("%s peer %s lacks %s, no rule grants it", "connectionIsEntitled", peer,
-                 entitlement);
-      return;
-  }
-}
-
-}  // namespace
 
 EntitlementAccess::EntitlementAccess(std::vector<Rule> rules, std::size_t max_remembered)
     : rules_(std::move(rules)), max_remembered_(std::max<std::size_t>(max_remembered, 1)) {}
@@ -66,6 +44,25 @@ bool EntitlementAccess::remember(const Key& key, bool granted) {
     oldest_first_.pop_front();
   }
   return true;
+}
+
+void EntitlementAccess::logVerdict(const PeerIdentity& identity, std::string_view entitlement,
+                                   const Verdict& verdict) {
+  constexpr const char* kOperation = "connectionIsEntitled";
+  if (verdict.granted()) {
+    refusal_lines_.tellLeftOut();
+    logTrace("%s peer %s holds %s by rule %s", kOperation, identity.describe(), entitlement,
+             verdict.rule);
+    return;
+  }
+  if (!refusal_lines_.admit(identity.uid(), entitlement)) return;
+  if (verdict.decision == Decision::kSilent) {
+    logProblem("%s peer %s lacks %s, no rule grants it", kOperation, identity.describe(),
+               entitlement);
+    return;
+  }
+  logProblem("%s peer %s is denied %s by rule %s", kOperation, identity.describe(), entitlement,
+             verdict.rule);
 }
 
 }  // namespace spacekeep::access

@@ -14,6 +14,7 @@
 
 #include "support/access/access.h"
 #include "support/access/entitlement_rules.h"
+#include "support/access/refusal_lines.h"
 #include "support/runtime/runtime.h"
 
 namespace spacekeep::access {
@@ -31,7 +32,7 @@ class EntitlementAccess final : public Access {
       std::initializer_list<std::string_view> entitlements) override;
 
   /// The same for one entitlement of a peer that has no connection object yet. Each verdict is
-  /// logged once per identity, a refusal as a problem.
+  /// logged once per identity, a refusal as a problem, and of those only so many in a while.
   [[nodiscard]] bool isEntitled(const PeerIdentity& identity, std::string_view entitlement);
 
   [[nodiscard]] std::size_t remembered() const;
@@ -41,9 +42,12 @@ class EntitlementAccess final : public Access {
 
   /// Answers whether the verdict is new.
   bool remember(const Key& key, bool granted);
+  void logVerdict(const PeerIdentity& identity, std::string_view entitlement,
+                  const Verdict& verdict);
 
   const std::vector<Rule> rules_;
   const std::size_t max_remembered_;
+  RefusalLines refusal_lines_;
   mutable rt::Mutex mutex_;
   // Protected by mutex_.
   std::map<Key, bool> verdicts_;

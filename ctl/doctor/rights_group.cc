@@ -81,9 +81,10 @@ void checkUser(const access::PeerIdentity& identity, const std::vector<access::R
     group.ok("user", fmt::format("this user ({}) holds {}", user, heldBy(identity, rules)));
     return;
   }
-  const std::string reason = verdict.decision == access::Decision::kDenied
-                                 ? fmt::format("{} denies", verdict.rule)
-                                 : "no rule grants";
+  const std::string reason =
+      verdict.decision == access::Decision::kDenied
+          ? fmt::format("{}{} denies", verdict.rule, verdict.open ? " may be about it and" : "")
+          : "no rule grants";
   group.advice("user",
                fmt::format("this user ({}) may not connect to the daemon: {} CLIENT_ENTITLEMENT",
                            user, reason),

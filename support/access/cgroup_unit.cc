@@ -27,6 +27,11 @@ std::string_view unescaped(std::string_view component) {
 
 }  // namespace
 
+bool tellsUnit(std::string_view cgroup_text) {
+  const auto path = unifiedPath(cgroup_text);
+  return path && path->substr(0, path->find('/')) != "..";
+}
+
 std::optional<std::string> systemUnitFromCgroup(std::string_view cgroup_text) {
   auto path = unifiedPath(cgroup_text);
   while (path && !path->empty()) {

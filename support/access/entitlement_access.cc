@@ -61,8 +61,8 @@ void EntitlementAccess::logVerdict(const PeerIdentity& identity, std::string_vie
                entitlement);
     return;
   }
-  logProblem("%s peer %s is denied %s by rule %s", kOperation, identity.describe(), entitlement,
-             verdict.rule);
+  logProblem("%s peer %s is denied %s by rule %s%s", kOperation, identity.describe(), entitlement,
+             verdict.rule, verdict.open ? ", which may be about it: that is unclear" : "");
 }
 
 }  // namespace spacekeep::access

@@ -52,9 +52,11 @@ Verdict judge(std::span<const Rule> rules, const PeerIdentity& identity,
   for (const Rule& rule : rules) {
     const bool denies = names(rule.denies, entitlement);
     const bool grants = verdict.decision == Decision::kSilent && names(rule.grants, entitlement);
-    if (denies && mayMatch(rule, identity)) return {Decision::kDenied, rule.name};
+    if (denies && mayMatch(rule, identity)) {
+      return {Decision::kDenied, rule.name, !matches(rule, identity)};
+    }
     if (!grants || !matches(rule, identity)) continue;
-    verdict = {Decision::kGranted, rule.name};
+    verdict = {Decision::kGranted, rule.name, false};
   }
   return verdict;
 }

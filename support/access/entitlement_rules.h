@@ -41,7 +41,8 @@ enum class Decision {
 
 struct Verdict {
   Decision decision = Decision::kSilent;
-  std::string rule;  ///< the rule that decided, empty when none did
+  std::string rule;   ///< the rule that decided, empty when none did
+  bool open = false;  ///< whether the rule is about the peer is unclear, which denies as well
   [[nodiscard]] bool granted() const { return decision == Decision::kGranted; }
 };
 

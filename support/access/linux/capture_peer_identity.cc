@@ -46,10 +46,9 @@ std::optional<std::vector<T>> readOption(int fd, int option, std::size_t limit) 
   }
 }
 
-std::vector<std::uint32_t> readGroups(int fd) {
+std::optional<std::vector<std::uint32_t>> readGroups(int fd) {
   static_assert(sizeof(gid_t) == sizeof(std::uint32_t));
-  return readOption<std::uint32_t>(fd, SO_PEERGROUPS, kMaxGroups)
-      .value_or(std::vector<std::uint32_t>{});
+  return readOption<std::uint32_t>(fd, SO_PEERGROUPS, kMaxGroups);
 }
 
 std::optional<std::string> readLabel(int fd) {
@@ -125,9 +124,10 @@ bool addFactsOfProcess(PeerFacts& facts) {
   const std::string directory = "/proc/" + std::to_string(*pid);
   const auto cgroup = readProcFile(directory + "/cgroup");
   const auto comm = readProcFile(directory + "/comm");
-  if (!cgroup || !stillRuns(facts.pidfd->fd())) return false;
-  facts.unit = systemUnitFromCgroup(*cgroup);
+  if (!stillRuns(facts.pidfd->fd())) return false;
   if (comm) facts.program = programFromComm(*comm);
+  if (!cgroup || !tellsUnit(*cgroup)) return false;
+  facts.unit = systemUnitFromCgroup(*cgroup);
   return true;
 }
 
@@ -139,14 +139,15 @@ std::optional<uid_t> peerUid(int fd) {
 std::shared_ptr<const PeerIdentity> capturePeerIdentity(int fd) {
   const auto credentials = readCredentials(fd);
   if (!credentials) return nullptr;
+  auto groups = readGroups(fd);
   PeerFacts facts{.uid = credentials->uid,
                   .gid = credentials->gid,
-                  .groups = readGroups(fd),
                   .label = readLabel(fd),
                   .pid = credentials->pid,
-                  .pidfd = readPidfd(fd),
-                  .unit = std::nullopt};
-  addFactsOfProcess(facts);
+                  .pidfd = readPidfd(fd)};
+  // A process that ends in time would otherwise slip past a rule that denies its unit something.
+  facts.unclear = {.groups = !groups, .label = !facts.label, .unit = !addFactsOfProcess(facts)};
+  facts.groups = std::move(groups).value_or(std::vector<std::uint32_t>{});
   return std::make_shared<const PeerIdentity>(std::move(facts));
 }
 

@@ -39,6 +39,17 @@ TEST(CgroupUnit, WhichUnitAGroupBelongsTo) {
   }
 }
 
+TEST(CgroupUnit, WhetherItIsTold) {
+  for (const char* told : {"0::/\n", "0::/system.slice/cache.service\n", "0::/init.scope\n",
+                           "4:memory:/x\n0::/system.slice\n", "0::/..name/cache.service\n"}) {
+    EXPECT_TRUE(tellsUnit(told)) << told;
+  }
+  for (const char* untold : {"", "garbage", "1:name=systemd:/system.slice/cache.service\n",
+                             "0::/..\n", "0::/../../system.slice/cache.service\n"}) {
+    EXPECT_FALSE(tellsUnit(untold)) << untold;
+  }
+}
+
 TEST(CgroupUnit, ANameLongerThanAUnitNameCanBeIsNone) {
   const std::string longest(247, 'a');
   EXPECT_EQ(systemUnitFromCgroup("0::/" + longest + ".service\n"), longest + ".service");

@@ -68,6 +68,21 @@ TEST(EntitlementAccess, EachVerdictIsLoggedOncePerPeerWithTheRule) {
   EXPECT_EQ(log.texts(kLogTrace).size(), 2U);
 }
 
+TEST(EntitlementAccess, ADenialOfWhatIsUnclearIsSaidToBeOne) {
+  const LogCapture log;
+  Rule denial;
+  denial.name = "50-unit.plist";
+  denial.units = {"cache.service"};
+  denial.denies = {"PURGE_ENTITLEMENT"};
+  EntitlementAccess access({denial});
+  const PeerIdentity peer({.uid = 1, .gid = 5, .unclear = {.unit = true}});
+  EXPECT_FALSE(access.isEntitled(peer, "PURGE_ENTITLEMENT"));
+  EXPECT_EQ(log.texts(kLogProblem),
+            (std::vector<std::string>{"connectionIsEntitled peer uid 1 gid 5 pid 0 is denied "
+                                      "PURGE_ENTITLEMENT by rule 50-unit.plist, which may be about "
+                                      "it: that is unclear"}));
+}
+
 TEST(EntitlementAccess, OnlySoManyVerdictsAreRemembered) {
   EntitlementAccess access(rules(), 3);
   for (std::uint32_t i = 0; i < 20; ++i) {

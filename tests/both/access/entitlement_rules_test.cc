@@ -138,9 +138,17 @@ TEST(EntitlementRules, WhatIsUnclearIsDeniedByARuleThatMayFit) {
                                +[](Rule& rule) { rule.units = {"cache.service"}; },
                                +[](Rule& rule) { rule.labels = {"cache_t"}; }}) {
     const std::vector<Rule> rules{grantTo({1000}), denialBy(condition)};
-    EXPECT_EQ(judge(rules, peerOfWhomOnlyTheUserIsClear(), "PURGE_ENTITLEMENT").decision,
-              Decision::kDenied);
+    const Verdict verdict = judge(rules, peerOfWhomOnlyTheUserIsClear(), "PURGE_ENTITLEMENT");
+    EXPECT_EQ(verdict.decision, Decision::kDenied);
+    EXPECT_TRUE(verdict.open);
   }
+}
+
+TEST(EntitlementRules, ADenialByWhatIsClearIsNotOpen) {
+  const std::vector<Rule> rules{denialBy([](Rule& rule) { rule.users = {1000}; })};
+  const Verdict verdict = judge(rules, peerOfWhomOnlyTheUserIsClear(), "PURGE_ENTITLEMENT");
+  EXPECT_EQ(verdict.decision, Decision::kDenied);
+  EXPECT_FALSE(verdict.open);
 }
 
 TEST(EntitlementRules, WhatIsUnclearIsNotDeniedByARuleForAnotherUser) {

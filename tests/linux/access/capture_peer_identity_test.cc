@@ -3,15 +3,22 @@
 #include <fcntl.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
+#include <cerrno>
+#include <cstddef>
 #include <cstring>
 #include <string>
+
+#include "support/access/entitlement_rules.h"
 
 namespace spacekeep::access {
 namespace {
@@ -71,6 +78,49 @@ class Visitor {
   pid_t pid_ = -1;
 };
 
+/// Makes the kernel answer this process as one that does not know the socket option.
+bool forgetOption(unsigned option) {
+  std::array<sock_filter, 6> steps = {{
+      BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+      BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_getsockopt, 0, 3),
+      BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, args[2])),
+      BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, option, 0, 1),
+      BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | ENOPROTOOPT),
+      BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW),
+  }};
+  const sock_fprog program{steps.size(), steps.data()};
+  return ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+         ::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) == 0;
+}
+
+/// Whether it holds of the identity that a kernel without the option tells of this process.
+bool holdsWithoutOption(unsigned option, bool (*claim)(const PeerIdentity& identity)) {
+  const Door door;
+  const ipc::Descriptor entered(door.enter());
+  const ipc::Descriptor accepted(door.accept());
+  const pid_t child = ::fork();
+  if (child == 0) {
+    const auto identity = forgetOption(option) ? capturePeerIdentity(accepted.fd()) : nullptr;
+    ::_exit(identity != nullptr && claim(*identity) ? 0 : 1);
+  }
+  int status = -1;
+  EXPECT_EQ(::waitpid(child, &status, 0), child);
+  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+/// User 4711 may purge, the unit may not.
+std::vector<Rule> rulesAgainstUnit(const std::string& unit) {
+  Rule grant;
+  grant.name = "grant";
+  grant.users = {4711};
+  grant.grants = {"PURGE_ENTITLEMENT"};
+  Rule denial;
+  denial.name = "deny";
+  denial.units = {unit};
+  denial.denies = grant.grants;
+  return {grant, denial};
+}
+
 TEST(CapturePeerIdentity, AnotherUserWithGroups) {
   ASSERT_EQ(::geteuid(), 0U) << "this test changes users and has to run as root";
   const Door door;
@@ -108,6 +158,51 @@ TEST(CapturePeerIdentity, TheIdentityStaysWhenTheProcessHasDied) {
   EXPECT_EQ(identity->uid(), 4711U);
   EXPECT_EQ(identity->unit(), std::nullopt) << "a dead process has no unit";
   EXPECT_EQ(identity->program(), std::nullopt) << "and no name";
+  EXPECT_FALSE(identity->unclear().groups);
+}
+
+TEST(CapturePeerIdentity, AProcessThatHasDiedMayBeOfADeniedUnit) {
+  ASSERT_EQ(::geteuid(), 0U) << "this test changes users and has to run as root";
+  const Door door;
+  Visitor visitor(door, 4711, 4712, {});
+  const ipc::Descriptor accepted(door.accept());
+  visitor.end();
+  const auto identity = capturePeerIdentity(accepted.fd());
+  EXPECT_TRUE(identity->unclear().unit);
+  const Verdict verdict = judge(rulesAgainstUnit("cache.service"), *identity, "PURGE_ENTITLEMENT");
+  EXPECT_EQ(verdict.decision, Decision::kDenied);
+  EXPECT_TRUE(verdict.open);
+}
+
+TEST(CapturePeerIdentity, AProcessThatLivesIsOfItsUnitOrOfNone) {
+  ASSERT_EQ(::geteuid(), 0U) << "this test changes users and has to run as root";
+  const Door door;
+  const Visitor visitor(door, 4711, 4712, {});
+  const ipc::Descriptor accepted(door.accept());
+  const auto identity = capturePeerIdentity(accepted.fd());
+  if (identity->pidfd() == nullptr) GTEST_SKIP() << "this kernel has no SO_PEERPIDFD";
+  EXPECT_FALSE(identity->unclear().unit);
+  EXPECT_FALSE(identity->unclear().groups);
+  EXPECT_TRUE(judge(rulesAgainstUnit("no-such.service"), *identity, "PURGE_ENTITLEMENT").granted());
+}
+
+TEST(CapturePeerIdentity, WithoutAPidfdTheUnitIsUnclear) {
+  constexpr unsigned kPeerPidfd = 77;
+  EXPECT_TRUE(holdsWithoutOption(kPeerPidfd, [](const PeerIdentity& identity) {
+    return identity.pidfd() == nullptr && identity.unclear().unit && !identity.unclear().groups;
+  }));
+}
+
+TEST(CapturePeerIdentity, GroupsThatTheKernelDoesNotTellAreUnclear) {
+  EXPECT_TRUE(holdsWithoutOption(SO_PEERGROUPS, [](const PeerIdentity& identity) {
+    return identity.groups().empty() && identity.unclear().groups;
+  }));
+}
+
+TEST(CapturePeerIdentity, ALabelThatTheKernelDoesNotTellIsUnclear) {
+  EXPECT_TRUE(holdsWithoutOption(SO_PEERSEC, [](const PeerIdentity& identity) {
+    return !identity.label() && identity.unclear().label && !identity.unclear().groups;
+  }));
 }
 
 TEST(CapturePeerIdentity, TheProgramIsWhatTheProcessCallsItselfOnOneLine) {

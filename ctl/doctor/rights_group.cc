@@ -28,21 +28,26 @@ std::shared_ptr<const access::PeerIdentity> ownIdentity() {
   return access::capturePeerIdentity(one.get());
 }
 
-bool isForbidden(const std::string& path) {
-  return ::access(path.c_str(), R_OK) != 0 && errno == EACCES;
+using Kind = access::RuleFileFinding::Kind;
+
+bool isForbidden(const access::RuleFileFinding& finding) {
+  if (finding.kind == Kind::kReplaces) return false;
+  const int way = finding.kind == Kind::kDirectoryNotUsed ? R_OK | X_OK : R_OK;
+  return ::access(finding.path.c_str(), way) != 0 && errno == EACCES;
 }
 
 void tell(const access::RuleFileFinding& finding, Group& group) {
-  using Kind = access::RuleFileFinding::Kind;
   const std::string path = harmless(finding.path);
-  if (finding.kind != Kind::kReplaces && isForbidden(finding.path)) {
+  if (isForbidden(finding)) {
     return group.unseen("rules", fmt::format("{} cannot be read by this user", path));
   }
   switch (finding.kind) {
     case Kind::kDirectoryNotUsed:
       return group.problem(
           "rule-directory",
-          fmt::format("{} is not used ({}), so no rule in it holds", path, harmless(finding.text)),
+          fmt::format("{} is not used ({}): what it denies is not known, so no rule of any "
+                      "directory holds",
+                      path, harmless(finding.text)),
           kMend);
     case Kind::kGrantsNothing:
       return group.problem(
@@ -54,6 +59,33 @@ void tell(const access::RuleFileFinding& finding, Group& group) {
       return group.ok("rule-replaced",
                       fmt::format("{} takes the place of {}", path, harmless(finding.text)));
   }
+}
+
+bool hasUnusedDirectory(const access::ReadRules& read) {
+  return std::ranges::any_of(
+      read.findings, [](const auto& finding) { return finding.kind == Kind::kDirectoryNotUsed; });
+}
+
+/// The daemon, as another user, may well read what this user may not.
+bool isHidden(const access::ReadRules& read) {
+  return std::ranges::any_of(read.findings, [](const auto& finding) {
+    return finding.kind == Kind::kDirectoryNotUsed && isForbidden(finding);
+  });
+}
+
+/// Root reads everything; the daemon is somebody else.
+bool isClosedToTheDaemon(const Place& place, const std::string& directory, Group& group) {
+  constexpr mode_t kWayIn = S_IROTH | S_IXOTH;
+  const auto status = statusOf(directory);
+  const bool is_roots = status && status->st_uid == 0 && status->st_gid == 0;
+  if (place.own_user == 0 || !is_roots || (status->st_mode & kWayIn) == kWayIn) return false;
+  group.problem(
+      "rule-directory",
+      fmt::format("{} is closed to the daemon ({}): what it denies is not known, so no "
+                  "rule of any directory holds",
+                  harmless(directory), modeText(status->st_mode)),
+      fmt::format("as root: chmod 0755 {}; systemctl restart spacekeepd", harmless(directory)));
+  return true;
 }
 
 bool grantsToSomebody(const std::vector<access::Rule>& rules, std::string_view entitlement) {
@@ -109,14 +141,19 @@ void compare(const access::PeerIdentity& identity, const std::vector<access::Rul
 
 Group rightsGroup(const Place& place, const Contact& contact) {
   Group group{.name = "rights"};
-  const auto read = access::readRules(place.paths.vendor_directory + "/entitlements.d",
-                                      place.paths.administrator_directory + "/entitlements.d",
-                                      access::systemNameLookup(), place.own_user);
+  const std::string vendor = place.paths.vendor_directory + "/entitlements.d";
+  const std::string administrator = place.paths.administrator_directory + "/entitlements.d";
+  for (const auto& directory : {vendor, administrator}) {
+    if (isClosedToTheDaemon(place, directory, group)) return group;
+  }
+  const auto read =
+      access::readRules(vendor, administrator, access::systemNameLookup(), place.own_user);
   for (const auto& finding : read.findings) tell(finding, group);
+  if (isHidden(read)) return group;
   if (!grantsToSomebody(read.rules, access::kClientEntitlement)) {
-    group.problem("nobody", "no rule grants CLIENT_ENTITLEMENT, so nobody may connect",
-                  fmt::format("the shipped rules belong into {}/entitlements.d",
-                              place.paths.vendor_directory));
+    group.problem(
+        "nobody", "no rule grants CLIENT_ENTITLEMENT, so nobody may connect",
+        hasUnusedDirectory(read) ? kMend : fmt::format("the shipped rules belong into {}", vendor));
   }
   const auto identity = ownIdentity();
   if (identity == nullptr) return group;

@@ -28,6 +28,12 @@ using OrReason = std::variant<T, RuleError>;
 
 RuleError systemError(int error) { return {std::generic_category().message(error)}; }
 
+RuleError directoryError(int error) {
+  RuleError reason = systemError(error);
+  if (error == EACCES) reason.reason += "; let the daemon's user read it (chmod go+rx)";
+  return reason;
+}
+
 /// Why somebody else could have written this, none when nobody could.
 std::optional<RuleError> distrust(const struct stat& status, uid_t own_user) {
   if (status.st_uid != 0 && status.st_uid != own_user) {
@@ -82,14 +88,23 @@ OrReason<std::set<std::string>> ruleFileNames(int fd) {
     return systemError(error);
   }
   std::set<std::string> names;
-  while (const dirent* entry = ::readdir(entries.get())) {
+  for (;;) {
+    errno = 0;
+    const dirent* entry = ::readdir(entries.get());
+    if (entry == nullptr && errno != 0) return systemError(errno);
+    if (entry == nullptr) return names;
     const std::string name = entry->d_name;
     if (!name.starts_with('.') && name.ends_with(".plist")) names.insert(name);
     if (names.size() > kMaxRuleFiles) {
       return RuleError{fmt::format("holds more than {} rule files", kMaxRuleFiles)};
     }
   }
-  return names;
+}
+
+/// A link to nothing is there: what it should lead to may deny something.
+bool isMissing(const std::string& path) {
+  struct stat status {};
+  return ::lstat(path.c_str(), &status) < 0 && errno == ENOENT;
 }
 
 /// The walk over the two directories, with what it has found so far.
@@ -98,12 +113,13 @@ class Reading {
   Reading(const NameLookup& lookup, uid_t own_user) : lookup_(lookup), own_user_(own_user) {}
 
   void readDirectory(const std::string& path) {
+    if (isMissing(path)) return;
     const int fd = ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-    if (fd < 0 && errno == ENOENT) return;
-    if (fd < 0) return unused(path, systemError(errno));
+    if (fd < 0) return unused(path, directoryError(errno));
     const ipc::Descriptor directory(fd);
     struct stat status {};
-    if (::fstat(fd, &status) < 0) return unused(path, systemError(errno));
+    // "." is found only with the right to search, which every file in there takes as well.
+    if (::fstatat(fd, ".", &status, 0) < 0) return unused(path, directoryError(errno));
     if (const auto reason = distrust(status, own_user_)) return unused(path, *reason);
     const auto names = ruleFileNames(::fcntl(fd, F_DUPFD_CLOEXEC, 0));
     if (const auto* error = std::get_if<RuleError>(&names)) return unused(path, *error);
@@ -114,6 +130,7 @@ class Reading {
 
   ReadRules takeResult() {
     ReadRules result{.rules = {}, .findings = std::move(findings_)};
+    if (!all_directories_used_) return result;
     for (auto& [name, rule] : rules_) result.rules.push_back(std::move(rule));
     return result;
   }
@@ -145,6 +162,7 @@ class Reading {
   }
 
   void unused(const std::string& path, const RuleError& error) {
+    all_directories_used_ = false;
     findings_.push_back({Kind::kDirectoryNotUsed, path, error.reason});
   }
 
@@ -152,13 +170,17 @@ class Reading {
   const uid_t own_user_;
   std::map<std::string, Rule> rules_;
   std::map<std::string, std::string> seen_;  // name, first path
+  bool all_directories_used_ = true;
   std::vector<RuleFileFinding> findings_;
 };
 
 void logFinding(const RuleFileFinding& finding) {
   switch (finding.kind) {
     case RuleFileFinding::Kind::kDirectoryNotUsed:
-      logProblem("%s rule directory %s is not used: %s", kOperation, finding.path, finding.text);
+      logProblem(
+          "%s rule directory %s is not used: %s. What it denies is not known, so nobody is granted "
+          "anything; mend it, then start the daemon anew",
+          kOperation, finding.path, finding.text);
       break;
     case RuleFileFinding::Kind::kGrantsNothing:
       logProblem("%s rule file %s grants nothing: %s", kOperation, finding.path, finding.text);

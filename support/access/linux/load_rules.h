@@ -22,7 +22,7 @@ inline constexpr std::size_t kMaxRuleFileBytes = 64 * 1024;
 /// Something to know about a rule file or its directory.
 struct RuleFileFinding {
   enum class Kind {
-    kDirectoryNotUsed,  ///< nothing in there grants anything
+    kDirectoryNotUsed,  ///< it is there, and no rule of any directory holds
     kGrantsNothing,     ///< the file is left out
     kRemark,            ///< odd, but used
     kReplaces,          ///< the file takes the place of another, which `text` names
@@ -39,8 +39,9 @@ struct ReadRules {
 
 /// The rules of every "*.plist" file. A file of the administrator replaces the vendor's of the same
 /// name, also when it is broken: what somebody meant to take away must not come back by a typing
-/// error. Broken files, and files or directories that anybody but root or `own_user` could have
-/// written, are left out. A missing directory is an empty one.
+/// error. Broken files, and files that anybody but root or `own_user` could have written, are left
+/// out. A directory that cannot be read, or that others could have written, may have denied
+/// anything to anybody: then there are no rules at all. A missing directory is an empty one.
 [[nodiscard]] ReadRules readRules(const std::string& vendor_directory,
                                   const std::string& administrator_directory,
                                   const NameLookup& lookup, uid_t own_user);

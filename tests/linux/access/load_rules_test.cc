@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -46,6 +47,21 @@ class LoadRules : public ::testing::Test {
   }
   [[nodiscard]] bool granted(std::uint32_t uid, const std::string& entitlement) const {
     return judge(load(), PeerIdentity({.uid = uid, .gid = 9999}), entitlement).granted();
+  }
+
+  /// How many rules hold when another user than root reads them; -1 when that could not be tried.
+  [[nodiscard]] int countForAnotherUser() const {
+    fs::permissions(root_, fs::perms(0755));  // it was made for its owner alone
+    const pid_t child = ::fork();
+    if (child == 0) {
+      constexpr uid_t kAnother = 4711;
+      if (::setuid(kAnother) != 0) ::_exit(255);
+      const auto read = readRules(vendor().string(), administrator().string(), {}, kAnother);
+      ::_exit(static_cast<int>(read.rules.size()));
+    }
+    int status = -1;
+    EXPECT_EQ(::waitpid(child, &status, 0), child);
+    return WIFEXITED(status) && WEXITSTATUS(status) != 255 ? WEXITSTATUS(status) : -1;
   }
 
   fs::path root_;
@@ -125,6 +141,51 @@ TEST_F(LoadRules, ADirectoryThatOthersCanWriteIsNotUsed) {
   const LogCapture log;
   EXPECT_FALSE(granted(1, "CLIENT_ENTITLEMENT"));
   EXPECT_EQ(log.count(kLogProblem, "rule directory " + vendor().string() + " is not used: "), 1U);
+}
+
+TEST_F(LoadRules, NothingIsGrantedWhileOthersCanWriteTheAdministratorsDirectory) {
+  for (const int mode : {0775, 0757, 01777}) {
+    writeGrant(vendor() / "20.plist", 1, "CLIENT_ENTITLEMENT");
+    writeGrant(administrator() / "30.plist", 1, "PURGE_ENTITLEMENT");
+    ASSERT_EQ(::chmod(administrator().c_str(), static_cast<mode_t>(mode)), 0);
+    const LogCapture log;
+    EXPECT_FALSE(granted(1, "CLIENT_ENTITLEMENT")) << mode;
+    EXPECT_FALSE(granted(1, "PURGE_ENTITLEMENT")) << mode;
+    EXPECT_EQ(log.texts(kLogProblem).front(),
+              "loadRules rule directory " + administrator().string() +
+                  " is not used: can be written by others than its owner; take that right away "
+                  "(chmod go-w). What it denies is not known, so nobody is granted anything; mend "
+                  "it, then start the daemon anew");
+  }
+}
+
+TEST_F(LoadRules, ADirectoryThatOthersCanWriteTakesTheAdministratorsGrantsAlongToo) {
+  writeGrant(administrator() / "20.plist", 1, "CLIENT_ENTITLEMENT");
+  EXPECT_TRUE(granted(1, "CLIENT_ENTITLEMENT"));
+  ASSERT_EQ(::chmod(vendor().c_str(), 0777), 0);
+  EXPECT_FALSE(granted(1, "CLIENT_ENTITLEMENT"));
+}
+
+TEST_F(LoadRules, NothingIsGrantedWhileTheAdministratorsDirectoryCannotBeReadOrSearched) {
+  ASSERT_EQ(::geteuid(), 0U) << "this test changes users and has to run as root";
+  writeGrant(vendor() / "20.plist", 1, "CLIENT_ENTITLEMENT");
+  writeGrant(administrator() / "30.plist", 1, "PURGE_ENTITLEMENT");
+  EXPECT_EQ(countForAnotherUser(), 2);
+  for (const int mode : {0700, 0744, 0711}) {
+    ASSERT_EQ(::chmod(administrator().c_str(), static_cast<mode_t>(mode)), 0);
+    EXPECT_EQ(countForAnotherUser(), 0) << mode;
+  }
+}
+
+TEST_F(LoadRules, NothingIsGrantedWhileSomethingElseStandsInTheAdministratorsPlace) {
+  writeGrant(vendor() / "20.plist", 1, "CLIENT_ENTITLEMENT");
+  fs::remove(administrator());
+  EXPECT_TRUE(granted(1, "CLIENT_ENTITLEMENT"));
+  std::ofstream(administrator()) << "a file";
+  EXPECT_FALSE(granted(1, "CLIENT_ENTITLEMENT"));
+  fs::remove(administrator());
+  fs::create_symlink("not-mounted-yet", administrator());
+  EXPECT_FALSE(granted(1, "CLIENT_ENTITLEMENT"));
 }
 
 TEST_F(LoadRules, AFifoIsNotWaitedFor) {

@@ -132,6 +132,26 @@ TEST_F(DoctorOnRights, ADirectoryThatOthersMayWrite) {
   EXPECT_THAT(bad, testing::IsSupersetOf({"problem rule-directory", "problem nobody"}));
 }
 
+TEST_F(DoctorOnRights, AnAdministratorsDirectoryThatOthersMayWriteShutsEverybodyOut) {
+  chmod(path(kOwn).c_str(), 0775);
+  const Group group = look();
+  EXPECT_THAT(withoutUnknownGroups(group),
+              ElementsAre("problem rule-directory", "problem nobody", "advice user"));
+  EXPECT_THAT(allTexts(group), HasSubstr("so no rule of any directory holds"));
+  EXPECT_THAT(allTexts(group), testing::Not(HasSubstr("the shipped rules belong into")));
+}
+
+TEST_F(DoctorOnRights, ADirectoryThatRootCanReadAndTheDaemonCannot) {
+  if (geteuid() != 0) GTEST_SKIP() << "the rules have to be root's";
+  Place running_as_another = place();
+  running_as_another.own_user = 4242;
+  EXPECT_THAT(withoutUnknownGroups(rightsGroup(running_as_another, noDaemon())), IsEmpty());
+  chmod(path(kOwn).c_str(), 0700);
+  const Group group = rightsGroup(running_as_another, noDaemon());
+  EXPECT_THAT(badNews(group), ElementsAre("problem rule-directory"));
+  EXPECT_THAT(allTexts(group), HasSubstr("is closed to the daemon (0700)"));
+}
+
 TEST_F(DoctorOnRights, AFileThatTakesThePlaceOfAnotherIsNamedAndNoProblem) {
   write(kOwn + std::string("20-spacekeep.plist"),
         contentOf(path(kVendor + std::string("20-spacekeep.plist"))));

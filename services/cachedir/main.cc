@@ -5,6 +5,7 @@
 #include "services/cachedir/index/cache_index.h"
 #include "services/cachedir/program/modes.h"
 #include "services/cachedir/program/stop_signals.h"
+#include "support/logging/linux/standard_error.h"
 #include "support/logging/log.h"
 
 int main(int argc, char** argv) {
@@ -16,13 +17,15 @@ int main(int argc, char** argv) {
   static spacekeep::LogHandle log;  // problems, no tracing
   spacekeep::setLogHandle(&log);
   StopSignals::block();
+  const bool serves = options.mode == Mode::kCheckIn || options.mode == Mode::kServeSocket;
+  // A single run ends when nobody reads it any more, a service goes on.
+  if (serves) spacekeep::logToStandardError();
 
   auto rules = readRules(options.rules_file);
   if (const auto* error = std::get_if<RuleError>(&rules)) {
     std::fprintf(stderr, "%s\n", error->text.c_str());
     return static_cast<int>(ExitCode::kBadRules);
   }
-  const bool serves = options.mode == Mode::kCheckIn || options.mode == Mode::kServeSocket;
   CacheCleaner::Surroundings surroundings;
   if (serves) surroundings.index = std::make_shared<CacheIndex>();  // a single look needs none
   const auto cleaner = std::make_shared<CacheCleaner>(

@@ -8,6 +8,7 @@
 
 #include "services/cachedir/program/stop_signals.h"
 #include "services/command/program/modes.h"
+#include "support/logging/linux/standard_error.h"
 #include "support/logging/log.h"
 
 namespace {
@@ -52,6 +53,10 @@ int main(int argc, char** argv) {
   static spacekeep::LogHandle log;  // problems, no tracing
   spacekeep::setLogHandle(&log);
   spacekeep::cachedir::StopSignals::block();
+  // A single run ends when nobody reads it any more, a service goes on.
+  if (options.mode == Mode::kCheckIn || options.mode == Mode::kServeSocket) {
+    spacekeep::logToStandardError();
+  }
   allowManyDescriptors();
 
   std::optional<UserFolders> folders;

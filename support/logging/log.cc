@@ -88,12 +88,17 @@ std::string formatLogLine(const char* format, std::span<const LogArgument> argum
   return line;
 }
 
+std::string logLineText(std::int32_t level, const char* category, const char* format,
+                        std::span<const LogArgument> arguments) {
+  return std::string(category) + '[' + digitsOf(level) + "] " + formatLogLine(format, arguments) +
+         '\n';
+}
+
 void writeLogLine(const LogHandle* /*handle*/, std::int32_t level, const char* category,
                   const char* format, std::span<const LogArgument> arguments) {
-  std::string line = category;
-  line += '[' + digitsOf(level) + "] " + formatLogLine(format, arguments) + '\n';
+  const std::string line = logLineText(level, category, format, arguments);
   // One call for the whole line: stdio locks the stream, so lines of several threads never mix.
-  // A closed or full standard error leaves nothing to tell anybody.
+  // A standard error that takes nothing leaves nothing to tell anybody.
   static_cast<void>(std::fwrite(line.data(), 1, line.size(), stderr));
 }
 

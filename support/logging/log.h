@@ -44,11 +44,16 @@ using LogArgument = std::variant<std::int64_t, std::uint64_t, double, std::strin
 using LogWrite = void (*)(const LogHandle* handle, std::int32_t level, const char* category,
                           const char* format, std::span<const LogArgument> arguments);
 
-/// The process-wide log-write entry. Starts as writeLogLine; installPlatformLog() of the Linux half
-/// puts the journal in its place where there is one.
+/// The process-wide log-write entry. Starts as writeLogLine; the Linux half puts the journal in
+/// its place where there is one (installPlatformLog()), or a writer that does not wait.
 extern std::atomic<LogWrite> gMOLogWrite;
 
-/// The default writer: one line to standard error.
+/// One line as it is written where nothing but text can be, with its line feed.
+[[nodiscard]] std::string logLineText(std::int32_t level, const char* category, const char* format,
+                                      std::span<const LogArgument> arguments);
+
+/// The default writer: one line to standard error. It waits where that is full, and what happens
+/// where that is closed (SIGPIPE) is for the program to say, since a library is not to change it.
 void writeLogLine(const LogHandle* handle, std::int32_t level, const char* category,
                   const char* format, std::span<const LogArgument> arguments);
 

@@ -66,9 +66,14 @@ std::string adviceFor(const HostStatus& status) {
       kServicesGroup);
 }
 
+/// fmt::print(stderr, ...) throws where nobody reads any more; a service goes on.
+void complain(const std::string& text) {
+  std::fprintf(stderr, "spacekeep-command: %s\n", text.c_str());
+}
+
 void printStatus(const HostStatus& status) {
-  fmt::print(stderr, "spacekeep-command: {}{}{}{}\n", sdk::textOf(status.state),
-             status.text.empty() ? "" : ": ", status.text, adviceFor(status));
+  complain(fmt::format("{}{}{}{}", sdk::textOf(status.state), status.text.empty() ? "" : ": ",
+                       status.text, adviceFor(status)));
 }
 
 struct Presence {
@@ -134,8 +139,7 @@ ExitCode serve(std::vector<Rule> rules, const UserFolders* folders, const Option
   auto host = by_check_in ? checkIn(presence, std::move(set), options)
                           : serveSocket(std::move(set), options);
   if (!host) {
-    fmt::print(stderr, "spacekeep-command: {}{}\n", host.error().text,
-               by_check_in ? "" : " (or serve with --check-in)");
+    complain(host.error().text + (by_check_in ? "" : " (or serve with --check-in)"));
     return ExitCode::kCannotServe;
   }
   std::atomic<bool> told_to_stop{false};

@@ -11,6 +11,7 @@
 #include <cstring>
 #include <string_view>
 
+#include "support/logging/linux/standard_error.h"
 #include "support/values/text.h"
 
 namespace spacekeep {
@@ -99,7 +100,7 @@ void writeLogLineToJournal(const LogHandle* handle, std::int32_t level, const ch
       return;
     case JournalSend::kUnreachable:
       dropped_lines.fetch_add(dropped);
-      writeLogLine(handle, level, category, format, arguments);
+      writeLogLineToStandardError(handle, level, category, format, arguments);
       return;
   }
 }

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "support/logging/linux/journal.h"
+#include "support/logging/linux/standard_error.h"
 #include "support/values/plist.h"
 
 namespace spacekeep {
@@ -84,6 +85,7 @@ std::variant<std::int32_t, LogLevelProblem> readLogLevel(const std::string& path
 void setUpLogging(LogHandle& handle, const std::string& level_file) {
   handle.level.store(kDefaultLogLevel);
   setLogHandle(&handle);
+  logToStandardError();
   installPlatformLog();
   const auto level = readLogLevel(level_file);
   if (const auto* problem = std::get_if<LogLevelProblem>(&level)) {

@@ -27,7 +27,8 @@ struct LogLevelProblem {
 [[nodiscard]] std::variant<std::int32_t, LogLevelProblem> readLogLevel(const std::string& path);
 
 /// Makes `handle` the process's log handle, with the level that the file says, and the journal the
-/// place of log lines where there is one. A bad file is a problem line and kDefaultLogLevel.
+/// place of log lines where there is one, else standard error (logToStandardError()). A bad file is
+/// a problem line and kDefaultLogLevel.
 void setUpLogging(LogHandle& handle, const std::string& level_file);
 
 }  // namespace spacekeep

@@ -123,6 +123,10 @@ TEST_F(ProgramTest, WithoutASocketItCannotServeAndSaysWhatToDo) {
   EXPECT_THAT(served.err, HasSubstr("--check-in"));
 }
 
+TEST_F(ProgramTest, AServiceEndsAsUsualWhereNobodyReadsWhatItSays) {
+  EXPECT_EQ(statusWithoutAReader(kCachedir, {"--rules", rules_}), 4);
+}
+
 TEST_F(ProgramTest, OneLineOfOutputHoldsOneFileWhateverItsName) {
   const Volume volume("tmpfs");
   writeFile(volume / "a\nb\x1b", kMiB);

@@ -7,6 +7,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <array>
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
@@ -21,6 +22,14 @@ constexpr int kFirstHandedOver = 3;  // SD_LISTEN_FDS_START
 std::string contentOf(const std::string& path) {
   std::ifstream stream(path);
   return {std::istreambuf_iterator<char>(stream), {}};
+}
+
+std::vector<char*> pointersTo(const std::string& program,
+                              const std::vector<std::string>& arguments) {
+  std::vector<char*> words{const_cast<char*>(program.c_str())};
+  for (const std::string& word : arguments) words.push_back(const_cast<char*>(word.c_str()));
+  words.push_back(nullptr);
+  return words;
 }
 
 void sendTo(const std::string& path, int descriptor) {
@@ -44,9 +53,7 @@ Program::Program(const std::vector<std::string>& arguments, int listening,
   const std::string folder = temporaryDirectory();
   out_ = folder + "/out";
   err_ = folder + "/err";
-  std::vector<char*> words{const_cast<char*>(program.c_str())};
-  for (const std::string& word : arguments) words.push_back(const_cast<char*>(word.c_str()));
-  words.push_back(nullptr);
+  std::vector<char*> words = pointersTo(program, arguments);
   pid_ = ::fork();
   if (pid_ != 0) return;
   ::prctl(PR_SET_PDEATHSIG, SIGKILL);
@@ -76,6 +83,24 @@ Ended Program::wait() {
 }
 
 Ended runProgram(const std::vector<std::string>& arguments) { return Program(arguments).wait(); }
+
+int statusWithoutAReader(const std::string& program, const std::vector<std::string>& arguments) {
+  std::array<int, 2> ends{};
+  EXPECT_EQ(::pipe2(ends.data(), O_CLOEXEC), 0);
+  ::close(ends[0]);
+  std::vector<char*> words = pointersTo(program, arguments);
+  const pid_t pid = ::fork();
+  if (pid == 0) {
+    ::signal(SIGPIPE, SIG_DFL);
+    ::dup2(ends[1], STDERR_FILENO);
+    ::execv(program.c_str(), words.data());
+    ::_exit(127);
+  }
+  ::close(ends[1]);
+  int status = 0;
+  EXPECT_EQ(::waitpid(pid, &status, 0), pid);
+  return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
 
 std::string ruleFile(const std::string& content) {
   std::string path = temporaryDirectory() + "/rules.plist";

@@ -41,6 +41,10 @@ class Program {
 
 [[nodiscard]] Ended runProgram(const std::vector<std::string>& arguments);
 
+/// The status, as in Ended, of the program whose standard error is a pipe that nobody reads.
+[[nodiscard]] int statusWithoutAReader(const std::string& program,
+                                       const std::vector<std::string>& arguments);
+
 /// Writes an XML property list with `content` in its dictionary; answers its path.
 [[nodiscard]] std::string ruleFile(const std::string& content);
 /// Rules for one directory with the default ages.

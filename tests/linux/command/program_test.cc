@@ -1,7 +1,10 @@
 // The program from outside: its output, its exit codes, and how it serves.
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <sys/mount.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -28,6 +31,23 @@ std::string ruleText(const std::string& id, const std::string& path, const std::
   return "<plist version=\"1.0\"><dict><key>SPACEKEEP_ID</key><string>" + id +
          "</string><key>DIRECTORIES</key><array><dict><key>PATH</key><string>" + path +
          "</string></dict></array>" + more + "</dict></plist>\n";
+}
+
+/// How the program ends that says something on standard error, is no longer read from then on, and
+/// is told to stop.
+Ended stoppedWhenNobodyReads(const std::vector<std::string>& arguments) {
+  const std::string fifo = temporaryDirectory() + "/fifo";
+  EXPECT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
+  const int reader = ::open(fifo.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+  std::vector<std::string> words{"-c", "exec \"$@\" 2>\"$0\"", fifo, kProgram};
+  words.insert(words.end(), arguments.begin(), arguments.end());
+  Program running(words, -1, "/bin/sh");
+  pollfd said{.fd = reader, .events = POLLIN, .revents = 0};
+  EXPECT_EQ(::poll(&said, 1, 20'000), 1) << "it says nothing";
+  EXPECT_NE(said.revents & POLLIN, 0) << "it has ended at once";
+  ::close(reader);
+  running.signal(SIGTERM);
+  return running.wait();
 }
 
 class CommandProgram : public testing::Test {
@@ -107,6 +127,16 @@ TEST_F(CommandProgram, ADryRunNamesTheCommandOfWhichNobodyKnowsWhatItFrees) {
 TEST_F(CommandProgram, EachRuleDescribesItself) {
   EXPECT_EQ(runIt({"--rules-dir", rules_, "--only", "a", "--describe"}).out,
             "a (on): things\n  urgency 1 takes some\n  lost: little\n  source: we do\n");
+}
+
+TEST_F(CommandProgram, AServiceEndsAsUsualWhereNobodyReadsWhatItSays) {
+  EXPECT_EQ(cachedir::statusWithoutAReader(kProgram, {"--rules-dir", rules_}), 4);
+}
+
+TEST_F(CommandProgram, AServiceGoesOnWhenNobodyReadsWhatItSaysAnyMore) {
+  const Ended served =
+      stoppedWhenNobodyReads({"--rules-dir", rules_, "--check-in", "--socket", "/nowhere/socket"});
+  EXPECT_EQ(served.status, 0);
 }
 
 TEST_F(CommandProgram, MistakesAreSaidWithAnExitCodeOfTheirOwn) {

@@ -171,6 +171,14 @@ TEST(Tool, WhatItLeavesRunningIsEndedWithIt) {
   EXPECT_TRUE(isGone(file));
 }
 
+TEST(Tool, SignalsThatThisProcessIgnoresEndItAsUsual) {
+  const auto before = ::signal(SIGPIPE, SIG_IGN);
+  const ToolRun run = play({shellTool("kill -PIPE $$; echo goes on")});
+  ::signal(SIGPIPE, before);
+  EXPECT_EQ(run.status, 128 + SIGPIPE);
+  EXPECT_EQ(run.output, "");
+}
+
 TEST(Tool, AProblemIsOneLineThatNamesTheCommandAndItsLastWords) {
   const Words words{shellTool("echo first >&2; printf 'E: \\033no room\\n\\n' >&2; exit 100"),
                     "a b"};

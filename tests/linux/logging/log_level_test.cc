@@ -3,6 +3,8 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <csignal>
+
 #include "tests/helpers/temporary_directory.h"
 
 namespace spacekeep {
@@ -62,7 +64,17 @@ TEST(LogLevelFile, ABadFileIsAProblem) {
   EXPECT_TRUE(problem(directory / "fifo/below").starts_with("it cannot be opened: "));
 }
 
-TEST(LogSetUp, ABadFileIsAProblemLineAndTheDefaultLevel) {
+/// Gives back what setting up logging has changed.
+class LogSetUp : public testing::Test {
+ protected:
+  ~LogSetUp() override {
+    setLogHandle(nullptr);
+    gMOLogWrite.store(&writeLogLine);
+    std::signal(SIGPIPE, SIG_DFL);
+  }
+};
+
+TEST_F(LogSetUp, ABadFileIsAProblemLineAndTheDefaultLevel) {
   const TemporaryDirectory directory;
   const std::string path = directory.write("level", "junk");
   LogHandle handle;
@@ -74,15 +86,13 @@ TEST(LogSetUp, ABadFileIsAProblemLineAndTheDefaultLevel) {
   EXPECT_EQ(written,
             "Spacekeep[3] setUpLogging " + path +
                 " is not used, the log level is 4: not a property list: it is not well formed\n");
-  setLogHandle(nullptr);
 }
 
-TEST(LogSetUp, TheHandleHasTheLevelOfTheFile) {
+TEST_F(LogSetUp, TheHandleHasTheLevelOfTheFile) {
   const TemporaryDirectory directory;
   LogHandle handle;
   setUpLogging(handle, directory.write("level", levelDocument("<integer>5</integer>")));
   EXPECT_EQ(handle.level.load(), 5);
-  setLogHandle(nullptr);
 }
 
 }  // namespace

@@ -88,6 +88,7 @@ std::vector<LineRule> ofProcesses() {
             "errors are values; rt::panic for what cannot be; only main ends a program");
   ends.exceptions = {{"support/runtime/", "where rt::panic ends the process"},
                      {"support/events/linux/linux_event_sources.cc", "the termination signal"},
+                     {"support/logging/linux/standard_error.cc", "the signal of a closed output"},
                      {"ctl/check_service/", "a tool that cleans up after a signal, and a child"},
                      {"sdk/include/spacekeep/error.h",
                       "the one assertion of the library: a value "

@@ -15,18 +15,19 @@ namespace {
 /// Marks the entry of the synchronous read in the log.
 constexpr int kReadEntryLine = 622;
 
+constexpr const char* kTooLarge = "a record is too large for a property list";
+
 }  // namespace
 
+// Without a suite there is no state to keep anything in.
 void Spacekeep::clientSetStateSync(StateObject value, const std::string& key) {
   defaults_queue_->assertCurrent("clientSetStateSync");
-  if (auto* record = std::get_if<std::shared_ptr<SpacekeepRecentInfo>>(&value)) {
-    keepRecord(std::move(*record), key);
-  } else {
-    auto* plain = std::get_if<Value>(&value);
-    const ipc::OptionalValue stored = plain == nullptr ? std::nullopt : std::optional(*plain);
-    changeState(stored, key);
-    if (user_defaults_) actOnChange(key, stored);
-  }
+  if (!user_defaults_) return;
+  const bool is_record = std::holds_alternative<LateChanges::Record>(value);
+  const auto* plain = std::get_if<Value>(&value);
+  const ipc::OptionalValue stored = plain == nullptr ? std::nullopt : std::optional(*plain);
+  late_changes_.set(key, std::move(value));
+  if (!is_record) actOnChange(key, stored);
   writeSoon();
 }
 
@@ -35,10 +36,10 @@ StateObject Spacekeep::clientGetStateSync(const std::string& key) {
   defaults_queue_->assertCurrent("clientGetStateSync");
   logTrace("%s %d", "clientGetStateSync", kReadEntryLine);
   StateObject answer;
-  if (key == kept_record_.key && kept_record_.isNewerThanState()) {
+  if (const auto record = late_changes_.recordAt(key)) {
     // The same read for whoever follows it in the log, without the way through bytes.
     logTrace("%s ENTRY", "_clientGetState");
-    answer = kept_record_.record;
+    answer = record;
     logTrace("%s EXIT", "_clientGetState");
   } else {
     _clientGetState(key, [&](ipc::OptionalValue value) {
@@ -52,39 +53,16 @@ StateObject Spacekeep::clientGetStateSync(const std::string& key) {
 StateObject Spacekeep::recordOf(const std::string& key, Value value) {
   const Data* archive = value.data();
   if (archive == nullptr) return value;
-  if (key == kept_record_.key && kept_record_.isArchivedAs(value)) return kept_record_.record;
-  auto record = recentInfoFromArchive(*archive);
-  if (!record) {
+  if (auto known = late_changes_.writtenRecord(key, *archive)) return known;
+  auto parsed = recentInfoFromArchive(*archive);
+  if (!parsed) {
     logProblem("%s the bytes of %@ are not an archive of this version and count as absent",
                "clientGetStateSync", key);
     return {};
   }
-  keepRecord(std::make_shared<SpacekeepRecentInfo>(std::move(*record)), key);
-  kept_record_.archive = *archive;
-  return kept_record_.record;
-}
-
-// One record is kept. Another key's gives way to it and goes on as bytes.
-void Spacekeep::keepRecord(std::shared_ptr<SpacekeepRecentInfo> record, const std::string& key) {
-  if (key != kept_record_.key) archiveKeptRecord();
-  kept_record_ = {.key = key, .record = std::move(record)};
-}
-
-// Somebody wants the bytes. They are not written out by that.
-void Spacekeep::archiveKeptRecord() {
-  if (!user_defaults_ || !kept_record_.isNewerThanState()) return;
-  KeptRecord archived = kept_record_;
-  archived.archive = archivedRecentInfo(*archived.record);
-  changeState(Value(*archived.archive), archived.key);
-  kept_record_ = std::move(archived);
-}
-
-// Its bytes may have been among what did not get to the disk.
-void Spacekeep::keepRecordToBeWritten(KeptRecord record) {
-  kept_record_ = std::move(record);
-  if (!kept_record_.record) return;
-  kept_record_.archive.reset();
-  writeSoon();
+  auto record = std::make_shared<SpacekeepRecentInfo>(std::move(*parsed));
+  late_changes_.keepWritten(key, record, *archive);
+  return record;
 }
 
 void Spacekeep::writeSoon() {
@@ -97,11 +75,18 @@ void Spacekeep::writeSoon() {
   });
 }
 
+// Laid over what stands on the disk by now, which others may have changed since. What does not get
+// there stays in memory, seen as before and in nobody's way, until the next change tries again.
 void Spacekeep::writeNow() {
   late_write_is_due_ = false;
-  archiveKeptRecord();
-  if (const auto why = user_defaults_->synchronize()) {
+  if (!late_changes_.areAny()) return;
+  Dictionary state = storedState();
+  const bool fits = late_changes_.layOver(state);
+  const auto why = fits ? writeOut(std::move(state)) : std::optional<std::string>(kTooLarge);
+  if (why) {
     logProblem("%s recent statistics are not on the disk: %@", "writeNow", *why);
+  } else {
+    late_changes_.wereWritten();
   }
 }
 

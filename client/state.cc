@@ -21,29 +21,29 @@ void Spacekeep::_clientSetState(ipc::OptionalValue value, const std::string& key
   if (reply) reply();
 }
 
-// The answer tells what is on the disk, so a change that did not get there is taken back: nobody
-// shall find later what was said not to be stored.
+// It is written alone: what the daemon has still to write must not keep it from the disk.
 std::optional<std::string> Spacekeep::writeState(ipc::OptionalValue value, const std::string& key) {
   if (!user_defaults_) return "there is no preferences suite";
-  KeptRecord before = kept_record_;
-  changeState(std::move(value), key);
-  std::optional<std::string> why = user_defaults_->synchronize();
-  if (!why) return std::nullopt;
-  user_defaults_->discard(keys::kUserDefaults);
-  keepRecordToBeWritten(std::move(before));
-  return why;
-}
-
-void Spacekeep::changeState(ipc::OptionalValue value, const std::string& key) {
-  if (key == kept_record_.key) kept_record_ = {};
-  if (!user_defaults_) return;
-  Dictionary state = mutableState();
+  Dictionary state = storedState();
   if (value) {
     state.set(key, std::move(*value));
   } else {
     state.remove(key);
   }
+  std::optional<std::string> why = writeOut(std::move(state));
+  if (!why) late_changes_.forget(key);
+  // This write of the daemon's own may have failed before.
+  if (late_changes_.areAny()) writeSoon();
+  return why;
+}
+
+// The answer tells what is on the disk, so a change that did not get there is taken back: nobody
+// shall find later what was said not to be stored.
+std::optional<std::string> Spacekeep::writeOut(Dictionary state) {
   user_defaults_->set(keys::kUserDefaults, std::move(state));
+  std::optional<std::string> why = user_defaults_->synchronize();
+  if (why) user_defaults_->discard(keys::kUserDefaults);
+  return why;
 }
 
 void Spacekeep::_clientGetState(const Value& key, const ValueReply& reply) {
@@ -59,33 +59,34 @@ void Spacekeep::_clientGetState(const Value& key, const ValueReply& reply) {
 }
 
 std::optional<Value> Spacekeep::answerFor(const std::string& key) {
-  if (key == kept_record_.key || key == keys::kUserDefaults) archiveKeptRecord();
   const Value* stored = persistentState();
-  if (stored == nullptr) {
-    const Value* value = default_values_.find(key);
-    return value == nullptr ? std::nullopt : std::optional(*value);
-  }
-  if (const Dictionary* state = stored->dictionary()) return valueIn(*state, key);
+  const Dictionary* state = stored == nullptr ? nullptr : stored->dictionary();
+  if (state != nullptr) return valueIn(*state, key);
+  // What the daemon has changed makes a state by itself.
+  if (late_changes_.areAny()) return valueIn({}, key);
+  if (stored == nullptr) return builtIn(key);
   logProblem("%s persistent_state is not a dictionary: %@", "_clientGetState", *stored);
   return std::nullopt;
 }
 
-std::optional<Value> Spacekeep::valueIn(const Dictionary& state, const std::string& key) const {
+std::optional<Value> Spacekeep::valueIn(const Dictionary& state, const std::string& key) {
   if (key == keys::kUserDefaults) {
     Dictionary merged = state;
+    late_changes_.layOver(merged);
     for (const auto& [name, value] : default_values_) {
-      if (!state.contains(name)) merged.set(name, value);
+      if (!merged.contains(name)) merged.set(name, value);
     }
     return merged;
   }
-  if (const Value* value = state.find(key)) return *value;
-  const Value* value = default_values_.find(key);
-  if (value == nullptr) return std::nullopt;
-  logTrace("%s using default value: %@ for key: %@", "_clientGetState", *value, key);
-  return *value;
+  if (const Value* value = late_changes_.find(key, state)) return *value;
+  auto value = builtIn(key);
+  if (value) {
+    logTrace("%s using default value: %@ for key: %@", "_clientGetState", *value, key);
+  }
+  return value;
 }
 
-// What is on the disk, with what was set since and is still to be written.
+// What is on the disk now, whoever has put it there.
 const Value* Spacekeep::persistentState() {
   if (!user_defaults_) return nullptr;
   if (const auto problem = user_defaults_->refresh()) {
@@ -95,15 +96,23 @@ const Value* Spacekeep::persistentState() {
 }
 
 // A state that is no dictionary is replaced by one with the first change.
-Dictionary Spacekeep::mutableState() {
+Dictionary Spacekeep::storedState() {
   const Value* stored = persistentState();
   const Dictionary* state = stored == nullptr ? nullptr : stored->dictionary();
   return state == nullptr ? Dictionary() : *state;
 }
 
+std::optional<Value> Spacekeep::builtIn(const std::string& key) const {
+  const Value* value = default_values_.find(key);
+  return value == nullptr ? std::nullopt : std::optional(*value);
+}
+
 void Spacekeep::actOnChange(const std::string& key, const ipc::OptionalValue& value) {
   if (key == keys::kCacheEnabled) notifyRecipients(key, value);
-  if (isSettingKey(key)) applySettings(mutableState());
+  if (!isSettingKey(key)) return;
+  Dictionary state = storedState();
+  late_changes_.layOver(state);
+  applySettings(state);
 }
 
 }  // namespace spacekeep

@@ -18,12 +18,11 @@
 #include <set>
 #include <string>
 #include <string_view>
-#include <variant>
 #include <vector>
 
 #include "client/client_protocol.h"
 #include "client/history_protocol.h"
-#include "client/kept_record.h"
+#include "client/late_changes.h"
 #include "client/purge_operations.h"
 #include "registry/service.h"
 #include "registry/service_protocol.h"
@@ -45,9 +44,6 @@ using SpacekeepListener = ipc::Listener;
 inline constexpr std::size_t kMaxRegisteredServices = 4096;
 /// Of the ID of one of them. IDs stand in every outcome and in every request of a later urgency.
 inline constexpr std::size_t kMaxServiceIdBytes = 255;
-
-/// What the daemon reads from its own state: nothing, a value, or a record.
-using StateObject = std::variant<std::monostate, Value, std::shared_ptr<SpacekeepRecentInfo>>;
 
 /// How late the daemon's own records reach the disk: many answers make one write.
 inline constexpr std::uint64_t kLateWriteDelayNs = 5'000'000'000;
@@ -183,17 +179,17 @@ class Spacekeep : public SpacekeepClientProtocol,
   // Client state, on defaults_queue_.
   /// Null when there is none. Good until the suite is touched again.
   [[nodiscard]] const Value* persistentState();
-  [[nodiscard]] Dictionary mutableState();
+  /// Without what is still to be written.
+  [[nodiscard]] Dictionary storedState();
   [[nodiscard]] std::optional<Value> answerFor(const std::string& key);
-  [[nodiscard]] std::optional<Value> valueIn(const Dictionary& state, const std::string& key) const;
-  void changeState(ipc::OptionalValue value, const std::string& key);
+  [[nodiscard]] std::optional<Value> valueIn(const Dictionary& state, const std::string& key);
+  [[nodiscard]] std::optional<Value> builtIn(const std::string& key) const;
+  // Each answers why it is not on the disk, if it is not.
   [[nodiscard]] std::optional<std::string> writeState(ipc::OptionalValue value,
                                                       const std::string& key);
+  [[nodiscard]] std::optional<std::string> writeOut(Dictionary state);
   void actOnChange(const std::string& key, const ipc::OptionalValue& value);
-  void keepRecord(std::shared_ptr<SpacekeepRecentInfo> record, const std::string& key);
   [[nodiscard]] StateObject recordOf(const std::string& key, Value value);
-  void archiveKeptRecord();
-  void keepRecordToBeWritten(KeptRecord record);
   void writeSoon();
   void writeNow();
   /// Also on the creating thread, before any queue is in use.
@@ -212,7 +208,7 @@ class Spacekeep : public SpacekeepClientProtocol,
   std::shared_ptr<History> history_;  // null when none is kept; constant after init
   std::string root_path_;
   std::unique_ptr<PreferencesSuite> user_defaults_;  // confined to defaults_queue_
-  KeptRecord kept_record_;                           // confined to defaults_queue_
+  LateChanges late_changes_;                         // confined to defaults_queue_
   bool late_write_is_due_ = false;                   // confined to defaults_queue_
   std::atomic<bool> finish_early_ = false;           // of purges that do not say
   mutable ServiceRegistry registry_;                 // confined to collection_queue_

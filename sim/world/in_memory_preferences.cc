@@ -70,6 +70,16 @@ void InMemoryDisk::failSynchronize(std::string reason) {
   failure_ = std::move(reason);
 }
 
+void InMemoryDisk::limitValuesTo(std::size_t bytes) {
+  const std::scoped_lock lock(mutex_);
+  largest_value_ = bytes;
+}
+
+std::size_t InMemoryDisk::largestValue() const {
+  const std::scoped_lock lock(mutex_);
+  return largest_value_;
+}
+
 bool InMemoryDisk::refusesToOpen() const {
   const std::scoped_lock lock(mutex_);
   return refuse_to_open_;
@@ -89,6 +99,7 @@ std::optional<std::string> InMemoryPreferencesSuite::synchronize() {
     return failure;
   }
   if (unwritten_.empty()) return std::nullopt;
+  if (giveUpWhatIsTooLarge()) return "too large to be stored and given up";
   const std::uint64_t half_ns = disk_.writeTimeNs() / 2;
   sleepIfAny(half_ns);
   for (auto& [key, value] : unwritten_) {
@@ -99,6 +110,14 @@ std::optional<std::string> InMemoryPreferencesSuite::synchronize() {
   disk_.write(name_, known_);
   sleepIfAny(half_ns);
   return std::nullopt;
+}
+
+bool InMemoryPreferencesSuite::giveUpWhatIsTooLarge() {
+  const std::size_t largest = disk_.largestValue();
+  if (largest == kMaxPlistBytes) return false;  // nothing here comes near it
+  return std::erase_if(unwritten_, [largest](const auto& entry) {
+           return entry.second && binaryPlist(*entry.second).size() > largest;
+         }) > 0;
 }
 
 std::optional<std::string> InMemoryPreferencesSuite::refresh() {

@@ -4,6 +4,7 @@
 // Preferences suites whose disk is a map. What was set and not synchronized is lost with the suite.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <map>
 #include <memory>
@@ -14,6 +15,7 @@
 #include "sim/world/trace.h"
 #include "support/preferences/preferences_suite.h"
 #include "support/runtime/runtime.h"
+#include "support/values/plist.h"
 
 namespace spacekeep::sim {
 
@@ -38,6 +40,10 @@ class InMemoryDisk {
   void refuseToOpen(bool refuse);
   /// From now on synchronize() and refresh() fail with this text; empty: works again.
   void failSynchronize(std::string reason);
+  /// From now on a value whose property list is larger than this is given up when it is to be
+  /// written, as one is that no property list can hold.
+  void limitValuesTo(std::size_t bytes);
+  [[nodiscard]] std::size_t largestValue() const;
   [[nodiscard]] bool refusesToOpen() const;
   [[nodiscard]] std::optional<std::string> synchronizeFailure() const;
   /// For the trace: a write of the suite came to nothing.
@@ -53,6 +59,7 @@ class InMemoryDisk {
   std::uint64_t write_time_ns_ = 0;
   bool refuse_to_open_ = false;
   std::string failure_;
+  std::size_t largest_value_ = kMaxPlistBytes;
 };
 
 class InMemoryPreferencesSuite final : public PreferencesSuite {
@@ -66,6 +73,8 @@ class InMemoryPreferencesSuite final : public PreferencesSuite {
   void discard(std::string_view key) override;
 
  private:
+  [[nodiscard]] bool giveUpWhatIsTooLarge();
+
   InMemoryDisk& disk_;
   const std::string name_;
   InMemoryDisk::Contents known_;

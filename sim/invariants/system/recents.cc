@@ -21,9 +21,9 @@ class RecordFollower {
  public:
   RecordFollower(const SystemStory& story, const Life& life, Findings& findings)
       : life_(life), findings_(findings) {
-    const bool is_closed = life.number > 0 && life.number - 1 < story.run.plan.crashes.size() &&
-                           story.run.plan.crashes[life.number - 1].store_refuses_to_open;
-    if (!is_closed) load();
+    is_closed_ = life.number > 0 && life.number - 1 < story.run.plan.crashes.size() &&
+                 story.run.plan.crashes[life.number - 1].store_refuses_to_open;
+    if (!is_closed_) load();
   }
 
   void follow() {
@@ -114,7 +114,7 @@ class RecordFollower {
     if (!clockIsClear(at) || !looksAgain(at)) known_ = false;
     const std::string* volume = stringAt(entry, "SPACEKEEP_VOLUME");
     const Value* amount = entry.find("SPACEKEEP_AMOUNT");
-    if (!known_ || volume == nullptr || amount == nullptr) return;
+    if (is_closed_ || !known_ || volume == nullptr || amount == nullptr) return;
     const RecordModel::FreeSpace free = looksAround(at, true);
     const auto space = free.find(*volume);
     record_.answer(*volume, service, *amount, space == free.end() ? 0 : space->second, nowNs(at));
@@ -166,6 +166,7 @@ class RecordFollower {
   Findings& findings_;
   RecordModel record_;
   RecordModel::FreeSpace free_;
+  bool is_closed_ = false;  // without a store nothing is kept
   bool known_ = true;
 };
 

@@ -114,14 +114,16 @@ TEST(LateState, WritingNothingTakesTheKeyAway) {
   });
 }
 
-TEST(LateState, WithoutASuiteWritingNothingTakesTheRecordAwayToo) {
+TEST(LateState, WithoutASuiteNothingIsKept) {
   inEverySchedule(kSchedules, [] {
     StateWorld world;
     world.world.disk().refuseToOpen(true);
     world.start();
     world.setSync(shared(recordOf("/", "cache", 5)), kKey);
-    world.setSync({}, kKey);
+    world.setSync(Value(7), "key");
     EXPECT_EQ(world.record(), std::nullopt);
+    EXPECT_EQ(world.get(kKey), std::nullopt);
+    EXPECT_TRUE(std::holds_alternative<std::monostate>(world.getSync("key")));
   });
 }
 
@@ -209,7 +211,9 @@ TEST(LateState, AWriteThatFailsIsAProblemAndMadeUpForWithTheNextOne) {
     EXPECT_EQ(world.record(), record);
     EXPECT_FALSE(world.onDisk(kKey).has_value());
     EXPECT_TRUE(world.set("key", Value(1)));
+    EXPECT_TRUE(world.eventually([&] { return world.world.disk().writes() == 2; }));
     EXPECT_EQ(world.onDisk(kKey), Value(archivedRecentInfo(record)));
+    EXPECT_EQ(world.onDisk("key"), Value(1));
   });
 }
 
@@ -223,6 +227,73 @@ TEST(LateState, AClientsSetInBetweenLosesNothingOfIt) {
     EXPECT_EQ(world.record(), record);
     EXPECT_TRUE(world.eventually([&] { return world.onDisk(kKey).has_value(); }));
     EXPECT_EQ(world.onDisk("key"), Value(1));
+  });
+}
+
+TEST(LateState, WhatOthersPutOnTheDiskAfterAWriteThatFailedIsSeenAndKept) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    world.world.disk().failSynchronize("the disk is full");
+    const SpacekeepRecentInfo record = recordOf("/", "cache", 5);
+    world.setSync(shared(record), kKey);
+    EXPECT_TRUE(world.eventually(
+        [&] { return world.lines("%s recent statistics are not on the disk: %@") == 1; }));
+    world.world.disk().failSynchronize("");
+    world.putOnDisk(Dictionary{{"theirs", 1}});
+    EXPECT_EQ(world.get("theirs"), Value(1));
+    EXPECT_TRUE(world.set("key", Value(1)));
+    EXPECT_EQ(world.onDisk("theirs"), Value(1));
+    EXPECT_EQ(world.record(), record);
+  });
+}
+
+TEST(LateState, WithNothingElseStoredItMakesTheState) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.putOnDisk("no dictionary");
+    world.start();
+    world.setSync(Value("late"), "plain");
+    EXPECT_EQ(world.get("plain"), Value("late"));
+    EXPECT_EQ(world.get("SPACEKEEP_CACHE_ENABLED"), Value(true));
+    EXPECT_TRUE(world.eventually([&] { return world.world.disk().writes() == 2; }));
+    EXPECT_EQ(world.stateOnDisk(), Value(Dictionary{{"plain", "late"}}));
+    EXPECT_TRUE(world.problems().empty());
+  });
+}
+
+TEST(LateState, OlderBytesThatAClientPutsBackAreTheRecordThatTheyWere) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    const SpacekeepRecentInfo older = recordOf("/", "cache", 5);
+    world.setSync(shared(older), kKey);
+    EXPECT_TRUE(world.eventually([&] { return world.onDisk(kKey).has_value(); }));
+    const auto bytes = world.get(kKey);
+    // The store's own object changes and is stored again.
+    world.daemon->defaults_queue()->sync([&] {
+      const auto record = std::get<StateWorld::Record>(world.daemon->clientGetStateSync(kKey));
+      record->update("/", "another", {.amount = 6, .timestamp = recentDate(0)}, 0);
+      world.daemon->clientSetStateSync(record, kKey);
+    });
+    EXPECT_NE(world.record(), older);
+    EXPECT_TRUE(world.set(kKey, bytes));
+    EXPECT_EQ(world.record(), older);
+  });
+}
+
+TEST(LateState, AReadOfARecordOnTheDiskIsTheSameObjectWhileNobodyElseHasChangedIt) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    const auto record = shared(recordOf("/", "cache", 5));
+    world.setSync(record, kKey);
+    EXPECT_TRUE(world.eventually([&] { return world.onDisk(kKey).has_value(); }));
+    EXPECT_EQ(world.getSync(kKey), StateObject(record));
+    const SpacekeepRecentInfo other = recordOf("/", "other", 6);
+    world.putOnDisk(Dictionary{{kKey, archivedRecentInfo(other)}});
+    EXPECT_EQ(world.record(), other);
+    EXPECT_EQ(world.getSync(kKey), world.getSync(kKey));
   });
 }
 

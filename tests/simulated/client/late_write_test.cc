@@ -99,5 +99,61 @@ TEST(LateWrite, AnswersThatEndWithTheProcessBeforeFiveSecondsAreNotOnTheDisk) {
   });
 }
 
+TEST(LateWrite, WhatOthersPutOnTheDiskMeanwhileIsSeenAndKept) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    const SpacekeepRecentInfo record = recordOf("/", "cache", 5);
+    const Value archive = archivedRecentInfo(record);
+    world.setSync(shared(record), keys::kRecentServiceStats);
+    world.setSync(Value("late"), "plain");
+    EXPECT_EQ(world.get(keys::kRecentServiceStats), archive);
+    world.putOnDisk(Dictionary{{"theirs", 1}});
+    EXPECT_EQ(world.get("theirs"), Value(1));
+    const auto state = world.get(keys::kUserDefaults);
+    ASSERT_TRUE(state.has_value());
+    EXPECT_EQ(*state, Value(Dictionary{{keys::kRecentServiceStats, archive},
+                                       {"SPACEKEEP_CACHE_ENABLED", true},
+                                       {"plain", "late"},
+                                       {"theirs", 1}}));
+    EXPECT_TRUE(
+        world.eventually([&] { return world.onDisk(keys::kRecentServiceStats) == archive; }));
+    EXPECT_EQ(
+        world.stateOnDisk(),
+        Value(Dictionary{{keys::kRecentServiceStats, archive}, {"plain", "late"}, {"theirs", 1}}));
+  });
+}
+
+TEST(LateWrite, ThatFailedIsTriedAgainFiveSecondsAfterTheNextChangeAndNotBefore) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    world.world.disk().failSynchronize("the disk is full");
+    world.setSync(shared(recordOf("/", "cache", 1)), keys::kRecentServiceStats);
+    rt::sleepNs(3600 * kSecond);
+    EXPECT_EQ(world.lines("%s recent statistics are not on the disk: %@"), 1U);
+    world.world.disk().failSynchronize("");
+    const std::uint64_t start_ns = world.world.nowNs();
+    EXPECT_TRUE(world.set("key", Value(1)));
+    EXPECT_FALSE(world.onDisk(keys::kRecentServiceStats).has_value());
+    expectOneWriteAt(world, start_ns + 5 * kSecond);
+    EXPECT_TRUE(world.onDisk(keys::kRecentServiceStats).has_value());
+    rt::sleepNs(3600 * kSecond);
+    EXPECT_EQ(world.world.disk().writes(), 2U);
+  });
+}
+
+TEST(LateWrite, OfAKeyThatAClientHasSetSinceIsNotMade) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    world.setSync(shared(recordOf("/", "cache", 1)), keys::kRecentServiceStats);
+    EXPECT_TRUE(world.set(keys::kRecentServiceStats, Value("mine now")));
+    rt::sleepNs(60 * kSecond);
+    EXPECT_EQ(world.world.disk().writes(), 1U);
+    EXPECT_EQ(world.onDisk(keys::kRecentServiceStats), Value("mine now"));
+  });
+}
+
 }  // namespace
 }  // namespace spacekeep::test

@@ -1,0 +1,70 @@
+#include "client/late_changes.h"
+
+#include <utility>
+
+#include "purgeable/recent_archive.h"
+
+namespace spacekeep {
+
+// The record on the disk may be the very object that is set, changed: its bytes are then older.
+void LateChanges::set(const std::string& key, StateObject object) {
+  written_.erase(key);
+  Change change;
+  if (auto* record = std::get_if<Record>(&object)) change.record = std::move(*record);
+  if (auto* value = std::get_if<Value>(&object)) change.value = std::move(*value);
+  changes_.insert_or_assign(key, std::move(change));
+}
+
+void LateChanges::forget(const std::string& key) {
+  changes_.erase(key);
+  written_.erase(key);
+}
+
+void LateChanges::wereWritten() {
+  for (auto& [key, change] : changes_) {
+    if (change.record) keepWritten(key, std::move(change.record), *change.value->data());
+  }
+  changes_.clear();
+}
+
+LateChanges::Record LateChanges::recordAt(const std::string& key) const {
+  const auto found = changes_.find(key);
+  return found == changes_.end() ? nullptr : found->second.record;
+}
+
+const Value* LateChanges::find(const std::string& key, const Dictionary& state) {
+  const auto found = changes_.find(key);
+  if (found == changes_.end()) return state.find(key);
+  archive(found->second);
+  return found->second.value ? &*found->second.value : nullptr;
+}
+
+bool LateChanges::layOver(Dictionary& state) {
+  bool all_have_bytes = true;
+  for (auto& [key, change] : changes_) {
+    archive(change);
+    if (change.record && change.value->data()->bytes.empty()) all_have_bytes = false;
+    if (change.value) {
+      state.set(key, *change.value);
+    } else {
+      state.remove(key);
+    }
+  }
+  return all_have_bytes;
+}
+
+LateChanges::Record LateChanges::writtenRecord(const std::string& key, const Data& archive) const {
+  const auto found = written_.find(key);
+  if (found == written_.end() || found->second.archive != archive) return nullptr;
+  return found->second.record;
+}
+
+void LateChanges::keepWritten(const std::string& key, Record record, Data archive) {
+  written_.insert_or_assign(key, Written{std::move(record), std::move(archive)});
+}
+
+void LateChanges::archive(Change& change) {
+  if (change.record && !change.value) change.value = Value(archivedRecentInfo(*change.record));
+}
+
+}  // namespace spacekeep

@@ -102,6 +102,18 @@ TEST(QueryAnswers, AFailingServiceIsStillCountedFromAnotherQuerysMemory) {
   });
 }
 
+TEST(QueryAnswers, WithoutAStateToRememberThemInEveryQueryAsksAndSumsUpNothing) {
+  inEverySchedule(kSchedules, [] {
+    QueryWorld world;
+    world.world.disk().refuseToOpen(true);
+    const auto cache = world.world.declareService("cache", couldFree(5));
+    world.start();
+    EXPECT_EQ(world.query(), resultOf({}, 0));
+    EXPECT_EQ(world.query(), resultOf({}, 0));
+    EXPECT_EQ(cache->callCount("servicePurgeable"), 2U);
+  });
+}
+
 TEST(QueryAnswers, AnOptOutOfAnyValueIsNotedAndTheAmountCountedAllTheSame) {
   for (const Value& opt_out : {Value(true), Value(false), Value(0), Value("please")}) {
     inEverySchedule(10, [&] {

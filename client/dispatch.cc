@@ -62,6 +62,7 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
   struct Waiting {
     TaskGroup group;
     OutcomeSlot slot;
+    std::optional<Dictionary> own_outcome;  // written by the task, read after it has ended
   };
   const auto waiting = std::make_shared<Waiting>();
   const Value* asked_token = info.dictionary() ? info.dictionary()->find(keys::kToken) : nullptr;
@@ -76,10 +77,13 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
           if (purge_operations_) purge_operations_->set(token, operation);
         });
         if (operation) {
-          operation->startOperation([waiting, callback](const Dictionary& outcome) {
-            if (callback) callback(outcome);
-            waiting->slot.set(outcome);
-          });
+          operation->startOperation(
+              [waiting, callback, queue = purge_queue_](const Dictionary& outcome) {
+                if (callback) callback(outcome);
+                waiting->slot.set(outcome);
+                // Services answer on other threads, and some after the purge's own outcome.
+                if (queue->isCurrent()) waiting->own_outcome = outcome;
+              });
         }
         collection_queue_->sync([&] {
           if (purge_operations_) purge_operations_->remove(token);
@@ -88,9 +92,8 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
         waiting->group.leave();
       });
   waiting->group.wait();
-  auto answer = waiting->slot.get();
-  if (operation && answer) rememberPurge(*operation, *answer);
-  return answer;
+  if (operation && waiting->own_outcome) rememberPurge(*operation, *waiting->own_outcome);
+  return waiting->slot.get();
 }
 
 void Spacekeep::cancelPurgeWithToken(const Value* token) {

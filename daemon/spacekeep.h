@@ -168,7 +168,8 @@ class Spacekeep : public SpacekeepClientProtocol,
   void deliverNotification(const ServiceMap& recipients, const std::string& name,
                            const ipc::OptionalValue& value) const;
   void cancelPurgeWithToken(const Value* token);
-  /// Puts a purge that has ended down for the history. On the thread that serves the request.
+  /// Puts a purge that has ended down for the history, with the outcome that it came to itself. On
+  /// the thread that serves the request.
   void rememberPurge(const SpacekeepPurgeOperation& operation, const Dictionary& outcome) const;
   /// To be called, while the operation is there, with its outcome.
   [[nodiscard]] OperationCompletion rememberingDailyPass(

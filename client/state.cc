@@ -107,8 +107,9 @@ std::optional<Value> Spacekeep::builtIn(const std::string& key) const {
   return value == nullptr ? std::nullopt : std::optional(*value);
 }
 
+// Who is told gets the value that holds from now on, also when the stored one was taken away.
 void Spacekeep::actOnChange(const std::string& key, const ipc::OptionalValue& value) {
-  if (key == keys::kCacheEnabled) notifyRecipients(key, value);
+  if (key == keys::kCacheEnabled) notifyRecipients(key, value ? value : builtIn(key));
   if (!isSettingKey(key)) return;
   Dictionary state = storedState();
   late_changes_.layOver(state);

@@ -177,8 +177,7 @@ void checkNotifications(const SystemStory& story, const Life& life, Findings& fi
     if (asked == nullptr || asked->member != "serviceNotify") continue;
     ++received[asked->service];
     const bool is_due = std::any_of(sets.begin(), sets.end(), [&](const Call* set) {
-      Dictionary notification;
-      if (set->value) notification.set(kCacheEnabled, *set->value);
+      const Dictionary notification{{kCacheEnabled, *withDefault(kCacheEnabled, set->value)}};
       return set->asked_at < at && asked->info == notification;
     });
     if (!is_due || !registry.mayWant(asked->service, kCacheEnabled, at)) {

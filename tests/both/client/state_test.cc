@@ -134,6 +134,29 @@ TEST(ClientState, SettingWhetherToCacheTellsTheServicesThatWantToKnow) {
   });
 }
 
+TEST(ClientState, TakingAwayWhetherToCacheTellsThemTheBuiltInValue) {
+  for (const bool by_the_daemon : {false, true}) {
+    inEverySchedule(kSchedules, [by_the_daemon] {
+      StateWorld world;
+      const auto wants = world.world.declareService(
+          "wants", {}, {{"SPACEKEEP_NOTIFICATIONS", Array{"SPACEKEEP_CACHE_ENABLED"}}});
+      world.putOnDisk(Dictionary{{"SPACEKEEP_CACHE_ENABLED", false}});
+      world.start();
+      if (by_the_daemon) {
+        world.setSync({}, "SPACEKEEP_CACHE_ENABLED");
+      } else {
+        EXPECT_TRUE(world.set("SPACEKEEP_CACHE_ENABLED", std::nullopt));
+      }
+      EXPECT_TRUE(world.eventually([&] { return wants->callCount("serviceNotify") == 1; }));
+      EXPECT_EQ(wants->callsOf("serviceNotify").front().info,
+                (Dictionary{{"SPACEKEEP_CACHE_ENABLED", true}}));
+      EXPECT_EQ(
+          world.world.trace().linesWithFormat("%s name: %@, value: %@"),
+          std::vector<std::string>{"notifyRecipients name: SPACEKEEP_CACHE_ENABLED, value: true"});
+    });
+  }
+}
+
 TEST(ClientState, SettingAnyOtherKeyTellsNobody) {
   inEverySchedule(kSchedules, [] {
     StateWorld world;

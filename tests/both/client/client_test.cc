@@ -76,26 +76,29 @@ TEST(ClientPurge, OfAnAmountThatIsNoNumberIsAnsweredWithTheError) {
   });
 }
 
-TEST(ClientPurge, RepliesOnAnotherThreadThanTheServingOne) {
-  inEverySchedule(kSchedules, [] {
-    DaemonWorld world;
-    world.start();
-    struct Seen {
-      std::atomic<bool> inside = true;
-      std::atomic<bool> replied = false;
-    };
-    const auto seen = std::make_shared<Seen>();
-    // The mark is in the serving thread's own storage: the reply must not see it.
-    const auto peer = world.world.client("nobody");
-    const ipc::ServingScope scope(peer.get());
-    world.daemon->clientPurge({}, [seen](ipc::OptionalDictionary answer) {
-      EXPECT_EQ(answer, std::nullopt);
-      seen->inside = ipc::currentConnection() != nullptr;
-      seen->replied = true;
+TEST(ClientPurge, RepliesOnAnotherThreadThanTheServingOneAlsoToWhoMayPurge) {
+  for (const bool may_purge : {false, true}) {
+    inEverySchedule(kSchedules, [may_purge] {
+      DaemonWorld world;
+      world.start();
+      struct Seen {
+        std::atomic<bool> inside = true;
+        std::atomic<bool> replied = false;
+      };
+      const auto seen = std::make_shared<Seen>();
+      // The mark is in the serving thread's own storage: the reply must not see it.
+      const auto peer = may_purge ? purger(world) : world.world.client("nobody");
+      const ipc::ServingScope scope(peer.get());
+      world.daemon->clientPurge(purgeRequest(0),
+                                [seen, may_purge](const ipc::OptionalDictionary& answer) {
+                                  EXPECT_EQ(answer.has_value(), may_purge);
+                                  seen->inside = ipc::currentConnection() != nullptr;
+                                  seen->replied = true;
+                                });
+      EXPECT_TRUE(world.eventually([&] { return seen->replied.load(); }));
+      EXPECT_FALSE(seen->inside);
     });
-    EXPECT_TRUE(world.eventually([&] { return seen->replied.load(); }));
-    EXPECT_FALSE(seen->inside);
-  });
+  }
 }
 
 TEST(ClientCancelPurge, IsAnsweredWithoutAnyEntitlement) {
@@ -107,6 +110,23 @@ TEST(ClientCancelPurge, IsAnsweredWithoutAnyEntitlement) {
     call->wait();
     EXPECT_EQ(call->state(), CallState::kAnswered);
     EXPECT_TRUE(call->answer().empty());
+  });
+}
+
+TEST(ClientCancelPurge, RepliesOnTheServingThreadBeforeItReturns) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    world.start();
+    const auto peer = world.world.client("nobody");
+    const ipc::ServingScope scope(peer.get());
+    const ipc::PeerConnection* replied_on = nullptr;
+    unsigned replies = 0;
+    world.daemon->clientCancelPurge({{keys::kToken, "mine"}}, [&] {
+      replied_on = ipc::currentConnection();
+      ++replies;
+    });
+    EXPECT_EQ(replies, 1U);
+    EXPECT_EQ(replied_on, peer.get());
   });
 }
 

@@ -47,6 +47,24 @@ TEST(PurgeDispatch, TheCallbackSeesEveryOutcomeAndTheLastOneIsTheAnswer) {
   });
 }
 
+TEST(PurgeDispatch, WhatIsReportedAfterTheEndReachesTheCallbackAndIsNotTheAnswer) {
+  inEverySchedule(kSchedules, [] {
+    DaemonWorld world;
+    sim::ServiceBehaviour late = sim::ownsBytes("/", 15);
+    late.purge = {sim::CallBehaviour{.delay_ns = 5'000'000'000}};
+    world.world.declareService("late", late);
+    world.start();
+    const auto seen = std::make_shared<Outcomes>();
+    const Dictionary request{{keys::kVolume, "/"}, {keys::kAmount, 1000}, {keys::kUrgency, 1}};
+    const auto answer = world.daemon->purge(request, collecting(seen));
+    ASSERT_TRUE(answer.has_value());
+    EXPECT_EQ(unsignedAt(*answer, keys::kAmount), 0U);
+    EXPECT_TRUE(world.eventually([&] { return seen->get().size() == 2; }));
+    EXPECT_EQ(seen->get().front(), *answer);
+    EXPECT_EQ(unsignedAt(seen->get().back(), keys::kAmount), 15U);
+  });
+}
+
 TEST(PurgeDispatch, WithoutATokenRunsUnderAFreshOneThatNobodyLearns) {
   inEverySchedule(kSchedules, [] {
     DaemonWorld world;

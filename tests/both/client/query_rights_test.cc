@@ -78,21 +78,32 @@ TEST(ClientQueryRights, ARequestThatTheOperationRefusesIsAnsweredWithNothing) {
   }
 }
 
-TEST(ClientQueryRights, TheReplyRunsOnAnotherThreadThanTheServingOne) {
-  inEverySchedule(kSchedules, [] {
-    StateWorld world;
-    world.start();
-    const auto is_serving = std::make_shared<rt::Guarded<std::optional<bool>>>();
-    const auto peer = world.world.client("nobody");
-    const ipc::ServingScope scope(peer.get());
-    // The mark is in the serving thread's own storage: the reply must not see it.
-    world.daemon->clientPurgeableSpace(kRoot, [is_serving](const ipc::OptionalDictionary& answer) {
-      EXPECT_EQ(answer, std::nullopt);
-      is_serving->set(ipc::currentConnection() != nullptr);
+TEST(ClientQueryRights, TheReplyRunsOnAnotherThreadThanTheServingOneWithTheRightAndWithout) {
+  using Entry = void (Spacekeep::*)(Dictionary, Spacekeep::DictionaryReply);
+  struct Case {
+    Entry entry;
+    const char* held;
+    bool is_entitled;
+  };
+  for (const Case& at :
+       {Case{&Spacekeep::clientPurgeableSpace, "nothing", false},
+        Case{&Spacekeep::clientPurgeableSpace, "PURGEABLE_ENTITLEMENT", true},
+        Case{&Spacekeep::clientItemizedPurgeableSpace, "ITEMIZED_PURGEABLE_ENTITLEMENT", true}}) {
+    inEverySchedule(kSchedules, [&] {
+      StateWorld world;
+      world.start();
+      const auto is_serving = std::make_shared<rt::Guarded<std::optional<bool>>>();
+      const auto peer = world.world.client("asker", {at.held});
+      const ipc::ServingScope scope(peer.get());
+      // The mark is in the serving thread's own storage: the reply must not see it.
+      (*world.daemon.*at.entry)(kRoot, [&at, is_serving](const ipc::OptionalDictionary& answer) {
+        EXPECT_EQ(answer.has_value(), at.is_entitled);
+        is_serving->set(ipc::currentConnection() != nullptr);
+      });
+      EXPECT_TRUE(world.eventually([&] { return is_serving->get().has_value(); }));
+      EXPECT_EQ(is_serving->get(), false);
     });
-    EXPECT_TRUE(world.eventually([&] { return is_serving->get().has_value(); }));
-    EXPECT_EQ(is_serving->get(), false);
-  });
+  }
 }
 
 }  // namespace

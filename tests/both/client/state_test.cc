@@ -157,6 +157,23 @@ TEST(ClientState, TakingAwayWhetherToCacheTellsThemTheBuiltInValue) {
   }
 }
 
+TEST(ClientState, TheServicesAreToldOfASettingBeforeItIsAnswered) {
+  inEverySchedule(kSchedules, [] {
+    StateWorld world;
+    world.start();
+    const auto told = std::make_shared<rt::Guarded<std::optional<bool>>>();
+    world.daemon->clientSetState(
+        Value(false), "SPACEKEEP_CACHE_ENABLED",
+        [&world, told] {
+          told->set(world.world.trace().hasLine(
+              "notifyRecipients name: SPACEKEEP_CACHE_ENABLED, value: false"));
+        },
+        [](const std::string& why) { ADD_FAILURE() << why; });
+    EXPECT_TRUE(world.eventually([&] { return told->get().has_value(); }));
+    EXPECT_EQ(told->get(), true);
+  });
+}
+
 TEST(ClientState, SettingAnyOtherKeyTellsNobody) {
   inEverySchedule(kSchedules, [] {
     StateWorld world;

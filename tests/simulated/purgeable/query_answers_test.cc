@@ -92,13 +92,40 @@ TEST(QueryAnswers, AServiceWhoseConnectionFailsIsNotCountedAndTheResultHoldsNoEr
   }
 }
 
-TEST(QueryAnswers, AFailingServiceIsStillCountedFromAnotherQuerysMemory) {
+/// A query that runs while the daemon comes to remember `record`, 20 ms after it has begun.
+Dictionary queryWhileRemembering(QueryWorld& world, const SpacekeepRecentInfo& record) {
+  Dictionary result;
+  rt::Thread asking("asking", [&] { result = world.query(); });
+  rt::sleepNs(20 * kMs);
+  world.remember(record);
+  asking.join();
+  return result;
+}
+
+TEST(QueryAnswers, AServiceThatFailsWhileItIsAskedIsCountedFromWhatCameToBeRemembered) {
   inEverySchedule(kSchedules, [] {
     QueryWorld world;
-    world.world.declareService("broken", answersQueries(sim::Answer::kFailsBeforeCall));
+    const auto broken = world.world.declareService(
+        "broken", answersQueries(sim::Answer::kFailsDuringCall, 7, 50 * kMs));
     world.start();
-    world.remember(recordOf("/", "broken", 9));
-    EXPECT_EQ(world.query(), resultOf({{"broken", 9}}, 9));
+    EXPECT_EQ(queryWhileRemembering(world, recordOf("/", "broken", 9)),
+              resultOf({{"broken", 9}}, 9));
+    EXPECT_EQ(broken->callCount("servicePurgeable"), 1U);
+    EXPECT_EQ(world.filled("%s connection invalidated: %@"),
+              std::vector<std::string>{"startOperation connection invalidated: broken"});
+    EXPECT_TRUE(world.world.trace().hasLine("startOperation Still in flight: []"));
+  });
+}
+
+TEST(QueryAnswers, AServiceThatStaysSilentIsCountedFromWhatCameToBeRemembered) {
+  inEverySchedule(kSchedules, [] {
+    QueryWorld world;
+    const auto silent = world.world.declareService("silent", answersQueries(sim::Answer::kNever));
+    world.start();
+    EXPECT_EQ(queryWhileRemembering(world, recordOf("/", "silent", 9)),
+              resultOf({{"silent", 9}}, 9));
+    EXPECT_EQ(silent->callCount("servicePurgeable"), 1U);
+    EXPECT_TRUE(world.world.trace().hasLine("startOperation Still in flight: [\"silent\"]"));
   });
 }
 

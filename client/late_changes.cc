@@ -15,10 +15,7 @@ void LateChanges::set(const std::string& key, StateObject object) {
   changes_.insert_or_assign(key, std::move(change));
 }
 
-void LateChanges::forget(const std::string& key) {
-  changes_.erase(key);
-  written_.erase(key);
-}
+void LateChanges::forget(const std::string& key) { changes_.erase(key); }
 
 void LateChanges::wereWritten() {
   for (auto& [key, change] : changes_) {

@@ -25,6 +25,7 @@ constexpr std::array kFormats = {
     Format{"%s plistDir: %@", kTrace},
     Format{"%s scanning %@", kTrace},
     Format{"%s looking at: %@", kTrace},
+    Format{"%s the ID in %@ is no string: %@", kProblem},
     Format{"%s marking %@ as DO_NOT_QUERY", kTrace},
     Format{"%s %@ desiredNotifications: %@", kTrace},
     Format{"%s property list parse failed: %@", kProblem},

@@ -123,7 +123,7 @@ void BusCallers::tellLeftOut(const LeftOut& message) {
 
 void BusCallers::refuse(sd_bus_message* call, const char* error_name, const std::string& text) {
   const char* member = sd_bus_message_get_member(call);
-  context_->refusals.writeCall("a caller of the bus", member == nullptr ? "" : member, text);
+  context_->refused_calls.write("a caller of the bus", text, member == nullptr ? "" : member);
   if (sd_bus_message_get_expect_reply(call) <= 0) return;
   const OwnedMessage answer = errorAnswer(call, error_name, text);
   if (answer != nullptr) link_.send(answer.get(), errorAnswerBytes(text), kUnknownUser);

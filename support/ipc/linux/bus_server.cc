@@ -130,6 +130,7 @@ void BusServer::State::close() {
   context->turns.clear();
   context->pace.close();
   context->refusals.close();
+  context->refused_calls.close();
   open = 0;
 }
 

@@ -179,7 +179,7 @@ void CallServer::answer(std::uint64_t serial, const MethodDescription& method,
     std::string problem = sizeProblem(writer.bytes());
     if (problem.empty()) problem = answerProblem(writer.bytes());
     if (problem.empty()) return send(message.get(), writer.bytes());
-    context_->refusals.writeCall(identity().describe(), method.name, problem);
+    context_->refused_calls.write(identity().describe(), problem, method.name);
     return sendError(call.get(), kErrorLimitsExceeded, problem);
   }
   logProblem("%s The answer to %@ does not fit into a message", "answer", method.name);
@@ -217,8 +217,8 @@ void CallServer::sendText(sd_bus_message* call, const std::string& text) {
 }
 
 void CallServer::refuse(sd_bus_message* call, const char* error_name, const std::string& text) {
-  context_->refusals.writeCall(identity().describe(), textOrEmpty(sd_bus_message_get_member(call)),
-                               text);
+  context_->refused_calls.write(identity().describe(), text,
+                                textOrEmpty(sd_bus_message_get_member(call)));
   if (sd_bus_message_get_expect_reply(call) > 0) sendError(call, error_name, text);
 }
 

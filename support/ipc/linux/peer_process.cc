@@ -1,5 +1,6 @@
 #include "support/ipc/linux/peer_process.h"
 
+#include <fcntl.h>
 #include <poll.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
@@ -9,9 +10,8 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
-#include <fstream>
-#include <iterator>
 #include <memory>
 #include <optional>
 #include <sstream>
@@ -55,8 +55,12 @@ pid_t peerPid(int socket) {
 /// cannot be read. The kernel sets PF_EXITING before it closes the descriptors of a process.
 std::optional<bool> isExiting(pid_t pid) {
   constexpr unsigned long kExiting = 0x4;  // PF_EXITING of the kernel's sched.h
-  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
-  std::string text((std::istreambuf_iterator<char>(file)), {});
+  const Descriptor file(
+      ::open(("/proc/" + std::to_string(pid) + "/stat").c_str(), O_RDONLY | O_CLOEXEC));
+  std::array<char, 1024> bytes{};  // the flags come within the first hundred or so
+  const ssize_t size = file.fd() < 0 ? -1 : ::read(file.fd(), bytes.data(), bytes.size());
+  if (size <= 0) return std::nullopt;
+  const std::string text(bytes.data(), static_cast<std::size_t>(size));
   // The name of the program stands in parentheses and may hold anything, these included.
   const std::size_t name_end = text.rfind(')');
   if (name_end == std::string::npos) return std::nullopt;

@@ -16,12 +16,13 @@ constexpr const char* kOperation = "SpacekeepListener";
 
 }  // namespace
 
-void RefusalLog::write(std::string_view who, std::string_view why) {
-  if (mayWrite()) logProblem("%s Connection of %@ refused or ended: %@", kOperation, who, why);
-}
-
-void RefusalLog::writeCall(std::string_view who, std::string_view member, std::string_view why) {
-  if (mayWrite()) logProblem("%s %@ of %@ refused: %@", kOperation, member, who, why);
+void RefusalLog::write(std::string_view who, std::string_view why, std::string_view what) {
+  if (!mayWrite()) return;
+  if (kind_ == Of::kCalls) {
+    logProblem("%s %@ of %@ refused: %@", kOperation, what, who, why);
+  } else {
+    logProblem("%s Connection of %@ refused or ended: %@", kOperation, who, why);
+  }
 }
 
 bool RefusalLog::mayWrite() {
@@ -55,8 +56,12 @@ void RefusalLog::close() {
 void RefusalLog::endWindow() {
   window_end_ = sd_event_source_disable_unref(window_end_);
   const std::uint64_t left_out = std::exchange(left_out_, 0);
-  if (left_out > 0)
-    logProblem("%s %llu more calls or connections were refused", kOperation, left_out);
+  if (left_out == 0) return;
+  if (kind_ == Of::kCalls) {
+    logProblem("%s %llu more calls were refused", kOperation, left_out);
+  } else {
+    logProblem("%s %llu more connections were refused or ended", kOperation, left_out);
+  }
 }
 
 }  // namespace spacekeep::ipc

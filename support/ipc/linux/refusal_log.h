@@ -1,8 +1,8 @@
 // Thread safety: confined to the IPC thread.
 //
-// Log lines about calls that were refused and connections that were refused or cut off. Whoever can
-// cause them can cause any number of them, so only so many go out in a while; how many were left out
-// is told when that time is over.
+// Log lines about connections that were refused or cut off, and about calls that were refused. Whoever
+// can cause them can cause any number of them, so only so many of each kind go out in a while; how many
+// were left out is told when that time is over.
 #pragma once
 
 #include <cstdint>
@@ -18,13 +18,15 @@ class RefusalLog {
   static constexpr unsigned kLinesPerWindow = 20;
   static constexpr std::uint64_t kWindowNs = 10'000'000'000;
 
-  explicit RefusalLog(IpcLoop& loop, std::uint64_t window_ns = kWindowNs)
-      : loop_(loop), window_ns_(window_ns) {}
+  enum class Of { kConnections, kCalls };
+
+  RefusalLog(IpcLoop& loop, Of kind, std::uint64_t window_ns = kWindowNs)
+      : loop_(loop), kind_(kind), window_ns_(window_ns) {}
   RefusalLog(const RefusalLog&) = delete;
   RefusalLog& operator=(const RefusalLog&) = delete;
 
-  void write(std::string_view who, std::string_view why);
-  void writeCall(std::string_view who, std::string_view member, std::string_view why);
+  /// `what`: the method of a refused call, nothing of a connection.
+  void write(std::string_view who, std::string_view why, std::string_view what = {});
   /// Tells what was left out so far. What comes later is written at once.
   void close();
 
@@ -34,6 +36,7 @@ class RefusalLog {
   void endWindow();
 
   IpcLoop& loop_;
+  const Of kind_;
   const std::uint64_t window_ns_;
   sd_event_source* window_end_ = nullptr;  // while a window is open
   unsigned written_ = 0;                   // in it

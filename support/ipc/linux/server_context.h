@@ -32,7 +32,8 @@ struct ServerContext {
         lane_budget(std::make_shared<LaneBudget>(options.limits.lanes)),
         turns(options.limits.turns),
         pace(loop, options.limits.shares),
-        refusals(loop) {
+        refusals(loop, RefusalLog::Of::kConnections),
+        refused_calls(loop, RefusalLog::Of::kCalls) {
     endpoint_rules.refuse_own_process = options.refuse_own_process;
   }
 
@@ -55,6 +56,7 @@ struct ServerContext {
   UserPace pace;                 ///< IPC thread
   EndpointRules endpoint_rules;  ///< IPC thread
   RefusalLog refusals;           ///< IPC thread
+  RefusalLog refused_calls;      ///< IPC thread
 };
 
 /// The peer of an accepted connection, as handlers see it.

@@ -15,7 +15,7 @@ class Refusals : public ::testing::Test {
   /// That many refusals of a call within one window.
   void refuse(RefusalLog& refusals, unsigned count) {
     loop.runAndWait([&] {
-      for (unsigned i = 0; i < count; ++i) refusals.writeCall("uid 7", "clientPurge", "no room");
+      for (unsigned i = 0; i < count; ++i) refusals.write("uid 7", "no room", "clientPurge");
     });
   }
   void close(RefusalLog& refusals) {
@@ -27,24 +27,29 @@ class Refusals : public ::testing::Test {
 };
 
 TEST_F(Refusals, OfCallsAndConnectionsAreToldWithWhoAndWhy) {
-  RefusalLog refusals(loop, kHourNs);
+  RefusalLog connections(loop, RefusalLog::Of::kConnections, kHourNs);
+  RefusalLog calls(loop, RefusalLog::Of::kCalls, kHourNs);
   loop.runAndWait([&] {
-    refusals.write("uid 7", "too many");
-    refusals.writeCall("uid 8", "clientPurge", "no room");
+    for (int i = 0; i < 21; ++i) connections.write("uid 7", "too many");
+    calls.write("uid 8", "no room", "clientPurge");
+    connections.close();
+    calls.close();
   });
+  EXPECT_EQ(log.countExact(kLogProblem,
+                           "SpacekeepListener Connection of uid 7 refused or ended: too many"),
+            20U);
+  EXPECT_EQ(log.countExact(kLogProblem, "SpacekeepListener clientPurge of uid 8 refused: no room"),
+            1U);
   EXPECT_EQ(
-      log.texts(kLogProblem),
-      (std::vector<std::string>{"SpacekeepListener Connection of uid 7 refused or ended: too many",
-                                "SpacekeepListener clientPurge of uid 8 refused: no room"}));
-  close(refusals);
+      log.countExact(kLogProblem, "SpacekeepListener 1 more connections were refused or ended"),
+      1U);
 }
 
 TEST_F(Refusals, BeyondTwentyInAWindowAreCountedAndToldAtItsEndThoughNoneFollows) {
-  RefusalLog refusals(loop, 50'000'000);
+  RefusalLog refusals(loop, RefusalLog::Of::kCalls, 50'000'000);
   refuse(refusals, 25);
-  EXPECT_TRUE(eventually([&] {
-    return log.contains(kLogProblem, "SpacekeepListener 5 more calls or connections were refused");
-  }));
+  EXPECT_TRUE(eventually(
+      [&] { return log.contains(kLogProblem, "SpacekeepListener 5 more calls were refused"); }));
   EXPECT_EQ(log.count(kLogProblem, "clientPurge of uid 7"), 20U);
   refuse(refusals, 1);
   EXPECT_EQ(log.count(kLogProblem, "clientPurge of uid 7"), 21U);
@@ -52,18 +57,18 @@ TEST_F(Refusals, BeyondTwentyInAWindowAreCountedAndToldAtItsEndThoughNoneFollows
 }
 
 TEST_F(Refusals, ExactlyTwentyAreToldWithoutACount) {
-  RefusalLog refusals(loop, kHourNs);
+  RefusalLog refusals(loop, RefusalLog::Of::kCalls, kHourNs);
   refuse(refusals, 20);
   close(refusals);
   EXPECT_EQ(log.count(kLogProblem, "clientPurge of uid 7"), 20U);
-  EXPECT_EQ(log.count(kLogProblem, "more calls or connections"), 0U);
+  EXPECT_EQ(log.count(kLogProblem, "more calls were"), 0U);
 }
 
 TEST_F(Refusals, LeftOutWhenTheServerClosesAreToldThen) {
-  RefusalLog refusals(loop, kHourNs);
+  RefusalLog refusals(loop, RefusalLog::Of::kCalls, kHourNs);
   refuse(refusals, 21);
   close(refusals);
-  EXPECT_EQ(log.count(kLogProblem, "1 more calls or connections were refused"), 1U);
+  EXPECT_EQ(log.count(kLogProblem, "1 more calls were refused"), 1U);
 }
 
 }  // namespace

@@ -3,6 +3,7 @@
 
 #include "tests/both/purge/purge_world.h"
 #include "tests/helpers/schedules.h"
+#include "tests/simulated/purge/acting_statistics.h"
 
 namespace spacekeep::test {
 namespace {
@@ -113,6 +114,24 @@ TEST(FinishEarly, SpaceThatComesFromElsewhereBeforeTheNextUrgencyEndsIt) {
     PurgeWorld world;
     world.world.volumes().giveBack("/", 500, 1 * kSecond);
     EXPECT_EQ(durationOf(world, {{keys::kAmount, 500}, {keys::kFinishEarly, true}}), 2 * kSecond);
+  });
+}
+
+// Nobody is asked for what is there already, so nobody ends the wait.
+TEST(FinishEarly, SpaceThatComesWhileAnUrgencyBeginsEndsItAtOnce) {
+  inEverySchedule(kSchedules, [] {
+    PurgeWorld world;
+    ActingStatistics statistics(world.platform.statistics, "SpacekeepPurgeAmountRequested",
+                                [&] { world.world.volumes().giveBack("/", 500, 0); });
+    Platform platform = withStatistics(world.platform, statistics);
+    const auto operation = makeOperation<OpenPurgeOperation>(
+        platform,
+        Dictionary{{keys::kVolume, "/"}, {keys::kAmount, 500}, {keys::kFinishEarly, true}},
+        world.services);
+    const std::uint64_t began = world.world.nowNs();
+    static_cast<void>(world.run(*operation));
+    EXPECT_EQ(world.world.nowNs() - began, 0U);
+    world.world.shutDown();
   });
 }
 

@@ -1,51 +1,12 @@
 // A service that answers while the outcome is being filled in.
 #include <gtest/gtest.h>
 
-#include <functional>
-#include <optional>
-#include <string_view>
-#include <utility>
-
 #include "tests/both/purge/purge_world.h"
 #include "tests/helpers/schedules.h"
+#include "tests/simulated/purge/acting_statistics.h"
 
 namespace spacekeep::test {
 namespace {
-
-/// Does something of the test's when the purge counts its freed bytes, before they are recorded.
-class StatisticsThatActAtTheTotal final : public Statistics {
- public:
-  StatisticsThatActAtTheTotal(Statistics& recording, std::function<void()> act)
-      : recording_(recording), act_(std::move(act)) {}
-
-  void addDistributionStat(double value, std::string_view domain, std::string_view key) override {
-    recording_.addDistributionStat(value, domain, key);
-  }
-  void addReportStat(std::string_view domain, std::optional<std::string_view> key,
-                     std::int64_t count) override {
-    if (key == "total.purged") act_();
-    recording_.addReportStat(domain, key, count);
-  }
-
- private:
-  Statistics& recording_;
-  const std::function<void()> act_;
-};
-
-/// The world's platform with other statistics.
-Platform withStatistics(const Platform& platform, Statistics& statistics) {
-  return {.global = platform.global,
-          .volumes = platform.volumes,
-          .access = platform.access,
-          .statistics = statistics,
-          .files = platform.files,
-          .connector = platform.connector,
-          .services = platform.services,
-          .openPreferencesSuite = platform.openPreferencesSuite,
-          .makeListener = platform.makeListener,
-          .after = platform.after,
-          .createSpacekeepToken = platform.createSpacekeepToken};
-}
 
 TEST(PurgeLateReport, AnAnswerWhileTheTotalIsCountedIsStillInTheReportedSum) {
   inEverySchedule(kSchedules, [] {
@@ -54,7 +15,8 @@ TEST(PurgeLateReport, AnAnswerWhileTheTotalIsCountedIsStillInTheReportedSum) {
     held.purge = {sim::CallBehaviour{.answer = sim::Answer::kNever}};
     const auto late = world.add("late", held);
     bool answered = false;
-    StatisticsThatActAtTheTotal statistics(world.platform.statistics, [&] {
+    // The freed bytes are counted before they are recorded.
+    ActingStatistics statistics(world.platform.statistics, "total.purged", [&] {
       late->answerHeldCalls();
       answered = world.eventually([&] { return world.answers().size() == 1; });
     });

@@ -177,8 +177,9 @@ TEST(WireSignature, CompleteTypesAreValid) {
 }
 
 TEST(WireSignature, AnythingElseIsNot) {
-  for (const std::string_view broken : {"a"sv, "()"sv, "("sv, ")"sv, "(s"sv, "{sv}"sv, "a{vs}"sv,
-                                        "a{s}"sv, "a{sss}"sv, "z"sv, "a{sv"sv, "r"sv, "e"sv}) {
+  for (const std::string_view broken :
+       {"a"sv, "()"sv, "("sv, ")"sv, "(s"sv, "{sv}"sv, "a{vs}"sv, "a{s}"sv, "a{sss}"sv, "a{sss"sv,
+        "z"sv, "a{sv"sv, "r"sv, "e"sv}) {
     EXPECT_FALSE(isWireSignature(broken)) << broken;
   }
   EXPECT_FALSE(isWireSignature(std::string(33, 'a') + "s"));

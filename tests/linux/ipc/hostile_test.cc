@@ -108,6 +108,19 @@ TEST(HostilePeer, BytesThatAreNoMessageAreCutOff) {
   expectHonestClientIsServed(server);
 }
 
+TEST(HostilePeer, AMessageOfATypeThatDBusDoesNotHaveIsCutOff) {
+  spacekeep::test::LogCapture log;
+  TestServer server;
+  RawPeer peer(server.path());
+  peer.authenticate();
+  std::string bytes = header(0, 0);
+  bytes[1] = 5;
+  peer.send(bytes);
+  EXPECT_TRUE(peer.isCutOff());
+  EXPECT_EQ(log.count(kLogProblem, "it sent something that is no D-Bus message"), 1U);
+  expectHonestClientIsServed(server);
+}
+
 TEST(HostilePeer, ABrokenMessageBeforeALargeOneDoesNotHideIt) {
   spacekeep::test::LogCapture log;
   TestServer server;

@@ -53,8 +53,9 @@ bool AskingDaemon::isEntitled(std::string_view entitlement) {
 
 void AskingDaemon::clientCheckin(std::string service_id, ipc::SharedDescriptor endpoint,
                                  Dictionary info, CheckinReply reply) {
-  require(endpoint != nullptr && ::fcntl(endpoint->fd(), F_GETFD) >= 0,
-          "a service that checks in brings an open descriptor");
+  require(endpoint != nullptr, "a service that checks in brings an endpoint");
+  require((::fcntl(endpoint->fd(), F_GETFD) >= 0) == endpoint->problem().empty(),
+          "an endpoint is an open descriptor, or it has a problem");
   look(info);
   if (!isEntitled(kService)) return;
   Dictionary result{{"SPACEKEEP_ID", std::move(service_id)}, {"ANON", true}};

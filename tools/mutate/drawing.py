@@ -54,6 +54,12 @@ def draw(tree, folders, seed):
     return (mutant for _, mutant in sorted(drawn))
 
 
+def every_change(tree, file):
+    """All mutants of one file, not only the drawn one of each place."""
+    source = pathlib.Path(tree, file).read_text(encoding='utf-8')
+    return [_mutant(file, source, place.kind, change) for place in places_of(source) for change in place.changes]
+
+
 def _mutant(file, source, kind, change):
     line_start = source.rfind('\n', 0, change.start) + 1
     line_end = source.find('\n', change.start)

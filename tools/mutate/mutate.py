@@ -8,6 +8,8 @@ Stands on a finished coverage run in BUILD: it tells which test programs reach t
 only these are asked. A line per mutant tells what was changed and which program noticed. The results
 are kept in WORKSHOP; a run that was stopped goes on. --quick leaves out the tests that take
 long, --again asks all of them about the survivors, --fresh takes a new copy of sources and build.
+A survivor that no test can tell goes into equivalents.txt with its reason, in the lines that the end of a
+run prints for it; it is then neither asked about nor counted.
 """
 import argparse
 import json
@@ -18,6 +20,7 @@ import time
 
 import building
 import drawing
+import equivalents
 import ledger
 import reaching
 import suite
@@ -130,7 +133,8 @@ def main():
         (arguments.workshop / 'filled').unlink(missing_ok=True)
     workshop.fill(arguments.workshop, arguments.source, arguments.build)
     workshop.mount(arguments.workshop, arguments.source, arguments.build, arguments.counts)
-    results = ledger.Ledger(arguments.workshop / f'results-{arguments.seed}.jsonl')
+    known = equivalents.read()
+    results = ledger.Ledger(arguments.workshop / f'results-{arguments.seed}.jsonl', known)
     trial = Trial(arguments, reaching.Reach(arguments.build, arguments.source))
     if arguments.again:
         for mutant in results.survivors():
@@ -139,7 +143,11 @@ def main():
         for mutant in drawing.draw(arguments.source, reaching.FOLDERS, arguments.seed):
             if results.tried() >= arguments.sample:
                 break
-            if results.verdict(mutant) is None:
+            if results.verdict(mutant) is not None:
+                continue
+            if equivalents.entry_of(mutant) in known:
+                results.add(mutant, ledger.EQUIVALENT, 'the list', 0)
+            else:
                 try_one(trial, results, mutant)
     return report(results)
 
@@ -170,8 +178,10 @@ def report(results):
     tried, caught = results.tried(), results.caught()
     for mutant in results.survivors():
         print(f'survived: {mutant}')
+        print(equivalents.text_of(mutant))
     percent = 100.0 * caught / tried if tried else 0.0
-    print(f'caught {caught} of {tried} ({percent:.1f} %, target {TARGET_PERCENT:.0f}), {results.out_of_time()} of them by a time limit')
+    print(f'caught {caught} of {tried} ({percent:.1f} %, target {TARGET_PERCENT:.0f}), {results.out_of_time()} of them by a time limit; '
+          f'{results.equivalent()} more that no test can tell (tools/mutate/equivalents.txt)')
     return 0 if percent >= TARGET_PERCENT else 1
 
 

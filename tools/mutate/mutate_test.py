@@ -8,6 +8,7 @@ import unittest
 sys.path.insert(0, str(pathlib.Path(__file__).resolve().parent))
 import building  # noqa: E402
 import drawing  # noqa: E402
+import equivalents  # noqa: E402
 import ledger  # noqa: E402
 import reaching  # noqa: E402
 import suite  # noqa: E402
@@ -121,6 +122,47 @@ class Results(unittest.TestCase):
             self.assertEqual(again.survivors(), [mutants[0]])
             again.add(mutants[0], ledger.CAUGHT, 'x', 1)
             self.assertEqual(ledger.Ledger(path).survivors(), [])
+
+
+    def test_what_no_test_can_tell_is_neither_caught_nor_survived_as_long_as_the_list_says_so(self):
+        with tempfile.TemporaryDirectory() as folder:
+            path = pathlib.Path(folder, 'results')
+            mutants = [drawing.Mutant('a.cc', 1, column, 'bit', '&', '|', '  a & b') for column in (5, 9)]
+            listed = {equivalents.entry_of(mutants[0])}
+            results = ledger.Ledger(path, listed)
+            for mutant in mutants:
+                results.add(mutant, ledger.SURVIVED, 'x', 1)
+            self.assertEqual((results.tried(), results.equivalent(), results.survivors()), (1, 1, [mutants[1]]))
+            self.assertIsNone(ledger.Ledger(path).verdict(mutants[0]))
+
+
+class Equivalents(unittest.TestCase):
+    MUTANT = drawing.Mutant('purge/a.cc', 7, 5, 'dropped call', 'b(c,\n  d)', '', '  a b(c,')
+
+    def read(self, text):
+        with tempfile.TemporaryDirectory() as folder:
+            path = pathlib.Path(folder, 'list')
+            path.write_text(text, encoding='utf-8')
+            return equivalents.read(path)
+
+    def test_the_lines_that_a_run_prints_can_be_put_into_the_list(self):
+        text = '# About the list.\n\n' + equivalents.text_of(self.MUTANT) + 'first\n  second\n'
+        self.assertEqual(self.read(text), {equivalents.entry_of(self.MUTANT): 'first second'})
+
+    def test_a_mutant_is_known_by_its_line_wherever_that_stands(self):
+        moved = self.MUTANT._replace(line=70, column=9, before='      a b(c,')
+        self.assertEqual(equivalents.entry_of(moved), equivalents.entry_of(self.MUTANT))
+        self.assertNotEqual(equivalents.entry_of(self.MUTANT._replace(column=6)), equivalents.entry_of(self.MUTANT))
+
+    def test_an_entry_without_a_reason_is_refused(self):
+        with self.assertRaisesRegex(ValueError, 'block 1'):
+            self.read(equivalents.text_of(self.MUTANT))
+
+    def test_each_entry_of_the_shipped_list_is_a_change_that_could_be_drawn(self):
+        tree = pathlib.Path(__file__).resolve().parent.parent.parent
+        possible = {equivalents.entry_of(mutant) for file in {entry.file for entry in equivalents.read()}
+                    for mutant in drawing.every_change(tree, file)}
+        self.assertEqual(set(equivalents.read()) - possible, set())
 
 
 class Asking(unittest.TestCase):

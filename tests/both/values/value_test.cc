@@ -63,6 +63,9 @@ TEST(ValueNumbers, TruthOfEachKind) {
 TEST(ValueEquality, NumbersCompareByValueAcrossTheirKinds) {
   EXPECT_EQ(Value(1), Value(1u));
   EXPECT_EQ(Value(1u), Value(1.0));
+  // Numbers that as a double would be others.
+  EXPECT_EQ(Value(INT64_MAX), Value(static_cast<std::uint64_t>(INT64_MAX)));
+  EXPECT_EQ(Value(static_cast<std::uint64_t>(INT64_MAX)), Value(INT64_MAX));
   EXPECT_EQ(Value(-1.0), Value(-1));
   EXPECT_EQ(Value(0), Value(-0.0));
   EXPECT_EQ(Value(INT64_MIN), Value(-kTwoTo63));

@@ -283,6 +283,15 @@ TEST_F(AfterALargeAnswer, ACallBeyondTheSizeLimitIsRefusedAndTheBusIsServedOn) {
   EXPECT_EQ(broker.numberFrom(":1.8"), "");
 }
 
+TEST_F(AfterALargeAnswer, TheRestOfACallBeyondTheSizeLimitIsAwaitedWithoutProcessorTime) {
+  // The socket holds less than that, and the rest is sent only when this broker goes on.
+  broker.sendFrom(":1.7", "takeDescriptor", [](sd_bus_message* call) {
+    EXPECT_GE(sd_bus_message_append(call, "s", std::string(8 * 1024 * 1024, 'x').c_str()), 0);
+  });
+  EXPECT_TRUE(eventually([this] { return wakeUpsInNs(server->loop, 300'000'000) <= 1; }));
+  EXPECT_EQ(broker.errorOfLastCall(), "org.freedesktop.DBus.Error.LimitsExceeded");
+}
+
 TEST_F(FakeBrokerTest, ANameAnswerThatNobodyKnowsIsAProblemAndTriedAgain) {
   const spacekeep::test::LogCapture log;
   broker.setNameAnswer(3);

@@ -1,7 +1,9 @@
 // State on volumes without a free block and without a free inode, on real file systems.
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <linux/fs.h>
 #include <sched.h>
+#include <sys/ioctl.h>
 #include <sys/mount.h>
 #include <sys/statvfs.h>
 #include <unistd.h>
@@ -232,6 +234,21 @@ INSTANTIATE_TEST_SUITE_P(
                       FileSystem{"btrfs", "mkfs.btrfs -q", "", 256, false},
                       FileSystem{"tmpfs", "", "size=64M,nr_inodes=24", 0, true}),
     [](const auto& parameter) { return std::string(parameter.param.name); });
+
+TEST(StateOnBtrfs, IsKeptInPlaceSoThatAChangeNeedsNoFreeBlock) {
+  const FullVolume volume(FileSystem{"btrfs", "mkfs.btrfs -q", "", 256, false});
+  LinuxPlatform platform(noMethods(), volume.paths());
+  const auto suite = platform.platform().openPreferencesSuite("com.quorvel.spacekeep");
+  ASSERT_NE(suite, nullptr);
+  const std::string directory = volume.paths().state_directory;
+  for (const std::string& path : {directory, directory + "/com.quorvel.spacekeep.sqlite"}) {
+    const FileDescriptor opened(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    ASSERT_TRUE(opened.valid()) << path;
+    int flags = 0;
+    ASSERT_EQ(::ioctl(opened.get(), FS_IOC_GETFLAGS, &flags), 0) << path;
+    EXPECT_NE(flags & FS_NOCOW_FL, 0) << path;
+  }
+}
 
 }  // namespace
 }  // namespace spacekeep

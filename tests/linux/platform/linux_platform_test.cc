@@ -182,6 +182,12 @@ TEST_F(LinuxPlatformInADirectory, AReserveIsTakenOnlyWhereThereIsRoomEnough) {
   ASSERT_EQ(::umount2((root_ + "/small").c_str(), MNT_DETACH), 0);
 }
 
+TEST_F(LinuxPlatformInADirectory, AReserveIsNotTakenThroughALinkThatLeadsElsewhere) {
+  ASSERT_EQ(::symlink((root_ + "/elsewhere").c_str(), (root_ + "/reserve").c_str()), 0);
+  EXPECT_FALSE(ReserveFile(root_ + "/reserve", 128 * 1024).take());
+  EXPECT_FALSE(fs::exists(root_ + "/elsewhere"));
+}
+
 TEST(Token, IsThirtyTwoHexadecimalDigitsAndNeverTheSame) {
   std::set<std::string> tokens;
   for (int i = 0; i < 1000; ++i) {

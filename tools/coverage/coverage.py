@@ -38,7 +38,7 @@ def main():
 
 
 def _arguments():
-    parser = argparse.ArgumentParser(description='Line and branch coverage of the daemon's folders')
+    parser = argparse.ArgumentParser(description='Line and branch coverage of the folders of the daemon')
     parser.add_argument('--source', type=pathlib.Path, required=True)
     parser.add_argument('--build', type=pathlib.Path, required=True)
     parser.add_argument('--counts', type=pathlib.Path, required=True, help='the folder compiled into the programs')

@@ -1,7 +1,9 @@
 #include "sim/world/recording_statistics.h"
-#include "support/runtime/locks.h"
 
+#include <limits>
 #include <set>
+
+#include "support/runtime/locks.h"
 
 namespace spacekeep::sim {
 
@@ -27,7 +29,11 @@ void RecordingStatistics::addReportStat(std::string_view domain,
   const std::scoped_lock lock(mutex_);
   foreign_domain_ = foreign_domain_ || domain != kStatisticsDomain;
   Report& report = reports_[std::string(*key)];
-  report.sum += count;
+  // Services may claim any number; the counter of the daemon is a floating one, which only gets less exact.
+  if (__builtin_add_overflow(report.sum, count, &report.sum)) {
+    using Limits = std::numeric_limits<std::int64_t>;
+    report.sum = count < 0 ? Limits::min() : Limits::max();
+  }
   ++report.times;
 }
 

@@ -180,6 +180,17 @@ TEST(RecordingStatistics, KeepsObservationsAndSums) {
   EXPECT_EQ(trace.events().size(), 5U);
 }
 
+TEST(RecordingStatistics, SumsBeyondTheirRangeStayAtItsEnd) {
+  Trace trace;
+  RecordingStatistics statistics(trace);
+  for (int i = 0; i < 2; ++i) {
+    statistics.addReportStat(kStatisticsDomain, "most", INT64_MAX - 1);
+    statistics.addReportStat(kStatisticsDomain, "least", INT64_MIN + 1);
+  }
+  EXPECT_EQ(statistics.reported("most"), INT64_MAX);
+  EXPECT_EQ(statistics.reported("least"), INT64_MIN);
+}
+
 TEST(SimulatedEvents, RunTheirHandlersOnlyWhenSetOff) {
   inEverySchedule(kSchedules, [] {
     World world;

@@ -9,21 +9,19 @@
 #include <cstdint>
 #include <string>
 #include <string_view>
+#include <utility>
 
+#include "support/files/linux/descriptor.h"
 #include "support/ipc/linux/sockets.h"
 
 namespace spacekeep::ipc {
 
 namespace {
 
-/// Takes over both descriptors in every case: a bus that has them closes them.
-sd_bus* startServer(int input, int output, BusDescriptors descriptors) {
+/// Takes over both descriptors: the bus closes them, and without a bus nobody has them any more.
+sd_bus* startServer(FileDescriptor input, FileDescriptor output, BusDescriptors descriptors) {
   sd_bus* bus = nullptr;
-  if (sd_bus_new(&bus) < 0) {
-    ::close(input);
-    ::close(output);
-    return nullptr;
-  }
+  if (sd_bus_new(&bus) < 0) return nullptr;
   // Nobody ever sees it.
   constexpr sd_id128_t kId{
       {'S', 'p', 'a', 'c', 'e', 'k', 'e', 'e', 'p', ' ', 's', 'e', 'r', 'v', 'e', 'r'}};
@@ -31,14 +29,13 @@ sd_bus* startServer(int input, int output, BusDescriptors descriptors) {
   const bool prepared =
       sd_bus_set_bus_client(bus, 0) >= 0 && sd_bus_negotiate_fds(bus, takes_descriptors) >= 0 &&
       sd_bus_set_server(bus, 1, kId) >= 0 && sd_bus_set_method_call_timeout(bus, UINT64_MAX) >= 0 &&
-      sd_bus_set_exit_on_disconnect(bus, 0) >= 0 && sd_bus_set_fd(bus, input, output) >= 0;
-  if (!prepared) {
-    sd_bus_unref(bus);
-    ::close(input);
-    ::close(output);
-    return nullptr;
+      sd_bus_set_exit_on_disconnect(bus, 0) >= 0 &&
+      sd_bus_set_fd(bus, input.get(), output.get()) >= 0;
+  if (prepared) {
+    static_cast<void>(input.release());
+    static_cast<void>(output.release());
+    if (sd_bus_start(bus) >= 0) return bus;
   }
-  if (sd_bus_start(bus) >= 0) return bus;
   sd_bus_close_unref(bus);
   return nullptr;
 }
@@ -68,25 +65,27 @@ bool passHandshake(sd_bus* bus, int other_end) {
   return false;
 }
 
+/// Above those that every program expects to have.
+FileDescriptor duplicateOf(int descriptor) {
+  return FileDescriptor(::fcntl(descriptor, F_DUPFD_CLOEXEC, 3));
+}
+
 }  // namespace
 
 AuthenticatedBus makeAuthenticatedBus(int socket, BusDescriptors descriptors) {
   const SocketPair pair = makeSocketPair();
   if (pair.first == nullptr) return {};
-  const int input = ::fcntl(pair.first->fd(), F_DUPFD_CLOEXEC, 3);
-  if (input < 0) return {};
-  const int output = ::fcntl(pair.first->fd(), F_DUPFD_CLOEXEC, 3);
-  if (output < 0) {
-    ::close(input);
-    return {};
+  FileDescriptor input = duplicateOf(pair.first->fd());
+  FileDescriptor output = duplicateOf(pair.first->fd());
+  if (!input.valid() || !output.valid()) return {};
+  AuthenticatedBus made{.input = input.get(), .output = output.get()};
+  made.bus = startServer(std::move(input), std::move(output), descriptors);
+  if (made.bus == nullptr) return {};
+  if (passHandshake(made.bus, pair.second->fd()) && ::dup3(socket, made.input, O_CLOEXEC) >= 0 &&
+      ::dup3(socket, made.output, O_CLOEXEC) >= 0) {
+    return made;
   }
-  sd_bus* bus = startServer(input, output, descriptors);
-  if (bus == nullptr) return {};
-  if (passHandshake(bus, pair.second->fd()) && ::dup3(socket, input, O_CLOEXEC) >= 0 &&
-      ::dup3(socket, output, O_CLOEXEC) >= 0) {
-    return {bus, input, output};
-  }
-  sd_bus_close_unref(bus);
+  sd_bus_close_unref(made.bus);
   return {};
 }
 

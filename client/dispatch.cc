@@ -11,32 +11,6 @@
 #include "support/runtime/guarded.h"
 
 namespace spacekeep {
-namespace {
-
-/// Where an operation leaves its outcomes while the serving thread waits. Callbacks that outlive
-/// the wait keep it.
-class OutcomeSlot {
- public:
-  void set(const Dictionary& outcome) {
-    state_.update([&](State& state) {
-      if (state.is_open) state.outcome = outcome;
-    });
-  }
-  /// What comes later is lost.
-  void close() {
-    state_.update([](State& state) { state.is_open = false; });
-  }
-  [[nodiscard]] std::optional<Dictionary> get() const { return state_.get().outcome; }
-
- private:
-  struct State {
-    bool is_open = true;
-    std::optional<Dictionary> outcome;
-  };
-  rt::Guarded<State> state_;
-};
-
-}  // namespace
 
 std::optional<Dictionary> Spacekeep::totalAvailable(const Value& info) {
   struct Waiting {
@@ -61,8 +35,8 @@ std::optional<Dictionary> Spacekeep::totalAvailable(const Value& info) {
 std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletion callback) {
   struct Waiting {
     TaskGroup group;
-    OutcomeSlot slot;
-    std::optional<Dictionary> own_outcome;  // written by the task, read after it has ended
+    rt::Guarded<std::optional<Dictionary>> outcome;  // the last one before the wait has ended
+    std::optional<Dictionary> own_outcome;           // written by the task, read after it has ended
   };
   const auto waiting = std::make_shared<Waiting>();
   const Value* asked_token = info.dictionary() ? info.dictionary()->find(keys::kToken) : nullptr;
@@ -80,7 +54,7 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
           operation->startOperation(
               [waiting, callback, queue = purge_queue_](const Dictionary& outcome) {
                 if (callback) callback(outcome);
-                waiting->slot.set(outcome);
+                waiting->outcome.set(outcome);
                 // Services answer on other threads, and some after the purge's own outcome.
                 if (queue->isCurrent()) waiting->own_outcome = outcome;
               });
@@ -88,12 +62,12 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
         collection_queue_->sync([&] {
           if (purge_operations_) purge_operations_->remove(token);
         });
-        waiting->slot.close();
         waiting->group.leave();
       });
   waiting->group.wait();
+  std::optional<Dictionary> answer = waiting->outcome.get();
   if (operation && waiting->own_outcome) rememberPurge(*operation, *waiting->own_outcome);
-  return waiting->slot.get();
+  return answer;
 }
 
 void Spacekeep::cancelPurgeWithToken(const Value* token) {

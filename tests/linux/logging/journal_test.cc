@@ -1,6 +1,8 @@
 #include "support/logging/linux/journal.h"
 
 #include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/mount.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -8,6 +10,9 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
+#include <optional>
+#include <stdexcept>
 #include <vector>
 
 #include "tests/helpers/temporary_directory.h"
@@ -132,6 +137,46 @@ TEST(JournalChoice, StandardErrorIsTheJournalOnlyWhenTheStreamIsTheSame) {
   }
   ASSERT_EQ(unsetenv("JOURNAL_STREAM"), 0);
   EXPECT_FALSE(standardErrorIsJournal());
+}
+
+/// A /run of this process's own with nothing in it but a journal.
+class RunWithAJournal {
+ public:
+  RunWithAJournal() {
+    if (unshare(CLONE_NEWNS) != 0 ||
+        mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+        mount("none", "/run", "tmpfs", 0, nullptr) != 0) {
+      throw std::runtime_error("this test mounts a file system and has to run as root");
+    }
+    std::filesystem::create_directories(std::filesystem::path(kJournalSocket).parent_path());
+    journal_.emplace(kJournalSocket);
+  }
+  ~RunWithAJournal() { umount2("/run", MNT_DETACH); }
+  RunWithAJournal(const RunWithAJournal&) = delete;
+  RunWithAJournal& operator=(const RunWithAJournal&) = delete;
+  [[nodiscard]] const FakeJournal& journal() const { return *journal_; }
+
+ private:
+  std::optional<FakeJournal> journal_;
+};
+
+TEST(JournalChoice, LinesGoToTheJournalExactlyWhereItIsStandardError) {
+  const RunWithAJournal run;
+  ASSERT_EQ(setenv("JOURNAL_STREAM", "1:1", 1), 0);
+  EXPECT_FALSE(installPlatformLog());
+  struct stat error {};
+  ASSERT_EQ(fstat(STDERR_FILENO, &error), 0);
+  const std::string same = std::to_string(error.st_dev) + ":" + std::to_string(error.st_ino);
+  ASSERT_EQ(setenv("JOURNAL_STREAM", same.c_str(), 1), 0);
+  const auto before = gMOLogWrite.load();
+  LogHandle handle;
+  setLogHandle(&handle);
+  EXPECT_TRUE(installPlatformLog());
+  logProblem("%s to the journal", "test");
+  gMOLogWrite.store(before);
+  setLogHandle(nullptr);
+  EXPECT_TRUE(hasLine(run.journal().receive(), "MESSAGE=test to the journal"));
+  ASSERT_EQ(unsetenv("JOURNAL_STREAM"), 0);
 }
 
 }  // namespace

@@ -250,6 +250,19 @@ TEST(SqliteSuite, AFailedCommitKeepsWhatWasSetAndSaysSo) {
   EXPECT_EQ(fetch(directory, "k"), Value(2));
 }
 
+TEST(SqliteSuite, AReaderThatKeepsACommitFromEndingIsInNobodysWayOnceItHasLeft) {
+  const TemporaryDirectory directory;
+  store(directory, "k", 1);
+  auto suite = open(directory, {.busy_timeout_ms = 1});
+  const Database reader = outside(fileOf(directory));
+  ASSERT_EQ(execute(reader.get(), "BEGIN; SELECT * FROM preferences"), SQLITE_OK);
+  suite->set("k", 2);
+  EXPECT_NE(suite->synchronize(), std::nullopt);
+  ASSERT_EQ(execute(reader.get(), "COMMIT"), SQLITE_OK);
+  EXPECT_EQ(suite->synchronize(), std::nullopt);
+  EXPECT_EQ(fetch(directory, "k"), Value(2));
+}
+
 TEST(SqliteSuite, WithoutRoomTheCommitIsTriedOnceMoreAfterRoomWasMade) {
   const TemporaryDirectory directory;
   store(directory, "k", 1);

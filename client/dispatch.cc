@@ -35,8 +35,10 @@ std::optional<Dictionary> Spacekeep::totalAvailable(const Value& info) {
 std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletion callback) {
   struct Waiting {
     TaskGroup group;
-    rt::Guarded<std::optional<Dictionary>> outcome;  // the last one before the wait has ended
-    std::optional<Dictionary> own_outcome;           // written by the task, read after it has ended
+    rt::Guarded<std::optional<Dictionary>> outcome;  // set for as long as services answer
+    // Written by the task, read after it has ended: the last outcome by then, and the purge's own.
+    std::optional<Dictionary> answer;
+    std::optional<Dictionary> own_outcome;
   };
   const auto waiting = std::make_shared<Waiting>();
   const Value* asked_token = info.dictionary() ? info.dictionary()->find(keys::kToken) : nullptr;
@@ -62,12 +64,12 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
         collection_queue_->sync([&] {
           if (purge_operations_) purge_operations_->remove(token);
         });
+        waiting->answer = waiting->outcome.get();
         waiting->group.leave();
       });
   waiting->group.wait();
-  std::optional<Dictionary> answer = waiting->outcome.get();
   if (operation && waiting->own_outcome) rememberPurge(*operation, *waiting->own_outcome);
-  return answer;
+  return std::move(waiting->answer);
 }
 
 void Spacekeep::cancelPurgeWithToken(const Value* token) {

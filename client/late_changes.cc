@@ -18,10 +18,15 @@ void LateChanges::set(const std::string& key, StateObject object) {
 void LateChanges::forget(const std::string& key) { changes_.erase(key); }
 
 void LateChanges::wereWritten() {
-  for (auto& [key, change] : changes_) {
-    if (change.record) keepWritten(key, std::move(change.record), *change.value->data());
+  for (auto change = changes_.begin(); change != changes_.end();) {
+    auto& [record, value] = change->second;
+    if (hasNoBytes(change->second)) {
+      ++change;
+      continue;
+    }
+    if (record) keepWritten(change->first, std::move(record), *value->data());
+    change = changes_.erase(change);
   }
-  changes_.clear();
 }
 
 LateChanges::Record LateChanges::recordAt(const std::string& key) const {
@@ -33,21 +38,20 @@ const Value* LateChanges::find(const std::string& key, const Dictionary& state) 
   const auto found = changes_.find(key);
   if (found == changes_.end()) return state.find(key);
   archive(found->second);
+  if (hasNoBytes(found->second)) return state.find(key);
   return found->second.value ? &*found->second.value : nullptr;
 }
 
-bool LateChanges::layOver(Dictionary& state) {
-  bool all_have_bytes = true;
+void LateChanges::layOver(Dictionary& state) {
   for (auto& [key, change] : changes_) {
     archive(change);
-    if (change.record && change.value->data()->bytes.empty()) all_have_bytes = false;
+    if (hasNoBytes(change)) continue;
     if (change.value) {
       state.set(key, *change.value);
     } else {
       state.remove(key);
     }
   }
-  return all_have_bytes;
 }
 
 LateChanges::Record LateChanges::writtenRecord(const std::string& key, const Data& archive) const {
@@ -62,6 +66,10 @@ void LateChanges::keepWritten(const std::string& key, Record record, Data archiv
 
 void LateChanges::archive(Change& change) {
   if (change.record && !change.value) change.value = Value(archivedRecentInfo(*change.record));
+}
+
+bool LateChanges::hasNoBytes(const Change& change) {
+  return change.record && change.value && change.value->data()->bytes.empty();
 }
 
 }  // namespace spacekeep

@@ -28,7 +28,7 @@ class LateChanges {
   void set(const std::string& key, StateObject object);
   /// What stands on the disk under the key is newer.
   void forget(const std::string& key);
-  /// All of them are on the disk.
+  /// What was laid over the state is on the disk; what stayed out of it remains.
   void wereWritten();
 
   [[nodiscard]] bool areAny() const { return !changes_.empty(); }
@@ -37,8 +37,8 @@ class LateChanges {
   /// What a client sees under the key, given what `state` holds; null when there is nothing. Good
   /// until either changes.
   [[nodiscard]] const Value* find(const std::string& key, const Dictionary& state);
-  /// Answers whether each record could be turned into bytes; one that is too large has none.
-  bool layOver(Dictionary& state);
+  /// Leaves out a record that is too large to be turned into bytes.
+  void layOver(Dictionary& state);
 
   /// The record on the disk that `archive` is the bytes of, as far as the daemon still has it.
   [[nodiscard]] Record writtenRecord(const std::string& key, const Data& archive) const;
@@ -55,6 +55,7 @@ class LateChanges {
   };
 
   static void archive(Change& change);
+  static bool hasNoBytes(const Change& change);
 
   std::map<std::string, Change> changes_;
   std::map<std::string, Written> written_;  // records only

@@ -79,15 +79,13 @@ void Spacekeep::writeSoon() {
 // there stays in memory, seen as before and in nobody's way, until the next change tries again.
 void Spacekeep::writeNow() {
   late_write_is_due_ = false;
-  if (!late_changes_.areAny()) return;
+  if (!user_defaults_ || !late_changes_.areAny()) return;
   Dictionary state = storedState();
-  const bool fits = late_changes_.layOver(state);
-  const auto why = fits ? writeOut(std::move(state)) : std::optional<std::string>(kTooLarge);
-  if (why) {
-    logProblem("%s recent statistics are not on the disk: %@", "writeNow", *why);
-  } else {
-    late_changes_.wereWritten();
-  }
+  late_changes_.layOver(state);
+  auto why = writeOut(std::move(state));
+  if (!why) late_changes_.wereWritten();
+  if (!why && late_changes_.areAny()) why = kTooLarge;
+  if (why) logProblem("%s recent statistics are not on the disk: %@", "writeNow", *why);
 }
 
 }  // namespace spacekeep

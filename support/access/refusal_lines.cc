@@ -30,7 +30,7 @@ bool RefusalLines::admit(std::uint32_t user, std::string_view entitlement) {
   }
   // At once, and not with the count alone: after a flood there may be no further line for long.
   if (is_first) {
-    logProblem("%s user %u is refused %s again: for a while such lines are counted and not written",
+    logProblem("%s user %u is refused %s: for a while such lines are counted and not written",
                kOperation, user, entitlement);
   }
   return false;

@@ -41,10 +41,9 @@ TEST(RefusalLines, AFloodOfOneUserMakesTwentyLinesAndOneThatSaysSo) {
     knock(access, 1000, 1230);
     EXPECT_EQ(log.count(kLogProblem, kLack), 20U);
     EXPECT_EQ(log.texts(kLogProblem).size(), 21U);
-    EXPECT_EQ(
-        log.texts(kLogProblem).back(),
-        "connectionIsEntitled user 1000 is refused CLIENT_ENTITLEMENT again: for a while such "
-        "lines are counted and not written");
+    EXPECT_EQ(log.texts(kLogProblem).back(),
+              "connectionIsEntitled user 1000 is refused CLIENT_ENTITLEMENT: for a while such "
+              "lines are counted and not written");
   });
 }
 

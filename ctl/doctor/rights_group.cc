@@ -4,7 +4,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <filesystem>
 #include <memory>
+#include <system_error>
 
 #include "ctl/doctor/groups.h"
 #include "ctl/text_layout.h"
@@ -15,6 +17,8 @@
 
 namespace spacekeep::ctl::doctor {
 namespace {
+
+namespace fs = std::filesystem;
 
 constexpr const char* kMend =
     "mend it, then have the rules read again: systemctl restart spacekeepd";
@@ -73,19 +77,48 @@ bool isHidden(const access::ReadRules& read) {
   });
 }
 
-/// Root reads everything; the daemon is somebody else.
-bool isClosedToTheDaemon(const Place& place, const std::string& directory, Group& group) {
-  constexpr mode_t kWayIn = S_IROTH | S_IXOTH;
-  const auto status = statusOf(directory);
+/// Root reads everything; the daemon is somebody else, for whom what is root's has to be open so far.
+bool isClosedToTheDaemon(const Place& place, const std::string& path, mode_t way_in) {
+  const auto status = statusOf(path);
   const bool is_roots = status && status->st_uid == 0 && status->st_gid == 0;
-  if (place.own_user == 0 || !is_roots || (status->st_mode & kWayIn) == kWayIn) return false;
+  return place.own_user != 0 && is_roots && (status->st_mode & way_in) != way_in;
+}
+
+/// Of the directory and those above it the outermost that the daemon cannot use; empty when it gets
+/// there.
+std::string closedOnTheWayTo(const Place& place, const fs::path& directory) {
+  fs::path above;
+  for (const fs::path& name : directory) {
+    above /= name;
+    const mode_t way_in = above == directory ? S_IROTH | S_IXOTH : S_IXOTH;
+    if (isClosedToTheDaemon(place, above, way_in)) return above;
+  }
+  return "";
+}
+
+bool tellClosedDirectory(const Place& place, const std::string& directory, Group& group) {
+  const std::string closed = closedOnTheWayTo(place, directory);
+  if (closed.empty()) return false;
   group.problem(
       "rule-directory",
-      fmt::format("{} is closed to the daemon ({}): what it denies is not known, so no "
-                  "rule of any directory holds",
-                  harmless(directory), modeText(status->st_mode)),
-      fmt::format("as root: chmod 0755 {}; systemctl restart spacekeepd", harmless(directory)));
+      fmt::format("{} is closed to the daemon ({}): what the rules in {} deny is not known, "
+                  "so no rule of any directory holds",
+                  harmless(closed), modeText(statusOf(closed)->st_mode), harmless(directory)),
+      fmt::format("as root: chmod 0755 {}; systemctl restart spacekeepd", harmless(closed)));
   return true;
+}
+
+void tellClosedFiles(const Place& place, const std::string& directory, Group& group) {
+  std::error_code unreadable;
+  for (const auto& entry : fs::directory_iterator(directory, unreadable)) {
+    const std::string path = entry.path();
+    if (!path.ends_with(".plist") || !isClosedToTheDaemon(place, path, S_IROTH)) continue;
+    group.problem(
+        "rule-file",
+        fmt::format("{} is closed to the daemon ({}) and grants nothing", harmless(path),
+                    modeText(statusOf(path)->st_mode)),
+        fmt::format("as root: chmod 0644 {}; systemctl restart spacekeepd", harmless(path)));
+  }
 }
 
 bool grantsToSomebody(const std::vector<access::Rule>& rules, std::string_view entitlement) {
@@ -144,7 +177,8 @@ Group rightsGroup(const Place& place, const Contact& contact) {
   const std::string vendor = place.paths.vendor_directory + "/entitlements.d";
   const std::string administrator = place.paths.administrator_directory + "/entitlements.d";
   for (const auto& directory : {vendor, administrator}) {
-    if (isClosedToTheDaemon(place, directory, group)) return group;
+    if (tellClosedDirectory(place, directory, group)) return group;
+    tellClosedFiles(place, directory, group);
   }
   const auto read =
       access::readRules(vendor, administrator, access::systemNameLookup(), place.own_user);

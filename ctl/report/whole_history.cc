@@ -14,10 +14,11 @@ constexpr const char* kNotKept =
     "the daemon is older than this tool and keeps no history of what it freed";
 constexpr const char* kNoSense = "the daemon answered with a history that does not end";
 
-/// Answers whether older entries are wanted.
+/// Answers whether further entries are wanted. One that is too old is no end: they come by their
+/// numbers, and a clock that was wrong for a while leaves dates that do not rise with these.
 bool takeEntry(const Dictionary& entry, const WantedHistory& wanted, History& history) {
   const auto date_ns = dateOf(entry);
-  if (wanted.since_ns && date_ns && *date_ns < *wanted.since_ns) return false;
+  if (wanted.since_ns && (!date_ns || *date_ns < *wanted.since_ns)) return true;
   history.older_left_out = history.entries.size() == kMostEntries;
   if (history.older_left_out) return false;
   history.entries.emplace_back(entry);

@@ -32,14 +32,23 @@ std::optional<Key> keyOf(std::string_view domain, std::string_view key) {
   return Key(lineOf(domain), lineOf(key));
 }
 
+constexpr std::string_view kSumOfAll = "total.purged";
+
 /// By its end, which the daemon puts behind the ID of a service. The ID itself may be anything.
 bool isOfService(const Key& key) {
-  constexpr std::string_view kSumOfAll = "total.purged";
   constexpr std::array<std::string_view, 3> kEnds = {".purged", "_purgeElapsedNanoseconds",
                                                      "_purgeableElapsedNanoseconds"};
   return key.second != kSumOfAll &&
          std::any_of(kEnds.begin(), kEnds.end(),
                      [&key](std::string_view end) { return key.second.ends_with(end); });
+}
+
+bool isPercentage(const Key& key) {
+  return key.second.ends_with(OpenMetricsStatistics::kPercentEnd);
+}
+
+bool isPercentageOfService(const Key& key) {
+  return isPercentage(key) && !key.second.starts_with(kSumOfAll);
 }
 
 prometheus::Labels labelsOf(const Key& key) { return {{"domain", key.first}, {"key", key.second}}; }
@@ -81,7 +90,10 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
   }
 
  private:
-  [[nodiscard]] bool fullOfPercentages() const { return percent_keys_ >= kMaxPercentKeys; }
+  [[nodiscard]] bool fullForPercentage(const Key& key) const {
+    if (percent_keys_ >= kMaxPercentKeys) return true;
+    return isPercentageOfService(key) && service_percent_keys_ >= kMaxPercentKeys - kOwnPercentKeys;
+  }
   [[nodiscard]] bool fullFor(const Key& key) const {
     if (counters_.size() - percent_keys_ + histograms_.size() >= kMaxKeys) return true;
     return isOfService(key) && service_keys_ >= kMaxKeys - kOwnKeys;
@@ -89,9 +101,9 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
 
   prometheus::Counter* counterOf(const Key& key) {
     if (const auto found = counters_.find(key); found != counters_.end()) return found->second;
-    const bool is_percentage = key.second.ends_with(kPercentEnd);
-    if (is_percentage ? fullOfPercentages() : fullFor(key)) return nullptr;
-    if (is_percentage) ++percent_keys_;
+    if (isPercentage(key) ? fullForPercentage(key) : fullFor(key)) return nullptr;
+    if (isPercentage(key)) ++percent_keys_;
+    if (isPercentageOfService(key)) ++service_percent_keys_;
     if (isOfService(key)) ++service_keys_;
     prometheus::Counter& counter = reports_.Add(labelsOf(key));
     counters_.emplace(key, &counter);
@@ -147,8 +159,9 @@ class OpenMetricsStatistics::State : public std::enable_shared_from_this<State> 
           .Help("Observations of the daemon, in bytes or nanoseconds as the key says.")
           .Register(registry_);
   std::map<Key, prometheus::Counter*> counters_;
-  std::size_t percent_keys_ = 0;  // among the counters
-  std::size_t service_keys_ = 0;  // of services, percentages left out
+  std::size_t percent_keys_ = 0;          // among the counters
+  std::size_t service_percent_keys_ = 0;  // among these
+  std::size_t service_keys_ = 0;          // of services, percentages left out
   std::map<Key, prometheus::Histogram*> histograms_;
 };
 

@@ -41,6 +41,8 @@ class OpenMetricsStatistics : public Statistics {
   /// may bring any number of them, and would soon leave no room for a sum.
   static constexpr std::string_view kPercentEnd = ".percent";
   static constexpr std::size_t kMaxPercentKeys = 2048;
+  /// Of these, places for the percentages of all services together.
+  static constexpr std::size_t kOwnPercentKeys = 64;
   /// A longer domain or key is dropped.
   static constexpr std::size_t kMaxNameBytes = 256;
 

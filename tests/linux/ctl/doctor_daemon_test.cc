@@ -77,6 +77,13 @@ TEST_F(DoctorOnTheDaemon, ADaemonThatTurnsThisUserAwayIsThere) {
 class DoctorOnRights : public DoctorTest {
  protected:
   [[nodiscard]] Group look() const { return rightsGroup(place(), noDaemon()); }
+  /// What root finds where the daemon runs as somebody else.
+  [[nodiscard]] Group lookForAnotherUser() const {
+    chmod(directory_.path().c_str(), 0755);  // it was made for its owner alone
+    Place another = place();
+    another.own_user = 4242;
+    return rightsGroup(another, noDaemon());
+  }
   static constexpr const char* kVendor = "usr/lib/spacekeep/entitlements.d/";
   static constexpr const char* kOwn = "etc/spacekeep/entitlements.d/";
 };
@@ -143,13 +150,29 @@ TEST_F(DoctorOnRights, AnAdministratorsDirectoryThatOthersMayWriteShutsEverybody
 
 TEST_F(DoctorOnRights, ADirectoryThatRootCanReadAndTheDaemonCannot) {
   if (geteuid() != 0) GTEST_SKIP() << "the rules have to be root's";
-  Place running_as_another = place();
-  running_as_another.own_user = 4242;
-  EXPECT_THAT(withoutUnknownGroups(rightsGroup(running_as_another, noDaemon())), IsEmpty());
+  EXPECT_THAT(withoutUnknownGroups(lookForAnotherUser()), IsEmpty());
   chmod(path(kOwn).c_str(), 0700);
-  const Group group = rightsGroup(running_as_another, noDaemon());
+  const Group group = lookForAnotherUser();
   EXPECT_THAT(badNews(group), ElementsAre("problem rule-directory"));
   EXPECT_THAT(allTexts(group), HasSubstr("is closed to the daemon (0700)"));
+}
+
+TEST_F(DoctorOnRights, ADirectoryAboveTheRulesThatTheDaemonCannotPass) {
+  if (geteuid() != 0) GTEST_SKIP() << "the rules have to be root's";
+  const std::string above = std::filesystem::path(path(kOwn)).parent_path().parent_path();
+  chmod(above.c_str(), 0710);
+  const Group group = lookForAnotherUser();
+  EXPECT_THAT(badNews(group), ElementsAre("problem rule-directory"));
+  EXPECT_THAT(allTexts(group), HasSubstr(above + " is closed to the daemon (0710)"));
+}
+
+TEST_F(DoctorOnRights, ARuleFileThatRootCanReadAndTheDaemonCannot) {
+  if (geteuid() != 0) GTEST_SKIP() << "the rules have to be root's";
+  const std::string file = path(kVendor + std::string("20-spacekeep.plist"));
+  chmod(file.c_str(), 0640);
+  const Group group = lookForAnotherUser();
+  EXPECT_THAT(withoutUnknownGroups(group), ElementsAre("problem rule-file"));
+  EXPECT_THAT(allTexts(group), HasSubstr(file + " is closed to the daemon (0640)"));
 }
 
 TEST_F(DoctorOnRights, AFileThatTakesThePlaceOfAnotherIsNamedAndNoProblem) {

@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <map>
 #include <string>
 #include <vector>
 
@@ -106,13 +107,17 @@ class FakeHistory {
     if (const auto before = unsignedAt(request, "SPACEKEEP_BEFORE"))
       at = static_cast<int>(*before) - 1;
     Array entries;
-    for (int i = 0; i < page_ && at > 0; ++i, --at) entries.emplace_back(numbered(at));
+    for (int i = 0; i < page_ && at > 0; ++i, --at) {
+      const auto other = others.find(at);
+      entries.emplace_back(other == others.end() ? numbered(at) : other->second);
+    }
     Dictionary answer{{"SPACEKEEP_ENTRIES", std::move(entries)}};
     if (at > 0) answer.set("SPACEKEEP_NEXT", at + 1);
     return {.outcome = std::move(answer), .error = {}};
   }
 
   std::vector<Dictionary> requests;
+  std::map<int, Dictionary> others;  ///< in the place of numbered()
 
  private:
   const int newest_;
@@ -136,13 +141,22 @@ TEST(ReportHistory, IsReadPageByPageToItsEnd) {
   EXPECT_THAT(daemon.requests, ElementsAre(first, second, third));
 }
 
-TEST(ReportHistory, EndsWhereTheEntriesGetTooOld) {
+TEST(ReportHistory, LeavesOutWhatIsTooOldAndWhatTellsNoDate) {
   FakeHistory daemon(25, 10);
+  daemon.others[16] = {{"SPACEKEEP_ENTRY", 16}};
   const History history = readHistory({.volume = "", .since_ns = 14 * kSecondNs}, std::ref(daemon));
-  ASSERT_EQ(history.entries.size(), 12U);
+  ASSERT_EQ(history.entries.size(), 11U);
   EXPECT_EQ(history.entries.back(), Value(numbered(14)));
-  EXPECT_EQ(daemon.requests.size(), 2U);
   EXPECT_EQ(daemon.requests.front(), (Dictionary{{"SPACEKEEP_LIMIT", 1000}}));
+}
+
+TEST(ReportHistory, AnEntryOfAClockThatWasWrongHidesNoneBeforeIt) {
+  FakeHistory daemon(25, 10);
+  daemon.others[20] = {{"SPACEKEEP_ENTRY", 20}, {"SPACEKEEP_DATE", Value(Date{0})}};
+  const History history = readHistory({.volume = "", .since_ns = 14 * kSecondNs}, std::ref(daemon));
+  ASSERT_EQ(history.entries.size(), 11U);
+  EXPECT_EQ(history.entries.back(), Value(numbered(14)));
+  EXPECT_FALSE(history.older_left_out);
 }
 
 TEST(ReportHistory, AnEmptyOneIsNoProblem) {

@@ -130,7 +130,8 @@ TEST_F(Statistic, DistinctKeysAreBounded) {
 }
 
 TEST_F(Statistic, PercentagesWithoutEndLeaveRoomForSumsAndDistributions) {
-  constexpr std::size_t kMost = OpenMetricsStatistics::kMaxPercentKeys;
+  constexpr std::size_t kMost =
+      OpenMetricsStatistics::kMaxPercentKeys - OpenMetricsStatistics::kOwnPercentKeys;
   for (std::size_t i = 0; i < kMost + 10; ++i)
     report("cache.purged." + std::to_string(10 * i) + ".percent", 1);
   for (std::size_t i = 0; i < 4096; ++i) report("service" + std::to_string(i) + ".purged", 1);
@@ -145,6 +146,16 @@ TEST_F(Statistic, PercentagesWithoutEndLeaveRoomForSumsAndDistributions) {
   EXPECT_TRUE(hasLine(file,
                       "spacekeep_report_total{domain=\"com.quorvel.spacekeep\",key="
                       "\"cache.purged.10.percent\"} 2"));
+}
+
+TEST_F(Statistic, PercentagesOfServicesLeaveRoomForThoseOfAllTogether) {
+  constexpr std::size_t kMost = OpenMetricsStatistics::kMaxPercentKeys;
+  for (std::size_t i = 0; i < kMost; ++i) report("s.purged." + std::to_string(i) + ".percent", 1);
+  for (std::size_t i = 0; i < kMost; ++i)
+    report("total.purged." + std::to_string(i) + ".percent", 1);
+  const std::string file = text();
+  EXPECT_EQ(linesWith(file, "\"total.purged."), OpenMetricsStatistics::kOwnPercentKeys);
+  EXPECT_EQ(linesWith(file, ".percent\"} "), kMost);
 }
 
 TEST_F(Statistic, ManyServicesLeaveRoomForWhatTheDaemonCountsOfItself) {

@@ -32,8 +32,9 @@ Place placeAt(std::string root, const std::string& socket) {
   while (!root.empty() && root.back() == '/') root.pop_back();
   Place place{.root = root, .paths = pathsBelow(root), .socket = socket};
   if (place.socket.empty()) place.socket = place.paths.socket;
-  place.own_user =
-      place.isThisSystem() ? access::systemNameLookup().user(kDaemonUser).value_or(0) : geteuid();
+  place.own_user = place.isThisSystem()
+                       ? access::systemNameLookup().user(kDaemonUser).number.value_or(0)
+                       : geteuid();
   return place;
 }
 

@@ -24,26 +24,40 @@ bool holds(const std::optional<Alternatives>& alternatives, bool left_open, bool
   return !alternatives || fits || (left_open && !alternatives->empty());
 }
 
-bool matches(const Rule& rule, const PeerIdentity& identity, const UnclearFacts& left_open) {
+/// What does not decide here: facts that the kernel did not tell, names that nobody could look up.
+struct LeftOpen {
+  UnclearFacts facts;
+  bool users = false;
+  bool groups = false;
+};
+
+bool matches(const Rule& rule, const PeerIdentity& identity, const LeftOpen& left_open) {
   if (!hasCondition(rule)) return rule.matches_anybody;
   const auto is_peer = [&identity](std::uint32_t user) { return identity.uid() == user; };
   const auto is_member = [&identity](std::uint32_t group) { return identity.isMemberOf(group); };
-  return holds(rule.users, false, rule.users && std::ranges::any_of(*rule.users, is_peer)) &&
-         holds(rule.groups, left_open.groups,
-               rule.groups && std::ranges::any_of(*rule.groups, is_member)) &&
-         holds(rule.units, left_open.unit, rule.units && holdsText(*rule.units, identity.unit())) &&
-         holds(rule.labels, left_open.label,
+  const bool fits_user =
+      left_open.users || (rule.users && std::ranges::any_of(*rule.users, is_peer));
+  const bool fits_group =
+      left_open.groups || (rule.groups && std::ranges::any_of(*rule.groups, is_member));
+  return holds(rule.users, false, fits_user) &&
+         holds(rule.groups, left_open.facts.groups, fits_group) &&
+         holds(rule.units, left_open.facts.unit,
+               rule.units && holdsText(*rule.units, identity.unit())) &&
+         holds(rule.labels, left_open.facts.label,
                rule.labels && holdsText(*rule.labels, identity.label()));
 }
 
 }  // namespace
 
 bool matches(const Rule& rule, const PeerIdentity& identity) {
-  return matches(rule, identity, UnclearFacts{});
+  return matches(rule, identity, LeftOpen{});
 }
 
 bool mayMatch(const Rule& rule, const PeerIdentity& identity) {
-  return matches(rule, identity, identity.unclear());
+  return matches(rule, identity,
+                 {.facts = identity.unclear(),
+                  .users = rule.users_left_open,
+                  .groups = rule.groups_left_open});
 }
 
 Verdict judge(std::span<const Rule> rules, const PeerIdentity& identity,

@@ -22,6 +22,8 @@ struct Rule {
   bool matches_anybody = false;  ///< without any condition a rule matches nobody unless this is set
   std::optional<std::vector<std::uint32_t>> users;
   std::optional<std::vector<std::uint32_t>> groups;  ///< primary or supplementary
+  bool users_left_open = false;  ///< it is not known whom a name among them stands for
+  bool groups_left_open = false;
   std::optional<std::vector<std::string>> units;
   std::optional<std::vector<std::string>> labels;
   std::vector<std::string> grants;

@@ -9,7 +9,7 @@
 namespace spacekeep::access {
 namespace {
 
-using Lookup = std::function<std::optional<std::uint32_t>(const std::string&)>;
+using Lookup = std::function<NameAnswer(const std::string&)>;
 using Problem = std::optional<RuleError>;
 
 RuleError wrongKind(std::string_view key, std::string_view wanted) {
@@ -42,19 +42,33 @@ std::optional<std::uint32_t> plainId(const Value& entry) {
   return static_cast<std::uint32_t>(*number);
 }
 
-Problem readIds(std::string_view key, const Value& value, const Lookup& lookup,
+/// The number of a user or group, none when nobody is called so.
+std::optional<std::uint32_t> lookUp(std::string_view key, const std::string& name,
+                                    const Lookup& lookup, bool& left_open,
+                                    std::vector<std::string>& remarks) {
+  const NameAnswer answer = lookup(name);
+  left_open = left_open || !answer.failure.empty();
+  if (!answer.failure.empty()) {
+    remarks.push_back(std::string(key) + " names " + name + ", which could not be looked up (" +
+                      answer.failure + "): what the rule denies, it may deny to anybody");
+  } else if (!answer.number) {
+    remarks.push_back(std::string(key) + " names " + name +
+                      ", which does not exist here and matches nobody");
+  }
+  return answer.number;
+}
+
+Problem readIds(std::string_view key, const Value& value, const Lookup& lookup, bool& left_open,
                 std::vector<std::uint32_t>& ids, std::vector<std::string>& remarks) {
   const std::vector<Value> entries = alternativesOf(value);
   if (entries.size() > kMaxRuleEntries) return wrongKind(key, "shorter: too many entries");
   for (const Value& entry : entries) {
-    const std::string* entry_name = entry.string();
-    const auto id = entry_name != nullptr ? lookup(*entry_name) : plainId(entry);
+    const std::string* name = entry.string();
+    const auto id =
+        name != nullptr ? lookUp(key, *name, lookup, left_open, remarks) : plainId(entry);
     if (id) {
       ids.push_back(*id);
-    } else if (entry_name != nullptr) {
-      remarks.push_back(std::string(key) + " names " + *entry_name +
-                        ", which does not exist here and matches nobody");
-    } else {
+    } else if (name == nullptr) {
       return wrongKind(key, "a name, a number, or an array of these");
     }
   }
@@ -79,10 +93,12 @@ Problem readKey(const std::string& key, const Value& value, const NameLookup& lo
                 ParsedRule& parsed) {
   Rule& rule = parsed.rule;
   if (key == "MATCH_USER") {
-    return readIds(key, value, lookup.user, rule.users.emplace(), parsed.remarks);
+    return readIds(key, value, lookup.user, rule.users_left_open, rule.users.emplace(),
+                   parsed.remarks);
   }
   if (key == "MATCH_GROUP") {
-    return readIds(key, value, lookup.group, rule.groups.emplace(), parsed.remarks);
+    return readIds(key, value, lookup.group, rule.groups_left_open, rule.groups.emplace(),
+                   parsed.remarks);
   }
   if (key == "MATCH_UNIT") return readTexts(key, value, rule.units.emplace());
   if (key == "MATCH_LABEL") return readTexts(key, value, rule.labels.emplace());

@@ -33,10 +33,18 @@
 
 namespace spacekeep::access {
 
-/// How names become numbers; none when there is no such name.
+struct NameAnswer {
+  // NOLINTNEXTLINE(google-explicit-constructor): most lookups know what they find
+  NameAnswer(std::optional<std::uint32_t> found) : number(found) {}
+
+  std::optional<std::uint32_t> number;  ///< none when there is no such name
+  std::string failure;                  ///< why it is not known whether there is, empty when it is
+};
+
+/// How names become numbers.
 struct NameLookup {
-  std::function<std::optional<std::uint32_t>(const std::string&)> user;
-  std::function<std::optional<std::uint32_t>(const std::string&)> group;
+  std::function<NameAnswer(const std::string&)> user;
+  std::function<NameAnswer(const std::string&)> group;
 };
 
 struct RuleError {
@@ -45,7 +53,8 @@ struct RuleError {
 
 struct ParsedRule {
   Rule rule;
-  /// What is odd but not broken: names that are unknown (and so match nobody), entitlements that
+  /// What is odd but not broken: names that are unknown (and so match nobody) or could not be looked
+  /// up (and so may match anybody, where the rule denies), entitlements that
   /// nothing asks for. In words, to be logged.
   std::vector<std::string> remarks;
 };

@@ -2,6 +2,11 @@
 #include <pwd.h>
 
 #include <cerrno>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <system_error>
+#include <vector>
 
 #include "support/access/linux/load_rules.h"
 
@@ -10,29 +15,35 @@ namespace {
 
 constexpr std::size_t kMaxEntryBytes = 1024 * 1024;  // a group with very many members
 
+/// What getpwnam(3) lists for a name that is not there, besides 0.
+bool meansNobody(int error) {
+  return error == 0 || error == ENOENT || error == ESRCH || error == EBADF || error == EPERM;
+}
+
 /// Asks with a larger buffer as long as the entry does not fit.
-template <class Entry, class Ask>
-std::optional<Entry> askDatabase(const std::string& name, Ask ask) {
+template <class Entry, class Ask, class Id>
+NameAnswer askDatabase(const std::string& name, Ask ask, Id Entry::*id) {
+  int error = ERANGE;
   for (std::vector<char> buffer(1024); buffer.size() <= kMaxEntryBytes;
        buffer.resize(buffer.size() * 4)) {
     Entry entry{};
     Entry* found = nullptr;
-    const int error = ask(name.c_str(), &entry, buffer.data(), buffer.size(), &found);
+    error = ask(name.c_str(), &entry, buffer.data(), buffer.size(), &found);
     if (error == ERANGE) continue;
-    if (error != 0 || found == nullptr) return std::nullopt;
-    return entry;  // only its numbers are good beyond this point
+    if (error == 0 && found != nullptr) return std::optional<std::uint32_t>(entry.*id);
+    break;
   }
-  return std::nullopt;
+  NameAnswer none(std::nullopt);
+  if (!meansNobody(error)) none.failure = std::generic_category().message(error);
+  return none;
 }
 
-std::optional<std::uint32_t> userNumber(const std::string& name) {
-  const auto entry = askDatabase<passwd>(name, &::getpwnam_r);
-  return entry ? std::optional<std::uint32_t>(entry->pw_uid) : std::nullopt;
+NameAnswer userNumber(const std::string& name) {
+  return askDatabase<passwd>(name, &::getpwnam_r, &passwd::pw_uid);
 }
 
-std::optional<std::uint32_t> groupNumber(const std::string& name) {
-  const auto entry = askDatabase<group>(name, &::getgrnam_r);
-  return entry ? std::optional<std::uint32_t>(entry->gr_gid) : std::nullopt;
+NameAnswer groupNumber(const std::string& name) {
+  return askDatabase<group>(name, &::getgrnam_r, &group::gr_gid);
 }
 
 }  // namespace

@@ -10,9 +10,11 @@ NameLookup lookup() {
             if (name == "ada") return 1815;
             return std::nullopt;
           },
-          .group = [](const std::string& name) -> std::optional<std::uint32_t> {
-            if (name == "spacekeep") return 400;
-            return std::nullopt;
+          .group = [](const std::string& name) -> NameAnswer {
+            if (name == "spacekeep") return std::optional<std::uint32_t>(400);
+            NameAnswer none(std::nullopt);
+            if (name == "far-away") none.failure = "no answer";
+            return none;
           }};
 }
 
@@ -63,6 +65,21 @@ TEST(RuleFile, AnUnknownNameMatchesNobodyAndIsRemarked) {
   EXPECT_EQ(result.remarks[0],
             "MATCH_USER names nobody-here, which does not exist here and matches nobody");
   EXPECT_FALSE(matches(result.rule, PeerIdentity({.uid = 0})));
+}
+
+TEST(RuleFile, ANameThatCouldNotBeLookedUpMayBeAnybodysWhereTheRuleDenies) {
+  const ParsedRule result = parsed(Dictionary{{"MATCH_GROUP", Array{"far-away", "spacekeep"}},
+                                              {"MATCH_USER", 7},
+                                              {"DENY", Array{"CLIENT_ENTITLEMENT"}}});
+  EXPECT_EQ(result.remarks,
+            std::vector<std::string>{"MATCH_GROUP names far-away, which could not be looked up (no "
+                                     "answer): what the rule denies, it may deny to anybody"});
+  const PeerIdentity stranger({.uid = 7, .gid = 1});
+  EXPECT_FALSE(matches(result.rule, stranger));
+  EXPECT_TRUE(mayMatch(result.rule, stranger));
+  EXPECT_FALSE(mayMatch(result.rule, PeerIdentity({.uid = 8, .gid = 1}))) << "MATCH_USER says no";
+  const PeerIdentity member({.uid = 7, .gid = 400});
+  EXPECT_TRUE(matches(result.rule, member));
 }
 
 TEST(RuleFile, ATextOfDigitsIsANameAndNotANumber) {

@@ -224,10 +224,11 @@ TEST_F(LoadRules, TheNumberOfFilesIsBounded) {
 
 TEST(SystemNames, AreLookedUp) {
   const NameLookup lookup = systemNameLookup();
-  EXPECT_EQ(lookup.user("root"), 0U);
-  EXPECT_EQ(lookup.group("root"), 0U);
-  EXPECT_EQ(lookup.user("no-such-user-here"), std::nullopt);
-  EXPECT_EQ(lookup.group("no-such-group-here"), std::nullopt);
+  EXPECT_EQ(lookup.user("root").number, 0U);
+  EXPECT_EQ(lookup.group("root").number, 0U);
+  EXPECT_EQ(lookup.user("no-such-user-here").number, std::nullopt);
+  EXPECT_EQ(lookup.user("no-such-user-here").failure, "") << "it is known that there is none";
+  EXPECT_EQ(lookup.group("no-such-group-here").number, std::nullopt);
 }
 
 TEST(ShippedRules, GrantWhatTheyPromise) {

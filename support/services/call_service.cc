@@ -106,6 +106,11 @@ std::shared_ptr<SerialQueue> ServiceCaller::orderOf(const std::string& service_i
   return order;
 }
 
+std::size_t ServiceCaller::rememberedOrders() const {
+  const std::scoped_lock lock(mutex_);
+  return orders_.size();
+}
+
 /// Looks at all of them only when there are twice as many as were left the last time, so that a
 /// call does not cost more the more services there are.
 void ServiceCaller::forgetUnusedOrders() {

@@ -45,6 +45,10 @@ class ServiceCaller {
   void CallService(std::shared_ptr<const ServiceReference> service, CallHandler call,
                    FailureHandler failure);
 
+  /// Of how many services the order of calls is remembered: of those that are being called, and of
+  /// so many others again, but some at least.
+  [[nodiscard]] std::size_t rememberedOrders() const;
+
  private:
   class Attempt;
   using Invoked = std::function<void()>;
@@ -61,7 +65,7 @@ class ServiceCaller {
   ConcurrentQueue& global_;
   ipc::Connector& connector_;
   const ipc::InterfaceDescription& interface_;
-  rt::Mutex mutex_;
+  mutable rt::Mutex mutex_;
   /// Protected by mutex_. One for each service that is being called; a queue lives while it has
   /// tasks.
   std::map<std::string, std::weak_ptr<SerialQueue>> orders_;

@@ -235,6 +235,18 @@ TEST(CallServiceAsync, OneServiceDoesNotHoldUpAnother) {
   });
 }
 
+TEST(CallServiceAsync, ServicesThatAreNotBeingCalledAreForgotten) {
+  inEverySchedule(3, [] {
+    World world;
+    for (int i = 0; i < 500; ++i) {
+      world.ask(std::make_shared<const ServiceReference>(
+          ServiceReference{"svc" + std::to_string(i), world.connection}));
+      world.called.wait();
+    }
+    EXPECT_LE(world.caller.rememberedOrders(), 128U);
+  });
+}
+
 TEST(CallService, ReturnsOnceTheCallHandlerWasInvoked) {
   inEverySchedule(200, [] {
     World world;

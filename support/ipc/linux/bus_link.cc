@@ -221,6 +221,7 @@ bool BusLink::processOnce() {
 
 bool BusLink::readJudged() {
   const std::size_t available = bytesAvailable(fd_);
+  const bool is_continued = message_read_ > 0;
   const std::size_t queued = queued_sizes_.size();
   const int progress = sd_bus_process(bus_, nullptr);
   if (ended_) return false;
@@ -240,8 +241,8 @@ bool BusLink::readJudged() {
   }
   if (ended_ || progress == 0) return false;
   // When this message was all there was, the next one wakes the loop by itself, and looking for it
-  // now would be a system call for nothing.
-  return available != message_size_;
+  // now would be a system call for nothing. Of one that came in pieces not all was there this time.
+  return is_continued || available != message_size_;
 }
 
 BusLink::Ahead BusLink::lookAhead() {

@@ -1,12 +1,17 @@
 // What comes all at once while the IPC thread is busy: each arrival is told once only, so nothing of
 // it may be left lying.
 #include <gtest/gtest.h>
+#include <linux/sockios.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 
 #include <algorithm>
 #include <memory>
+#include <string>
+#include <string_view>
 #include <vector>
 
+#include "tests/linux/ipc/bus_world.h"
 #include "tests/linux/ipc/busy_loop.h"
 #include "tests/linux/ipc/ipc_world.h"
 
@@ -40,6 +45,37 @@ TEST(Turns, ABurstOfMoreCallsThanOneTurnTakesIsServedToTheLast) {
   for (int i = 0; i < kCalls; ++i) {
     ASSERT_EQ(server.numbers()[static_cast<std::size_t>(i) + 1], i);
   }
+}
+
+/// The bytes of a call of "number".
+std::string numberCall(char number, std::string_view unused = "") {
+  RawMessage call = RawMessage().callOf("number").text(8, 'g', "i");
+  if (!unused.empty()) call.text(77, 's', unused);
+  return call.bytes(1, 7, std::string{number, 0, 0, 0});
+}
+
+/// Once the server has taken all that was sent, and does something else.
+bool hasBeenRead(TestServer& server, const RawPeer& peer) {
+  const bool is_taken = eventually([&peer] {
+    int unread = -1;
+    return ::ioctl(peer.fd(), SIOCOUTQ, &unread) == 0 && unread == 0;
+  });
+  server.loop.runAndWait([] {});
+  return is_taken;
+}
+
+// What then arrives at once is as long as the first call.
+TEST(Turns, ACallOfTheSizeOfTheFirstPieceOfTheOneBeforeItIsServedWithTheSecondPiece) {
+  TestServer server;
+  RawPeer peer(server.path());
+  peer.authenticate();
+  const std::string second = numberCall(2);
+  const std::string first = numberCall(1, std::string(200, 'x'));
+  ASSERT_TRUE(peer.send(std::string_view(first).substr(0, second.size())));
+  ASSERT_TRUE(hasBeenRead(server, peer));
+  ASSERT_TRUE(peer.send(first.substr(second.size()) + second));
+  EXPECT_TRUE(eventually([&] { return server.numbers().size() == 2; }));
+  EXPECT_EQ(server.numbers(), (std::vector<std::int32_t>{1, 2}));
 }
 
 TEST(Turns, ACallSentJustBeforeClosingIsServedAndTheEndIsNoticed) {

@@ -27,6 +27,10 @@ constexpr std::size_t kLeftOutPerTurn = 64 * 1024;
 // Over a bus. Headers that anybody has a use for are much shorter.
 constexpr std::uint64_t kMaxBusHeaderBytes = 8 * 1024;
 
+std::string cannotBeWritten(int problem) {
+  return std::string("messages for it cannot be written: ") + std::strerror(problem);
+}
+
 std::size_t bytesAvailable(int fd) {
   int bytes = 0;
   return ::ioctl(fd, FIONREAD, &bytes) == 0 && bytes > 0 ? static_cast<std::size_t>(bytes) : 0;
@@ -189,7 +193,9 @@ void BusLink::writeQueued() {
   const int progress = is_silent ? sd_bus_process(bus_, nullptr) : 0;
   if (!is_silent || ::dup3(fd_, input_, O_CLOEXEC) < 0) {
     end(LinkEnd::kRefused, "this process cannot duplicate a descriptor");
-  } else if (progress < 0 || sd_bus_is_open(bus_) <= 0) {
+  } else if (progress < 0) {
+    end(LinkEnd::kRefused, cannotBeWritten(-progress));
+  } else if (sd_bus_is_open(bus_) <= 0) {
     end(LinkEnd::kPeerLeft, "the peer has left");
   } else {
     forgetWritten();
@@ -393,8 +399,8 @@ std::optional<std::uint64_t> BusLink::send(sd_bus_message* message, std::size_t 
     const bool gone = result == -ECONNRESET || result == -EPIPE || result == -ENOTCONN;
     if (gone) {
       end(LinkEnd::kPeerLeft, "the peer has left");
-    } else if (sd_bus_is_open(bus_) <= 0 || result == -ENOBUFS) {
-      end(LinkEnd::kRefused, "it does not take its messages");
+    } else if (sd_bus_is_open(bus_) <= 0 || result == -ENOBUFS || result == -ENOMEM) {
+      end(LinkEnd::kRefused, cannotBeWritten(-result));
     }
     return std::nullopt;
   }

@@ -1,14 +1,22 @@
 // How connections end, and that each end is told once and under its right name.
 #include <gtest/gtest.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <systemd/sd-id128.h>
 #include <unistd.h>
 
+#include <array>
 #include <atomic>
+#include <cerrno>
+#include <cstddef>
 
+#include "tests/helpers/log_capture.h"
 #include "tests/linux/ipc/ipc_world.h"
 
 namespace spacekeep::ipc::test {
@@ -245,6 +253,58 @@ TEST(ConnectionEnd, ThatALimitBringsIsSeenByThePeerThoughTheDescriptorIsKept) {
     pollfd state = {pair.second->fd(), 0, 0};
     return ::poll(&state, 1, 0) == 1 && (state.revents & POLLHUP) != 0;
   }));
+}
+
+/// Makes the kernel answer the thread that has no room for what it wants to send.
+bool takeBuffersFromThisThread() {
+  std::array<sock_filter, 4> steps = {{
+      BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+      BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_sendmsg, 0, 1),
+      BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | ENOBUFS),
+      BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW),
+  }};
+  const sock_fprog program{steps.size(), steps.data()};
+  return ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+         ::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) == 0;
+}
+
+class ShortOfBuffers : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    sd_bus_message* call = client.newCall("hold");
+    std::uint64_t serial = 0;  // without it no answer is asked for
+    ASSERT_GE(sd_bus_send(client.bus(), call, &serial), 0);
+    sd_bus_message_unref(call);
+    ASSERT_GE(sd_bus_flush(client.bus()), 0);
+    ASSERT_TRUE(eventually([this] { return server.held() == 1; }));
+  }
+  void takeBuffers() {
+    server.loop.runAndWait([] { ASSERT_TRUE(takeBuffersFromThisThread()); });
+  }
+  void expectEndWithLine() {
+    EXPECT_TRUE(eventually([this] { return server.server().connections() == 0; }));
+    EXPECT_EQ(
+        log.count(kLogProblem, "messages for it cannot be written: No buffer space available"), 1U);
+  }
+
+  const spacekeep::test::LogCapture log;
+  TestServer server;
+  BareClient client{server.path()};
+};
+
+TEST_F(ShortOfBuffers, AnAnswerThatCannotBeWrittenEndsTheConnectionWithALine) {
+  takeBuffers();
+  server.takeHeld().reply({std::string("text")});
+  expectEndWithLine();
+}
+
+TEST_F(ShortOfBuffers, AnAnswerWhoseRestCannotBeWrittenEndsTheConnectionWithALine) {
+  server.takeHeld().reply({std::string(900'000, 'x')});
+  server.loop.runAndWait([] {});
+  takeBuffers();
+  // Reading makes room for it.
+  ASSERT_TRUE(eventually([this] { return sd_bus_process(client.bus(), nullptr) < 0; }));
+  expectEndWithLine();
 }
 
 }  // namespace

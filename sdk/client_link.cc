@@ -55,13 +55,13 @@ struct ClientLink::Shared {
     if (tell) options.on_disconnect();
   }
 
-  /// Runs `fail` with the error, later if why the connection ended is not known yet: the daemon
-  /// turns a peer away by closing, which looks like any other disconnect until its process is found
-  /// to live. A person needs to hear of the missing right.
-  void explain(Error error, std::function<void(Error)> fail) {
+  /// Runs `fail` with the error, later if the connection has ended and why is not known yet: the
+  /// daemon turns a peer away by closing, which looks like any other disconnect until its process is
+  /// found to live. A person needs to hear of the missing right.
+  void explain(Error error, bool at_end, std::function<void(Error)> fail) {
     {
       const std::scoped_lock lock(mutex);
-      if (error.kind == ErrorKind::kDisconnected && !answered && !closing) {
+      if (error.kind == ErrorKind::kDisconnected && at_end && !answered && !closing) {
         if (!ended) {
           waiting_for_end.emplace_back(
               [this, error = std::move(error), fail = std::move(fail)] { fail(explained(error)); });
@@ -160,10 +160,15 @@ bool ClientLink::connected() const {
 void ClientLink::call(const std::string& member, ipc::Arguments arguments, Deadline deadline,
                       EndHandler on_end) {
   const auto call = std::make_shared<Call>(shared_, std::move(on_end));
-  const auto proxy =
-      connection_->remoteProxy([call, member, shared = shared_](const ipc::Error& e) {
-        shared->explain(failureOf(e, member), [call](Error error) { call->end(std::move(error)); });
-      });
+  const auto on_error = [call, member, shared = shared_,
+                         weak = std::weak_ptr(connection_)](const ipc::Error& e) {
+    // An answer of the daemon's may be called what it likes: the connection goes on.
+    const auto connection = weak.lock();
+    const bool at_end = connection == nullptr || connection->ended();
+    shared->explain(failureOf(e, member), at_end,
+                    [call](Error error) { call->end(std::move(error)); });
+  };
+  const auto proxy = connection_->remoteProxy(on_error);
   proxy->call(member, std::move(arguments), [call, shared = shared_](ipc::Arguments out) {
     shared->noteAnswer();
     call->end(std::move(out));

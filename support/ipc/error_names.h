@@ -8,6 +8,7 @@ namespace spacekeep::ipc {
 
 inline constexpr const char* kErrorAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";
 inline constexpr const char* kErrorDisconnected = "org.freedesktop.DBus.Error.Disconnected";
+inline constexpr const char* kErrorFailed = "org.freedesktop.DBus.Error.Failed";
 inline constexpr const char* kErrorInconsistentMessage =
     "org.freedesktop.DBus.Error.InconsistentMessage";
 inline constexpr const char* kErrorInvalidArgs = "org.freedesktop.DBus.Error.InvalidArgs";

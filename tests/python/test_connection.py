@@ -87,6 +87,12 @@ class Calls(unittest.TestCase):
         self.kept[0].reply()
         self.assertEqual(self.call("echo"), [])
 
+    def test_that_cannot_be_sent_fail_at_once_and_the_connection_goes_on(self):
+        for values in (("x" * (2 << 20),), ({"a": object()},)):
+            with self.assertRaises(ValueError):
+                self.call("echo", *values, signature="s" if isinstance(values[0], str) else "a{sv}")
+        self.assertEqual(self.call("echo"), [])
+
     def test_end_with_the_connection(self):
         failure = []
 

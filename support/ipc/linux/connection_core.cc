@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "support/ipc/error_names.h"
+#include "support/ipc/linux/owned_message.h"
 #include "support/ipc/linux/wire_reader.h"
 #include "support/ipc/linux/wire_writer.h"
 #include "support/logging/log.h"
@@ -154,10 +155,10 @@ void ConnectionCore::transmit(Call call) {
     waiting_.push_back(std::move(call));
     return;
   }
-  const std::string problem = send(call);
-  if (problem.empty()) return;
+  Error problem = send(call);
+  if (problem.name.empty()) return;
   forgetOne();
-  fail(std::move(call), {kErrorDisconnected, problem});
+  fail(std::move(call), std::move(problem));
 }
 
 /// A peer takes no more than this side would, and ends the connection of whoever sends it: what one
@@ -170,30 +171,31 @@ std::string ConnectionCore::sizeProblem(const Call& call, std::size_t bytes) con
          std::to_string(limits_.message_bytes) + " at most";
 }
 
-/// Answers what went wrong; `call` then is as it was.
-std::string ConnectionCore::send(Call& call) {
-  if (link_.ended()) return "the connection has ended";
-  sd_bus_message* message = nullptr;
-  if (sd_bus_message_new_method_call(link_.bus(), &message, nullptr, kObjectPath,
+/// Answers what went wrong, with an empty name when it was sent; `call` else is as it was. Only the
+/// end of the connection is called a disconnect, since nothing else makes a caller connect anew.
+Error ConnectionCore::send(Call& call) {
+  if (link_.ended()) return {kErrorDisconnected, "the connection has ended"};
+  sd_bus_message* made = nullptr;
+  if (sd_bus_message_new_method_call(link_.bus(), &made, nullptr, kObjectPath,
                                      std::string(call.interface->name).c_str(),
                                      std::string(call.method->name).c_str()) < 0) {
-    return "the message cannot be made";
+    return {kErrorFailed, "the message cannot be made"};
   }
-  WireWriter writer(message);
-  std::string problem = "the arguments do not fit into a message";
-  if (writer.write(call.method->in, call.arguments)) {
-    problem = sizeProblem(call, writer.bytes());
+  const OwnedMessage message(made);
+  WireWriter writer(message.get());
+  if (!writer.write(call.method->in, call.arguments)) {
+    return {kErrorInvalidArgs, "the arguments do not fit into a message"};
   }
-  if (problem.empty()) {
-    if (const auto serial = link_.send(message, writer.bytes())) {
-      call.arguments.clear();
-      pending_.emplace(*serial, std::move(call));
-    } else {
-      problem = "the message cannot be sent";
-    }
+  if (std::string problem = sizeProblem(call, writer.bytes()); !problem.empty()) {
+    return {kErrorInvalidArgs, std::move(problem)};
   }
-  sd_bus_message_unref(message);
-  return problem;
+  const auto serial = link_.send(message.get(), writer.bytes());
+  if (!serial) {
+    return {link_.ended() ? kErrorDisconnected : kErrorFailed, "the message cannot be sent"};
+  }
+  call.arguments.clear();
+  pending_.emplace(*serial, std::move(call));
+  return {};
 }
 
 void ConnectionCore::linkReady() {

@@ -64,7 +64,7 @@ class ConnectionCore final : public BusLink::Owner,
   // IPC thread.
   void start(std::deque<Call> held);
   void transmit(Call call);
-  std::string send(Call& call);
+  Error send(Call& call);
   [[nodiscard]] std::string sizeProblem(const Call& call, std::size_t bytes) const;
   void answered(sd_bus_message* message, Call call);
   void refuse(sd_bus_message* request);

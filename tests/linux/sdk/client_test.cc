@@ -295,6 +295,38 @@ TEST_F(ClientTest, ADaemonThatTurnsThePeerAwayIsToldFromOneThatIsGone) {
   EXPECT_THAT(reply.error->text, HasSubstr("\"CLIENT_ENTITLEMENT\""));
 }
 
+TEST_F(ClientTest, ARequestThatCannotBeSentFailsAtOnceAndTheConnectionGoesOn) {
+  daemon_.on("clientSetState",
+             [](const ipc::Arguments&, const ipc::Responder& responder) { responder.reply({}); });
+  const auto running = daemon_.run();
+  Client client = connect();
+  Value deep = 1;
+  for (int level = 0; level < 40; ++level) deep = Array{deep};
+  const Value large = std::string(2 * 1024 * 1024, 'x');
+  // Before anything was answered, and afterwards.
+  for (int i = 0; i < 2; ++i) {
+    for (const Value& value : {large, deep}) {
+      const Status status = client.setState("key", value, milliseconds(20'000));
+      ASSERT_TRUE(status.error);
+      EXPECT_EQ(status.error->kind, ErrorKind::kInvalidArgument) << status.error->text;
+    }
+    EXPECT_TRUE(client.setState("key", Value(1)).ok());
+  }
+  EXPECT_TRUE(client.connected());
+}
+
+TEST_F(ClientTest, AnErrorOfTheDaemonsThatIsCalledLikeADisconnectIsToldAtOnce) {
+  daemon_.on("clientPurge", [](const ipc::Arguments&, const ipc::Responder& responder) {
+    responder.fail({"org.freedesktop.DBus.Error.NoReply", "in words"});
+  });
+  const auto running = daemon_.run();
+  Client client = connect();
+  const Reply reply = client.purge({}, milliseconds(20'000));
+  ASSERT_TRUE(reply.error);
+  EXPECT_THAT(reply.error->text, HasSubstr("in words"));
+  EXPECT_TRUE(client.connected());
+}
+
 TEST_F(ClientTest, DestroyingAClientEndsItsPendingCallsAndDoesNotReportADisconnect) {
   std::atomic<bool> arrived = false;
   rt::Guarded<ipc::Responder> held;

@@ -53,6 +53,7 @@ Result<ipc::SharedDescriptor> listeningSocket(const SocketOptions& options) {
   if (options.listening_fd) {
     const int fd = *options.listening_fd;
     if (isListeningUnixStream(fd) && fcntl(fd, F_SETFL, O_NONBLOCK) == 0) {
+      ipc::takeOverListening(fd);
       return std::make_shared<ipc::Descriptor>(fd);
     }
     return Error{ErrorKind::kInvalidArgument,

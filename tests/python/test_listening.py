@@ -2,6 +2,7 @@
 
 import os
 import socket
+import struct
 import tempfile
 import threading
 import time
@@ -27,6 +28,12 @@ class Cache(spacekeep.Service):
 
     def periodic(self, job):
         raise OSError("no disk")
+
+
+def process_at(path):
+    with socket.socket(socket.AF_UNIX, socket.SOCK_STREAM) as plain:
+        plain.connect(path)
+        return struct.unpack("3i", plain.getsockopt(socket.SOL_SOCKET, socket.SO_PEERCRED, 12))[0]
 
 
 class Listening(unittest.TestCase):
@@ -110,6 +117,21 @@ class Listening(unittest.TestCase):
         self.ask(self.connect(), "servicePurgeable", 1, {})
         self.running.join(PATIENCE_SECONDS)
         self.assertFalse(self.running.is_alive())
+
+    def test_who_connects_is_told_that_this_process_serves_and_not_the_one_that_made_the_socket(self):
+        with tempfile.TemporaryDirectory() as folder:
+            path = os.path.join(folder, "service")
+            with socket.create_server(path, family=socket.AF_UNIX) as handed_over:
+                other = os.fork()
+                if other == 0:
+                    handed_over.listen(1)
+                    os._exit(0)
+                os.waitpid(other, 0)
+                self.assertEqual(process_at(path), other)
+                host = spacekeep.ListeningHost(Cache(), listening=handed_over)
+                self.assertEqual(process_at(path), os.getpid())
+                host.stop()
+                host.run()
 
     def test_without_a_socket_it_says_how_to_get_one(self):
         with self.assertRaisesRegex(RuntimeError, "systemd-socket-activate"):

@@ -23,12 +23,19 @@ def handed_over_socket():
     return socket.socket(fileno=_FIRST_DESCRIPTOR)
 
 
+def take_over(listening):
+    """Who connects is told by the kernel that the process which listened last is at the other end: that
+    shall be this one, and not the service manager."""
+    listening.listen(socket.SOMAXCONN)
+
+
 class ListeningHost:
     """Serves one service at a listening socket. The daemon, root and the process's own user may call;
     everybody else is cut off, and so is whoever comes when 16 are there."""
 
     def __init__(self, service, *, listening=None, stop_when_idle_seconds=None):
         self._listening = listening if listening is not None else handed_over_socket()
+        take_over(self._listening)
         self._served = Served(service)
         self._stop_when_idle_seconds = stop_when_idle_seconds
         self._waker, self._wake = socket.socketpair()

@@ -22,7 +22,9 @@ class PeerProcess {
   PeerProcess(const PeerProcess&) = delete;
   PeerProcess& operator=(const PeerProcess&) = delete;
 
-  /// Remembers who holds the other end of the connected socket.
+  /// Remembers who holds the other end of the connected socket: who has made the pair, or had
+  /// listened last when it connected. A connection that made the service manager start its peer names
+  /// the manager, or the peer's predecessor; the next one names the peer (takeOverListening).
   void remember(int socket);
   /// Runs `done` once: with true when the process is dead or dying, with false when it lives or was
   /// never known. Within this call wherever proc(5) tells; else after at most `patience_ns`.

@@ -125,8 +125,12 @@ SharedDescriptor listeningSocketFromServiceManager() {
     if (sd_is_socket_unix(fd, SOCK_STREAM, 1, nullptr, 0) <= 0) continue;
     if (found == nullptr) found = std::make_shared<Descriptor>(fd);
   }
+  if (found != nullptr) takeOverListening(found->fd());
   return found;
 }
+
+// It goes on listening when this fails. The backlog cannot be read, so it becomes the largest.
+void takeOverListening(int fd) { static_cast<void>(::listen(fd, SOMAXCONN)); }
 
 SharedDescriptor connectSocket(const std::string& path, std::string& why) {
   const auto address = addressOf(path);

@@ -18,8 +18,14 @@ namespace spacekeep::ipc {
                                                    std::string& why);
 
 /// The listening socket that the service manager passed (sd_listen_fds(3)), null when there is
-/// none.
+/// none. Taken over.
 [[nodiscard]] SharedDescriptor listeningSocketFromServiceManager();
+
+/// For a listening socket that another process has made. Who connects is told by the kernel that the
+/// process which has called listen(2) last is at the other end (unix(7), SO_PEERCRED), and so would
+/// look at whether that one lives, not at whether this one does. Those that have connected already
+/// go on as they are.
+void takeOverListening(int fd);
 
 /// A connected, non-blocking socket. Null on failure, with the reason in `why`. Never waits: a full
 /// backlog is a failure.

@@ -2,6 +2,7 @@
 #include <gmock/gmock.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <spacekeep/service.h>
 #include <spawn.h>
 #include <sys/socket.h>
@@ -222,6 +223,45 @@ TEST_F(SocketTest, AProcessStartedWithAHandedOverSocketServesAtItAndEndsWhenIdle
   EXPECT_GT(read(output[0], text, sizeof text - 1), 0);
   EXPECT_STREQ(text, "stopped\n");
   close(output[0]);
+}
+
+/// Who is at the other end of a new connection, as the kernel tells it.
+pid_t whoServes(const std::string& path) {
+  std::string why;
+  const auto connected = ipc::connectSocket(path, why);
+  EXPECT_NE(connected, nullptr) << why;
+  ucred peer = {};
+  socklen_t size = sizeof peer;
+  EXPECT_EQ(getsockopt(connected->fd(), SOL_SOCKET, SO_PEERCRED, &peer, &size), 0);
+  return peer.pid;
+}
+
+TEST_F(SocketTest, WhoConnectsIsToldTheProcessThatServesAndNotTheOneThatMadeTheSocket) {
+  const auto listening = listen();
+  EXPECT_EQ(whoServes(directory_.serviceSocket()), getpid());
+  int output[2];
+  ASSERT_EQ(pipe2(output, O_CLOEXEC), 0);
+  const pid_t child = startActivated(listening->fd(), output[1], "60000");
+  ASSERT_GT(child, 0);
+  EXPECT_EQ(purgeThroughSocket(99), 99U);
+  EXPECT_EQ(whoServes(directory_.serviceSocket()), child);
+  kill(child, SIGKILL);
+  ASSERT_EQ(waitpid(child, nullptr, 0), child);
+  close(output[0]);
+  close(output[1]);
+}
+
+TEST_F(SocketTest, WhoConnectsToAGivenSocketIsToldTheProcessThatServes) {
+  const auto listening = listen();
+  const pid_t before = fork();
+  if (before == 0) _exit(::listen(listening->fd(), 1));
+  ASSERT_EQ(waitpid(before, nullptr, 0), before);
+  EXPECT_EQ(whoServes(directory_.serviceSocket()), before);
+  SocketOptions options;
+  options.listening_fd = dup(listening->fd());
+  auto host = ServiceHost::serveSocket(std::make_shared<TestService>(), options);
+  ASSERT_TRUE(host) << host.error().text;
+  EXPECT_EQ(whoServes(directory_.serviceSocket()), getpid());
 }
 
 struct PeerCase {

@@ -33,8 +33,8 @@ struct ServerLimits {
   std::size_t queued_messages = 256;           ///< per connection, not yet taken by the peer
   std::size_t queued_bytes = 4 * 1024 * 1024;  ///< per connection, estimated
   UserTurnLimits turns;
-  UserTurnLimits
-      lanes;  ///< purges, queries and cancels of one user, those that are served included
+  /// Of one user: purges, queries, cancels and what brings a descriptor, until they are answered.
+  UserTurnLimits lanes;
   UserShareLimits shares;
   std::uint64_t accept_pause_ns = 1'000'000'000;  ///< after running out of descriptors
 };

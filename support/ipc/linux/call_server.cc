@@ -112,14 +112,8 @@ void CallServer::serve(sd_bus_message* call, const MethodDescription& method, st
   const auto served =
       std::find_if(methods.begin(), methods.end(),
                    [&method](const auto& candidate) { return candidate.name == method.name; });
-  const std::size_t weight = bytes + (passesDescriptor(method) ? kDescriptorWeight : 0);
   std::string why;
-  std::shared_ptr<void> room;
-  if (served->mode == ServeMode::kLane) {
-    room = context_->lane_budget->take(identity().uid(), weight, why);
-  } else {
-    why = context_->turns.refusal(identity().uid(), weight);
-  }
+  auto room = roomFor(*served, method, bytes, why);
   if (!why.empty()) {
     refuse(call, kErrorLimitsExceeded, why);
     return;
@@ -131,15 +125,28 @@ void CallServer::serve(sd_bus_message* call, const MethodDescription& method, st
   context_->pace.spendOnCall(identity().uid(), is_long);
   auto open = std::make_shared<OpenCall>(
       context_, weak_from_this(), method, serial, sd_bus_message_get_expect_reply(call) > 0,
-      served->turn_per_user ? std::optional(identity().uid()) : std::nullopt);
-  run(*served, weight,
+      served->turn_per_user ? std::optional(identity().uid()) : std::nullopt, std::move(room));
+  run(*served, bytes,
       [context = context_, peer = peer_, served = &*served, open = std::move(open),
-       room = std::move(room), arguments = std::move(*arguments)]() mutable {
+       arguments = std::move(*arguments)]() mutable {
         const GatePass pass(context->gate);
         if (!pass.inside()) return;
         const ServingScope scope(peer.get());
         served->serve(std::move(arguments), OpenCall::responderFor(std::exchange(open, nullptr)));
       });
+}
+
+/// Calls that wait in a lane, or with a descriptor for whoever serves them, outlive the connection
+/// over which they came. Others are few at a time by their turn.
+std::shared_ptr<void> CallServer::roomFor(const ServedMethod& served,
+                                          const MethodDescription& method, std::size_t bytes,
+                                          std::string& why) {
+  const bool is_in_lane = served.mode == ServeMode::kLane;
+  if (!is_in_lane) why = context_->turns.refusal(identity().uid(), bytes);
+  const bool brings_descriptor = passesDescriptor(method);
+  if (!why.empty() || !(is_in_lane || brings_descriptor)) return nullptr;
+  const std::size_t weight = bytes + (brings_descriptor ? kDescriptorWeight : 0);
+  return context_->lane_budget->take(identity().uid(), weight, why);
 }
 
 void CallServer::run(const ServedMethod& method, std::size_t bytes, Task task) {

@@ -61,6 +61,10 @@ class CallServer : public std::enable_shared_from_this<CallServer> {
   void dispatchServed(sd_bus_message* call, const InterfaceDescription& interface,
                       const std::string& member, std::size_t bytes);
   void serve(sd_bus_message* call, const MethodDescription& method, std::size_t bytes);
+  /// What the call takes up until it is gone, null when that is not counted; also null, with the
+  /// reason in `why`, when the call has to be refused.
+  std::shared_ptr<void> roomFor(const ServedMethod& served, const MethodDescription& method,
+                                std::size_t bytes, std::string& why);
   void run(const ServedMethod& method, std::size_t bytes, Task task);
   void schedule(const ServedMethod& method, Task task);
   void sendText(sd_bus_message* call, const std::string& text);

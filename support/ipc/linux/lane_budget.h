@@ -1,8 +1,8 @@
 // Thread safety: every member may be called from any thread.
 //
-// What the calls of one user that wait in lanes, or are served there, may hold. They outlive the
-// connection over which they came, so the limit of calls per connection bounds nothing for a user
-// who comes and goes.
+// What the calls of one user that wait in lanes or are served there, and those that bring a
+// descriptor, may hold until they are answered. They outlive the connection over which they came, so
+// the limit of calls per connection bounds nothing for a user who comes and goes.
 #pragma once
 
 #include <sys/types.h>

@@ -6,13 +6,14 @@ namespace spacekeep::ipc {
 
 OpenCall::OpenCall(std::shared_ptr<ServerContext> context, std::weak_ptr<CallServer> connection,
                    const MethodDescription& method, std::uint64_t serial, bool wants_answer,
-                   std::optional<uid_t> turn_of)
+                   std::optional<uid_t> turn_of, std::shared_ptr<void> room)
     : context_(std::move(context)),
       connection_(std::move(connection)),
       method_(method),
       serial_(serial),
       wants_answer_(wants_answer),
-      turn_of_(turn_of) {}
+      turn_of_(turn_of),
+      room_(std::move(room)) {}
 
 OpenCall::~OpenCall() {
   finish([](CallServer&) {});

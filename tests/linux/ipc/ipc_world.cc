@@ -25,6 +25,7 @@ const InterfaceDescription& testInterface() {
       "com.quorvel.IpcTest",
       {{"echo", all, all},
        {"takeDescriptor", {{"endpoint", kDescriptor}, {"text", kString}}, {{"text", kString}}},
+       {"holdDescriptor", {{"endpoint", kDescriptor}}, {}},
        {"number", {{"number", kInt32}}, {{"number", kInt32}}},
        {"hold", {}, {{"text", kString}}},
        {"block", {}, {}},
@@ -154,10 +155,12 @@ ServedInterface TestServer::interface() {
   });
   served.methods.push_back(number);
   served.methods.push_back(briefly(number, "numberBriefly"));
-  served.methods.push_back(method("hold", [this](const Arguments&, Responder responder) {
-    const std::scoped_lock lock(mutex_);
-    held_.push_back(std::move(responder));
-  }));
+  for (const std::string_view name : {"hold", "holdDescriptor"}) {
+    served.methods.push_back(method(name, [this](const Arguments&, Responder responder) {
+      const std::scoped_lock lock(mutex_);
+      held_.push_back(std::move(responder));
+    }));
+  }
   auto block = method("block", [this](const Arguments&, const Responder& responder) {
     const std::size_t now = ++blocked_;
     std::size_t most = most_blocked_;

@@ -31,9 +31,9 @@ namespace spacekeep::ipc::test {
 inline constexpr std::uint64_t kLongNs = 30'000'000'000;  // only ever waited for by a failing test
 
 /// echo: one argument of each kind but the descriptor, answered as they came. takeDescriptor: an
-/// endpoint and a text. number: in order, answers its argument. hold: keeps the responder.
-/// block: in a lane of width 2, waits until released. numberBriefly, blockBriefly: the same, brief.
-/// forget: drops the responder. whoAmI: the uid. aside: a method of another interface.
+/// endpoint and a text. number: in order, answers its argument. hold, holdDescriptor: keep the
+/// responder. block: in a lane of width 2, waits until released. numberBriefly, blockBriefly: the
+/// same, brief. forget: drops the responder. whoAmI: the uid. aside: a method of another interface.
 [[nodiscard]] const InterfaceDescription& testInterface();
 
 /// True once `condition` holds; gives up after kLongNs.

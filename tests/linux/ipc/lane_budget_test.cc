@@ -32,12 +32,15 @@ TEST(LaneBudget, HoldsExactlySoManyBytes) {
   EXPECT_EQ(budget->take(kUser, 101, why), nullptr);
 }
 
-TEST(LaneBudget, ARoomMayOutliveTheBudget) {
+TEST(LaneBudget, LivesAsLongAsARoomOfIt) {
   auto budget = std::make_shared<LaneBudget>(UserTurnLimits{1, 100});
+  const std::weak_ptr<LaneBudget> watched = budget;
   std::string why;
   auto room = budget->take(kUser, 60, why);
   budget = nullptr;
+  EXPECT_FALSE(watched.expired());
   room = nullptr;
+  EXPECT_TRUE(watched.expired());
 }
 
 TEST(CallsInALane, OfAUserWhoComesAndGoesAreBounded) {
@@ -61,6 +64,60 @@ TEST(CallsInALane, OfAUserWhoComesAndGoesAreBounded) {
   EXPECT_TRUE(eventually([&] { return server.blocked() == 0; }));
   server.releaseBlocked(1);
   EXPECT_TRUE(eventually([&] { return callAndWait(connection, "block", {}).reply.has_value(); }));
+}
+
+TEST(CallsInALane, OfAUserAreBoundedByTheirBytes) {
+  ServerOptions options = TestServer::defaultOptions();
+  options.limits.lanes.waiting_bytes = 16;  // less than any message has
+  TestServer server(options);
+  const Outcome refused = callAndWait(server.connect(), "block", {});
+  ASSERT_TRUE(refused.error);
+  EXPECT_EQ(refused.error->name, "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_EQ(server.blocked(), 0U);
+}
+
+class CallsThatBringADescriptor : public ::testing::Test {
+ protected:
+  static constexpr std::size_t kMost = 5;
+
+  /// Room for kMost of them, by their descriptors alone.
+  static ServerOptions options() {
+    ServerOptions options = TestServer::defaultOptions();
+    options.limits.lanes.waiting_bytes = (kMost + 1) * 16 * 1024 - 1;
+    return options;
+  }
+  /// One that is not answered, over a connection that is gone when it waits.
+  void leaveOne() {
+    const std::size_t before = server.held();
+    const auto connection = server.connect();
+    calls.emplace_back(connection, "holdDescriptor", Arguments{makeSocketPair().first});
+    ASSERT_TRUE(eventually([&] { return server.held() == before + 1; }));
+    connection->invalidate();
+  }
+  std::string errorOfOneMore() {
+    const auto outcome =
+        callAndWait(server.connect(), "holdDescriptor", Arguments{makeSocketPair().first});
+    return outcome.error ? outcome.error->name : "";
+  }
+
+  TestServer server{options()};
+  std::vector<PendingCall> calls;
+};
+
+TEST_F(CallsThatBringADescriptor, OfAUserWhoComesAndGoesAreBounded) {
+  for (std::size_t i = 0; i < kMost; ++i) leaveOne();
+  EXPECT_EQ(errorOfOneMore(), "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_EQ(server.held(), kMost);
+  EXPECT_TRUE(callAndWait(server.connect(), "number", {std::int32_t{9}}).reply);
+}
+
+TEST_F(CallsThatBringADescriptor, MakeRoomForOthersWhenTheyAreAnsweredOrDropped) {
+  for (std::size_t i = 0; i < kMost; ++i) leaveOne();
+  static_cast<void>(server.takeHeld());
+  leaveOne();
+  server.takeHeld().reply({});
+  leaveOne();
+  EXPECT_EQ(errorOfOneMore(), "org.freedesktop.DBus.Error.LimitsExceeded");
 }
 
 }  // namespace

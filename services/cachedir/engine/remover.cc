@@ -56,7 +56,9 @@ std::optional<Left> Remover::objection(int fd, const Candidate& candidate,
       usedNs(facts) > candidate.turn.used_ns) {
     return Left::kUsedSince;
   }
-  if (facts.st_nlink != candidate.others.size() + 1) return Left::kLinked;
+  if (!settings_.single_names && facts.st_nlink != candidate.others.size() + 1) {
+    return Left::kLinked;
+  }
   return std::nullopt;
 }
 

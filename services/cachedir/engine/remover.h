@@ -27,6 +27,8 @@ class Remover {
     bool dry_run = false;
     /// Whether a file that gives nothing back goes as well (the daily pass tidies up).
     bool take_empty = false;
+    /// Whether names go although the file has others that are not known.
+    bool single_names = false;
   };
 
   /// All must outlive this.

@@ -124,39 +124,56 @@ class Check {
   Checked result() {
     if (opened_.roots.empty() || !open_files_.ensure(opened_.roots, kScanKeptNs, cancel_))
       return {};
-    cachedir::Remover remover(opened_.roots, open_files_, {.dry_run = true, .take_empty = true});
-    Checked checked{.all = true};
-    const std::vector<cachedir::Candidate> files = candidates();
+    const Found found = find();
     if (!whole_ || youngest_ns_ > latest_ns_) return {};
-    for (const cachedir::Candidate& candidate : files) {
-      if (cancel_.cancelled()) return {};
-      const auto outcome = remover.take(candidate, cancel_);
-      const auto* removal = std::get_if<cachedir::Removal>(&outcome);
-      if (removal == nullptr) return {};
-      checked.bytes += removal->bytes;
-    }
+    // Whoever has a file may have opened it by a name elsewhere.
+    if (!bytesOf(found.names, true)) return {};
+    const std::optional<std::uint64_t> bytes = bytesOf(found.files, false);
+    if (!bytes) return {};
     // Last: who stands in it could make new files while the others were looked at.
     if (isLivedIn(opened_.roots.front(), placesLivedIn())) return {};
-    return checked;
+    return {.all = true, .bytes = *bytes};
   }
 
  private:
-  /// Files of which a name is elsewhere are not among them: only a name of theirs goes.
-  std::vector<cachedir::Candidate> candidates() {
-    std::vector<cachedir::Candidate> found;
+  struct Found {
+    std::vector<cachedir::Candidate> files;  // with all their names
+    std::vector<cachedir::Candidate> names;  // of files that may have others elsewhere
+  };
+
+  Found find() {
+    Found found;
     cachedir::LinkGroups groups;
     cachedir::Tally tally;
     const auto visit = [&](const cachedir::FoundFile& file) {
       youngest_ns_ = std::max(youngest_ns_, file.used_ns);
       if (file.links == 1) {
-        found.push_back(cachedir::candidateOf(file, 0));
+        found.files.push_back(cachedir::candidateOf(file, 0));
       } else if (auto group = groups.offer(file, 0)) {
-        found.push_back(std::move(*group));
+        found.files.push_back(std::move(*group));
+      } else {
+        found.names.push_back(cachedir::candidateOf(file, 0));
       }
     };
     whole_ = cachedir::TreeWalk(opened_.roots).forEachFile(visit, cancel_, tally) &&
              std::ranges::all_of(tally.counts, [](std::uint64_t count) { return count == 0; });
     return found;
+  }
+
+  /// What would come back; none when one of them is in use.
+  std::optional<std::uint64_t> bytesOf(const std::vector<cachedir::Candidate>& candidates,
+                                       bool single_names) {
+    cachedir::Remover remover(opened_.roots, open_files_,
+                              {.dry_run = true, .take_empty = true, .single_names = single_names});
+    std::uint64_t bytes = 0;
+    for (const cachedir::Candidate& candidate : candidates) {
+      if (cancel_.cancelled()) return std::nullopt;
+      const auto outcome = remover.take(candidate, cancel_);
+      const auto* removal = std::get_if<cachedir::Removal>(&outcome);
+      if (removal == nullptr) return std::nullopt;
+      bytes += removal->bytes;
+    }
+    return bytes;
   }
 
   const std::int64_t latest_ns_;

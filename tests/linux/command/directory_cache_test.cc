@@ -6,6 +6,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "services/cachedir/engine/link_groups.h"
 #include "services/command/engine/directory_cache.h"
 #include "services/command/engine/in_use.h"
 #include "services/command/engine/whole_directories.h"
@@ -232,6 +233,27 @@ TEST_F(WholeDirectories, OneThatAProcessEntersWhileAnotherGoesIsKept) {
   const auto enter = [this] { return ::chdir((volume_ / "all/older").c_str()) == 0; };
   EXPECT_THAT(goneWhile(2, [&] { holder.emplace(enter); }), ElementsAre(volume_ / "all/oldest/"));
   EXPECT_TRUE(exists(volume_ / "all/older/f"));
+}
+
+TEST_F(WholeDirectories, OneOfWhichALinkedFileIsOpenedElsewhereWhileAnotherGoesIsKept) {
+  ASSERT_EQ(::link((volume_ / "all/older/f").c_str(), (volume_ / "elsewhere").c_str()), 0);
+  writeFile(volume_ / "all/older/g", kMiB, 220);
+  std::optional<cachedir::Holder> holder;
+  const auto open = [this] { return ::open((volume_ / "elsewhere").c_str(), O_RDONLY) >= 0; };
+  EXPECT_THAT(goneWhile(2, [&] { holder.emplace(open); }), ElementsAre(volume_ / "all/oldest/"));
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+}
+
+TEST_F(WholeDirectories, OneOfWhichAFileWithMoreNamesThanAreFollowedIsOpenedMeanwhileIsKept) {
+  writeFile(volume_ / "all/older/g", kMiB, 220);
+  const std::string file = volume_ / "all/older/f";
+  for (std::uint64_t i = 0; i < cachedir::kMaxLinksOfAFile; ++i) {
+    ASSERT_EQ(::link(file.c_str(), (file + std::to_string(i)).c_str()), 0);
+  }
+  std::optional<cachedir::Holder> holder;
+  const auto open = [&file] { return ::open(file.c_str(), O_RDONLY) >= 0; };
+  EXPECT_THAT(goneWhile(2, [&] { holder.emplace(open); }), ElementsAre(volume_ / "all/oldest/"));
+  EXPECT_TRUE(exists(file));
 }
 
 TEST_F(WholeDirectories, OneInWhichSomethingIsMountedWhileAnotherGoesIsKept) {

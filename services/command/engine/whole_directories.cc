@@ -57,15 +57,14 @@ Unit look(const std::vector<Root>& roots, std::size_t index, const cachedir::Ope
   return unit;
 }
 
-/// Where processes stand and something is mounted.
-std::set<std::string> placesLivedIn() {
-  std::set<std::string> places = mountPoints();
-  places.merge(workingDirectories());
-  return places;
-}
+/// What others have to do with directories, whatever their files tell.
+struct Others {
+  std::set<std::string> mounts = mountPoints();
+  std::set<cachedir::Inode> held = heldDirectories();
+};
 
-bool isLivedIn(const Root& root, const std::set<std::string>& places) {
-  return isAnyWithin(places, root.rule->path) || hasMeetingPoint(root.fd.get());
+bool isLivedIn(const Root& root, const Others& others) {
+  return isAnyWithin(others.mounts, root.rule->path) || hasSignOfLife(root.fd.get(), others.held);
 }
 
 /// All that could go, with what they were found by.
@@ -83,10 +82,10 @@ Units unitsOf(const cachedir::Rules& rules, const std::optional<std::string>& vo
   cachedir::OpenFiles open_files;
   const auto& roots = found.opened.roots;
   if (roots.empty() || !open_files.scan(roots, cancel)) return found;
-  const std::set<std::string> places = placesLivedIn();
+  const Others others;
   for (std::size_t i = 0; i < roots.size() && !cancel.cancelled(); ++i) {
     Unit unit = look(roots, i, open_files, cancel);
-    if (unit.bytes == 0 || !unit.whole || unit.in_use || isLivedIn(roots[i], places)) continue;
+    if (unit.bytes == 0 || !unit.whole || unit.in_use || isLivedIn(roots[i], others)) continue;
     found.units.push_back(unit);
   }
   return found;
@@ -131,7 +130,7 @@ class Check {
     const std::optional<std::uint64_t> bytes = bytesOf(found.files, false);
     if (!bytes) return {};
     // Last: who stands in it could make new files while the others were looked at.
-    if (isLivedIn(opened_.roots.front(), placesLivedIn())) return {};
+    if (isLivedIn(opened_.roots.front(), Others())) return {};
     return {.all = true, .bytes = *bytes};
   }
 

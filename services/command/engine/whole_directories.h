@@ -3,7 +3,7 @@
 //
 // Directories that go as a whole or not at all, because a program that finds half of one would take
 // it for all. A directory is as young as the youngest file in it. It is in use when any file in it is,
-// when a process stands in it, and when a socket or a pipe is there.
+// when a process stands in it or has a directory of it open, and when a socket or a pipe is there.
 // It is renamed before anything in it goes, so nobody ever sees a part; one that turns out to be in
 // use after all gets its name back.
 #pragma once

@@ -2,7 +2,9 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sched.h>
 #include <sys/file.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -215,6 +217,33 @@ TEST_F(WholeDirectories, OneInWhichAProcessStandsIsKept) {
   EXPECT_TRUE(exists(volume_ / "all/oldest/g"));
 }
 
+TEST_F(WholeDirectories, OneOfWhichAProcessHasADirectoryOpenIsKept) {
+  for (const int flags : {O_RDONLY, O_PATH}) {
+    const cachedir::Holder holder([this, flags] {
+      return ::open((volume_ / "all/oldest/deep").c_str(), flags | O_DIRECTORY) >= 0;
+    });
+    EXPECT_THAT(offered(*cache()), ElementsAre(kMiB, kMiB, 3 * kMiB, 3 * kMiB));
+    Request request = this->request(2);
+    request.dry_run = true;
+    EXPECT_THAT(freeFrom(*cache(), request).what, ElementsAre(volume_ / "all/older/"));
+  }
+}
+
+TEST_F(WholeDirectories, OneThatAProcessKnowsByAnotherPathOrTakesForTheRootIsKept) {
+  const std::string elsewhere = temporaryDirectory();
+  const std::string oldest = volume_ / "all/oldest";
+  const cachedir::Holder stands_in_it([&] {
+    return ::unshare(CLONE_NEWNS) == 0 &&
+           ::mount(oldest.c_str(), elsewhere.c_str(), nullptr, MS_BIND, nullptr) == 0 &&
+           ::chdir(elsewhere.c_str()) == 0;
+  });
+  const cachedir::Holder takes_it_for_the_root(
+      [this] { return ::chroot((volume_ / "all/older").c_str()) == 0; });
+  EXPECT_EQ(freeAsForetold(*cache(), request(2)).result.bytes, 0U);
+  EXPECT_TRUE(exists(volume_ / "all/oldest/g"));
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+}
+
 TEST_F(WholeDirectories, OneThatGetsAFileWhileAnotherGoesIsKeptAtAnyUrgency) {
   EXPECT_THAT(goneWhile(4, [this] { writeFile(volume_ / "all/older/new", 4096, 0); }),
               ElementsAre(volume_ / "all/oldest/", volume_ / "all/mixed/"));
@@ -232,6 +261,13 @@ TEST_F(WholeDirectories, OneThatAProcessEntersWhileAnotherGoesIsKept) {
   std::optional<cachedir::Holder> holder;
   const auto enter = [this] { return ::chdir((volume_ / "all/older").c_str()) == 0; };
   EXPECT_THAT(goneWhile(2, [&] { holder.emplace(enter); }), ElementsAre(volume_ / "all/oldest/"));
+  EXPECT_TRUE(exists(volume_ / "all/older/f"));
+}
+
+TEST_F(WholeDirectories, OneThatAProcessOpensWhileAnotherGoesIsKept) {
+  std::optional<cachedir::Holder> holder;
+  const auto open = [this] { return ::open((volume_ / "all/older").c_str(), O_DIRECTORY) >= 0; };
+  EXPECT_THAT(goneWhile(2, [&] { holder.emplace(open); }), ElementsAre(volume_ / "all/oldest/"));
   EXPECT_TRUE(exists(volume_ / "all/older/f"));
 }
 
@@ -273,6 +309,7 @@ TEST_F(WholeDirectories, WhatWasLeftIsKeptWhileItIsInUseAndGetsItsNameBackIfThat
         return ::flock(::open((left + "/f").c_str(), O_RDONLY), LOCK_SH) == 0;
       },
       [](const std::string& left) { return ::chdir(left.c_str()) == 0; },
+      [](const std::string& left) { return ::open(left.c_str(), O_DIRECTORY) >= 0; },
       [](const std::string& left) { return ::mkfifo((left + "/pipe").c_str(), 0600) == 0; }};
   for (const auto& use : uses) {
     writeFile(leftOf("free") + "/f", kMiB, 1);

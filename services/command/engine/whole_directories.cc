@@ -16,7 +16,7 @@
 #include "services/cachedir/engine/roots.h"
 #include "services/cachedir/engine/space_return.h"
 #include "services/cachedir/engine/tree_walk.h"
-#include "services/command/base/path_patterns.h"
+#include "services/command/engine/left_overs.h"
 #include "services/command/engine/lived_in.h"
 #include "services/command/engine/measure.h"
 #include "services/command/engine/remove_tree.h"
@@ -94,6 +94,20 @@ Units unitsOf(const cachedir::Rules& rules, const std::optional<std::string>& vo
 std::string folderOf(const std::string& path) { return path.substr(0, path.rfind('/')); }
 std::string nameOf(const std::string& path) { return path.substr(path.rfind('/') + 1); }
 
+/// Where directories are renamed and removed. Its path may come to lead elsewhere; the descriptor
+/// does not.
+struct Place {
+  explicit Place(const std::string& folder)
+      : path(folder), fd(cachedir::openDirectoryWithoutLinks(folder.empty() ? "/" : folder)) {}
+
+  [[nodiscard]] bool rename(const std::string& from, const std::string& to) const {
+    return ::renameat2(fd.get(), from.c_str(), fd.get(), to.c_str(), RENAME_NOREPLACE) == 0;
+  }
+
+  std::string path;
+  cachedir::UniqueFd fd;
+};
+
 /// What a directory must be to go.
 struct Terms {
   std::optional<std::string> volume = {};  // a mount point; absent means any
@@ -110,11 +124,16 @@ struct Checked {
 /// What was seen when the directory was chosen may be long ago: all of it is looked at again.
 class Check {
  public:
-  Check(const std::string& path, const Terms& terms, cachedir::OpenFiles& open_files,
-        const CancelToken& cancel)
+  Check(const Place& place, const std::string& name, const Terms& terms,
+        cachedir::OpenFiles& open_files, const CancelToken& cancel)
       : latest_ns_(terms.latest_ns), cancel_(cancel), open_files_(open_files) {
-    rules_.directories.push_back({.path = path});
+    rules_.directories.push_back({.path = place.path + "/" + name});
     opened_ = openRoots(rules_, terms.volume);
+    std::erase_if(opened_.roots, [&](const Root& root) {
+      struct stat facts {};
+      return ::fstatat(place.fd.get(), name.c_str(), &facts, AT_SYMLINK_NOFOLLOW) != 0 ||
+             cachedir::inodeOf(facts) != root.inode;
+    });
   }
 
   /// It is there, and on the volume.
@@ -191,10 +210,6 @@ std::uint64_t occupiedBy(const std::string& path) {
   return measure(opened.roots, CancelToken()).bytes;
 }
 
-bool renameIn(int folder, const std::string& from, const std::string& to) {
-  return ::renameat2(folder, from.c_str(), folder, to.c_str(), RENAME_NOREPLACE) == 0;
-}
-
 /// One request's removing of directories.
 class Removing {
  public:
@@ -208,20 +223,20 @@ class Removing {
     const std::string& path = unit.rule->path;
     const std::string name = nameOf(path);
     const std::string going = kGoingPrefix + name;
-    const std::string going_path = folderOf(path) + "/" + going;
-    const cachedir::UniqueFd folder = cachedir::openDirectoryWithoutLinks(folderOf(path));
-    if (!folder || !renameIn(folder.get(), name, going)) {
+    const Place place(folderOf(path));
+    if (!place.fd || !place.rename(name, going)) {
       problems_.push_back(path + ": cannot be renamed: " + cachedir::errnoText(errno));
       return 0;
     }
     const Terms terms{.latest_ns = unit.used_ns};
-    const Checked checked = Check(going_path, terms, open_files_, cancel_).result();
-    if (checked.all && renameIn(folder.get(), going, kHalfPrefix + name)) {
-      return removeHalf(folder.get(), folderOf(path) + "/" + kHalfPrefix + name, checked.bytes);
+    const Checked checked = Check(place, going, terms, open_files_, cancel_).result();
+    if (checked.all && place.rename(going, kHalfPrefix + name)) {
+      return removeHalf(place, name, checked.bytes);
     }
     if (checked.all) problems_.push_back(path + ": what is left of an earlier one is in the way");
-    if (!renameIn(folder.get(), going, name)) {
-      problems_.push_back(path + ": in use, and made anew meanwhile; the old one is " + going_path);
+    if (!place.rename(going, name)) {
+      problems_.push_back(path + ": in use, and made anew meanwhile; the old one is " + place.path +
+                          "/" + going);
     }
     return 0;
   }
@@ -232,12 +247,11 @@ class Removing {
     for (const auto& rule : rules.directories) folders.insert(folderOf(rule.path));
     std::uint64_t freed = 0;
     for (const std::string& folder : folders) {
-      const cachedir::UniqueFd fd = cachedir::openDirectoryWithoutLinks(folder);
-      for (const char* prefix : {kHalfPrefix, kGoingPrefix}) {
-        for (const std::string& path : matchesOf(folder + "/" + prefix + "*")) {
-          if (!fd || cancel_.cancelled()) return freed;
-          freed += finish(fd.get(), path, prefix);
-        }
+      const Place place(folder);
+      for (const LeftOver& left :
+           place.fd ? leftOversIn(place.fd.get()) : std::vector<LeftOver>()) {
+        if (cancel_.cancelled()) return freed;
+        freed += finish(place, left);
       }
     }
     return freed;
@@ -246,22 +260,25 @@ class Removing {
  private:
   /// Nobody may have looked at it before the crash, or its name had been taken when it was found in
   /// use. No time of use speaks for it, since nobody looks for it there; all else does.
-  std::uint64_t finish(int folder, const std::string& path, std::string_view prefix) {
-    Check check(path, {.volume = volume_}, open_files_, cancel_);
+  std::uint64_t finish(const Place& place, const LeftOver& left) {
+    const std::string now = left.prefix + left.name;
+    Check check(place, now, {.volume = volume_}, open_files_, cancel_);
     if (!check.takesPart()) return 0;
     const Checked checked = check.result();
-    if (prefix == kHalfPrefix) return checked.all ? removeHalf(folder, path, checked.bytes) : 0;
-    const std::string going = nameOf(path);
-    const std::string name = going.substr(prefix.size());
-    if (checked.all && renameIn(folder, going, kHalfPrefix + name)) {
-      return removeHalf(folder, folderOf(path) + "/" + kHalfPrefix + name, checked.bytes);
+    const bool half = left.prefix == kHalfPrefix;
+    if (checked.all && (half || place.rename(now, kHalfPrefix + left.name))) {
+      return removeHalf(place, left.name, checked.bytes);
     }
-    if (!checked.all && !cancel_.cancelled()) static_cast<void>(renameIn(folder, going, name));
+    if (!checked.all && !half && !cancel_.cancelled()) {
+      static_cast<void>(place.rename(now, left.name));
+    }
     return 0;
   }
 
-  std::uint64_t removeHalf(int folder, const std::string& path, std::uint64_t bytes) {
-    if (removeTree(folder, nameOf(path).c_str(), cancel_)) return bytes;
+  std::uint64_t removeHalf(const Place& place, const std::string& name, std::uint64_t bytes) {
+    const std::string half = kHalfPrefix + name;
+    const std::string path = place.path + "/" + half;
+    if (removeTree(place.fd.get(), half.c_str(), cancel_)) return bytes;
     if (!cancel_.cancelled()) problems_.push_back(path + ": not all of it could be removed");
     return bytes - std::min(bytes, occupiedBy(path));
   }
@@ -311,7 +328,8 @@ WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::FreeRequest&
     std::uint64_t bytes = 0;
     if (request.dry_run) {
       const Terms terms{.latest_ns = unit.used_ns};
-      const Checked checked = Check(path, terms, open_files, cancel).result();
+      const Place place(folderOf(path));
+      const Checked checked = Check(place, nameOf(path), terms, open_files, cancel).result();
       bytes = checked.all ? checked.bytes : 0;
     } else {
       bytes = removing.remove(unit);

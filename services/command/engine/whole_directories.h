@@ -17,12 +17,6 @@
 
 namespace spacekeep::command {
 
-/// In front of the name of a directory that is going, while it is looked at for the last time. What
-/// a crash left is looked at again first.
-inline constexpr const char* kGoingPrefix = ".spacekeep-going-";
-/// The same once it has passed: a part of it may be gone, so it never gets its name back.
-inline constexpr const char* kHalfPrefix = ".spacekeep-half-";
-
 /// Each entry of `rules` is one directory, without patterns.
 [[nodiscard]] cachedir::Estimate estimateWhole(const cachedir::Rules& rules,
                                                const std::optional<std::string>& volume,

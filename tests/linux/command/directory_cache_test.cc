@@ -11,7 +11,7 @@
 #include "services/cachedir/engine/link_groups.h"
 #include "services/command/engine/directory_cache.h"
 #include "services/command/engine/in_use.h"
-#include "services/command/engine/whole_directories.h"
+#include "services/command/engine/left_overs.h"
 #include "tests/linux/command/command_world.h"
 
 namespace spacekeep::command {
@@ -377,6 +377,29 @@ TEST_F(WholeDirectories, WhatACrashLeftIsFinishedFirstAndCounts) {
   EXPECT_EQ(went.result.bytes, kMiB);
   EXPECT_FALSE(exists(left));
   EXPECT_TRUE(exists(volume_ / "all/oldest")) << "the rest of the last one was enough";
+}
+
+TEST_F(WholeDirectories, TwoThatWereLeftOfOneNameBothGoAtOnce) {
+  writeFile(leftOf("gone") + "/f", kMiB, 1);
+  writeFile(leftOf("gone", kHalfPrefix) + "/f", kMiB, 1);
+  volume_.settle();
+  EXPECT_EQ(cache()->free(request(1, 2 * kMiB), CancelToken(), {}).bytes, 2 * kMiB);
+  EXPECT_FALSE(exists(leftOf("gone")));
+}
+
+TEST_F(WholeDirectories, WhatWasLeftIsLookedForInTheVeryFoldersWhateverTheirNames) {
+  const std::string left = std::string("/") + kHalfPrefix + "x";
+  for (const char* folder : {"each/a", "each/[ab]", "each/?"}) {
+    writeFile(volume_ / folder + left + "/f", kMiB, 1);
+    writeFile(volume_ / folder + "/present/f", kMiB, 1);
+  }
+  volume_.settle();
+  const auto each = makeCache(
+      ruleFrom(directory(volume_ / "each/*/*", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
+  EXPECT_EQ(each->free(request(1), CancelToken(), {}).bytes, 3 * kMiB);
+  for (const char* folder : {"each/a", "each/[ab]", "each/?"}) {
+    EXPECT_FALSE(exists(volume_ / folder + left));
+  }
 }
 
 TEST_F(WholeDirectories, AFileThatIsLinkedElsewhereGivesNothingAndGoes) {

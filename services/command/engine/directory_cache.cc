@@ -1,26 +1,25 @@
 #include "services/command/engine/directory_cache.h"
 
-#include <unistd.h>
+#include <fcntl.h>
 
 #include <iterator>
 
 #include "services/cachedir/engine/cache_cleaner.h"
 #include "services/command/engine/in_use.h"
+#include "services/command/engine/left_overs.h"
 #include "services/command/engine/measure.h"
+#include "services/command/engine/opt_out.h"
 #include "services/command/engine/tool_cache.h"
 #include "services/command/engine/whole_directories.h"
 
 namespace spacekeep::command {
 namespace {
 
-bool isOptedOut(const std::string& path) {
-  return ::access((path + "/" + kOptOutMarker).c_str(), F_OK) == 0;
-}
-
 /// What the patterns match now, without what its owner keeps.
 cachedir::Rules filesWanted(const DirectoryCaches& caches) {
   cachedir::Rules found = matched(caches.files);
-  std::erase_if(found.directories, [](const auto& rule) { return isOptedOut(rule.path); });
+  std::erase_if(found.directories,
+                [](const auto& rule) { return isOptedOut(AT_FDCWD, rule.path); });
   return found;
 }
 
@@ -28,7 +27,8 @@ cachedir::Rules filesWanted(const DirectoryCaches& caches) {
 cachedir::Rules wholeWanted(const DirectoryCaches& caches) {
   cachedir::Rules found = matched(caches.whole);
   std::erase_if(found.directories, [](const auto& rule) {
-    return isOptedOut(rule.path) || isKept(rule, rule.path.substr(rule.path.rfind('/') + 1));
+    const std::string name = rule.path.substr(rule.path.rfind('/') + 1);
+    return isOptedOut(AT_FDCWD, rule.path) || isKept(rule, name) || isLeftOver(name);
   });
   for (auto& rule : found.directories) rule.keep.clear();
   return found;
@@ -80,7 +80,7 @@ Result CacheOfDirectories::free(const Request& request, const CancelToken& cance
   append(result.problems, std::move(files.problems));
   if (request.periodic || result.bytes >= request.amount || cancel.cancelled()) return result;
   wish.amount -= result.bytes;
-  WholeResult whole = freeWhole(wholeWanted(caches()), wish, cancel, visit);
+  WholeResult whole = freeWhole(wholeWanted(caches()), caches().whole, wish, cancel, visit);
   result.bytes += whole.bytes;
   append(result.problems, std::move(whole.problems));
   return result;

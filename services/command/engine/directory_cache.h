@@ -8,10 +8,6 @@
 
 namespace spacekeep::command {
 
-/// A directory that holds a file of this name is left alone, with everything in it: the owner's
-/// word against any rule. Looked for in each directory that a rule's PATH stands for.
-inline constexpr const char* kOptOutMarker = ".spacekeep-keep";
-
 class CacheOfDirectories final : public Cache {
  public:
   explicit CacheOfDirectories(Rule rule) : Cache(std::move(rule)) {}

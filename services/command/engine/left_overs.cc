@@ -2,6 +2,7 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <fnmatch.h>
 
 #include <algorithm>
 #include <memory>
@@ -18,19 +19,33 @@ struct DirectoryCloser {
   void operator()(DIR* directory) const { ::closedir(directory); }
 };
 
+/// What stands behind `prefix` in `name`; empty when that begins otherwise.
+std::string behind(std::string_view prefix, std::string_view name) {
+  return std::string(name.starts_with(prefix) ? name.substr(prefix.size()) : "");
+}
+
+bool standsFor(const std::string& pattern, const std::string& name) {
+  return isPattern(pattern) ? ::fnmatch(pattern.c_str(), name.c_str(), FNM_PERIOD) == 0
+                            : pattern == name;
+}
+
 }  // namespace
 
-std::vector<LeftOver> leftOversIn(int folder_fd) {
+bool isLeftOver(std::string_view name) {
+  return name.starts_with(kHalfPrefix) || name.starts_with(kGoingPrefix);
+}
+
+std::vector<LeftOver> leftOversIn(int folder_fd, const std::string& pattern) {
   std::vector<LeftOver> found;
   cachedir::UniqueFd fd = cachedir::openBeneath(folder_fd, ".", O_RDONLY | O_DIRECTORY);
   const std::unique_ptr<DIR, DirectoryCloser> directory(fd ? ::fdopendir(fd.get()) : nullptr);
   if (!directory) return found;
   static_cast<void>(fd.release());
   while (const dirent* entry = ::readdir(directory.get())) {
-    const std::string_view name = entry->d_name;
-    for (const std::string_view prefix : {kHalfPrefix, kGoingPrefix}) {
-      if (name.starts_with(prefix) && name != prefix && found.size() < kMaxMatches) {
-        found.push_back({std::string(prefix), std::string(name.substr(prefix.size()))});
+    for (const char* prefix : {kHalfPrefix, kGoingPrefix}) {
+      std::string name = behind(prefix, entry->d_name);
+      if (!name.empty() && standsFor(pattern, name) && found.size() < kMaxMatches) {
+        found.push_back({prefix, std::move(name)});
       }
     }
   }

@@ -5,6 +5,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace spacekeep::command {
@@ -20,8 +21,12 @@ struct LeftOver {
   std::string name;  // that it had
 };
 
-/// Those in the directory `folder_fd`, at most kMaxMatches. The halves come first, because one is in
+/// Whether a directory of that name is one, whatever a pattern says.
+[[nodiscard]] bool isLeftOver(std::string_view name);
+
+/// Those in the directory `folder_fd` whose names `pattern` (the last component of a rule's path)
+/// stood for, at most kMaxMatches. The halves come first, because one is in
 /// the way of another left over of the same name.
-[[nodiscard]] std::vector<LeftOver> leftOversIn(int folder_fd);
+[[nodiscard]] std::vector<LeftOver> leftOversIn(int folder_fd, const std::string& pattern);
 
 }  // namespace spacekeep::command

@@ -16,9 +16,11 @@
 #include "services/cachedir/engine/roots.h"
 #include "services/cachedir/engine/space_return.h"
 #include "services/cachedir/engine/tree_walk.h"
+#include "services/command/base/path_patterns.h"
 #include "services/command/engine/left_overs.h"
 #include "services/command/engine/lived_in.h"
 #include "services/command/engine/measure.h"
+#include "services/command/engine/opt_out.h"
 #include "services/command/engine/remove_tree.h"
 #include "support/runtime/runtime.h"
 
@@ -241,30 +243,37 @@ class Removing {
     return 0;
   }
 
-  /// What a cancel or a crash left, next to the directories of these rules.
-  std::uint64_t finishOldWork(const cachedir::Rules& rules) {
-    std::set<std::string> folders;
-    for (const auto& rule : rules.directories) folders.insert(folderOf(rule.path));
+  /// What a cancel or a crash left where directories of these patterns stand: they themselves may
+  /// all be gone.
+  std::uint64_t finishOldWork(const cachedir::Rules& patterns) {
     std::uint64_t freed = 0;
-    for (const std::string& folder : folders) {
-      const Place place(folder);
-      for (const LeftOver& left :
-           place.fd ? leftOversIn(place.fd.get()) : std::vector<LeftOver>()) {
-        if (cancel_.cancelled()) return freed;
-        freed += finish(place, left);
+    for (const cachedir::DirectoryRule& rule : patterns.directories) {
+      for (const std::string& folder : matchesOf(folderOf(rule.path))) {
+        const Place place(folder);
+        if (place.fd) freed += finishIn(place, rule);
       }
     }
     return freed;
   }
 
  private:
+  std::uint64_t finishIn(const Place& place, const cachedir::DirectoryRule& rule) {
+    std::uint64_t freed = 0;
+    for (const LeftOver& left : leftOversIn(place.fd.get(), nameOf(rule.path))) {
+      if (cancel_.cancelled()) break;
+      freed += finish(place, left, isKept(rule, left.name));
+    }
+    return freed;
+  }
+
   /// Nobody may have looked at it before the crash, or its name had been taken when it was found in
   /// use. No time of use speaks for it, since nobody looks for it there; all else does.
-  std::uint64_t finish(const Place& place, const LeftOver& left) {
+  std::uint64_t finish(const Place& place, const LeftOver& left, bool kept) {
     const std::string now = left.prefix + left.name;
     Check check(place, now, {.volume = volume_}, open_files_, cancel_);
     if (!check.takesPart()) return 0;
-    const Checked checked = check.result();
+    const bool wanted = !kept && !isOptedOut(place.fd.get(), now);
+    const Checked checked = wanted ? check.result() : Checked();
     const bool half = left.prefix == kHalfPrefix;
     if (checked.all && (half || place.rename(now, kHalfPrefix + left.name))) {
       return removeHalf(place, left.name, checked.bytes);
@@ -308,12 +317,13 @@ cachedir::Estimate estimateWhole(const cachedir::Rules& rules,
   return sum;
 }
 
-WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::FreeRequest& request,
-                      const CancelToken& cancel, const Visitor& visit) {
+WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::Rules& patterns,
+                      const cachedir::FreeRequest& request, const CancelToken& cancel,
+                      const Visitor& visit) {
   WholeResult result;
   cachedir::OpenFiles open_files;
   Removing removing(request.volume, open_files, cancel, result.problems);
-  if (!request.dry_run) result.bytes = removing.finishOldWork(rules);
+  if (!request.dry_run) result.bytes = removing.finishOldWork(patterns);
   Units found = unitsOf(rules, request.volume, cancel);
   result.problems.insert(result.problems.end(), found.problems.begin(), found.problems.end());
   std::ranges::sort(found.units, {}, [](const Unit& unit) { return unit.used_ns; });

@@ -26,8 +26,9 @@ struct WholeResult {
   std::uint64_t bytes = 0;
   std::vector<std::string> problems;
 };
-/// The directory that was used longest ago goes first.
-[[nodiscard]] WholeResult freeWhole(const cachedir::Rules& rules,
+/// The directory that was used longest ago goes first; before all what a cancel or a crash left of
+/// those that `patterns` stand for. KEEP in these speaks of the directories themselves.
+[[nodiscard]] WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::Rules& patterns,
                                     const cachedir::FreeRequest& request, const CancelToken& cancel,
                                     const Visitor& visit);
 

@@ -12,6 +12,7 @@
 #include "services/command/engine/directory_cache.h"
 #include "services/command/engine/in_use.h"
 #include "services/command/engine/left_overs.h"
+#include "services/command/engine/opt_out.h"
 #include "tests/linux/command/command_world.h"
 
 namespace spacekeep::command {
@@ -377,6 +378,48 @@ TEST_F(WholeDirectories, WhatACrashLeftIsFinishedFirstAndCounts) {
   EXPECT_EQ(went.result.bytes, kMiB);
   EXPECT_FALSE(exists(left));
   EXPECT_TRUE(exists(volume_ / "all/oldest")) << "the rest of the last one was enough";
+}
+
+TEST_F(WholeDirectories, WhatWasLeftGoesAlsoWhereNoOtherDirectoryIs) {
+  const std::string left = volume_ / ("alone/" + std::string(kGoingPrefix) + "x");
+  writeFile(left + "/f", kMiB, 1);
+  volume_.settle();
+  const auto alone = makeCache(
+      ruleFrom(directory(volume_ / "al*e/*", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
+  EXPECT_EQ(alone->free(request(1), CancelToken(), {}).bytes, kMiB);
+  EXPECT_FALSE(exists(left));
+}
+
+TEST_F(WholeDirectories, WhatWasLeftIsKeptByNameOrMarkerAndGetsItsNameBackIfNothingHadGone) {
+  for (const char* name : {"kept", "marked"}) {
+    for (const char* prefix : {kGoingPrefix, kHalfPrefix}) {
+      writeFile(leftOf(name, prefix) + "/f", kMiB, 1);
+    }
+  }
+  for (const char* prefix : {kGoingPrefix, kHalfPrefix}) {
+    writeFile(leftOf("marked", prefix) + "/" + kOptOutMarker, 0);
+  }
+  volume_.settle();
+  const auto keeping = cache("<key>KEEP</key>" + arrayOf({"kept", "old*", "mixed"}));
+  EXPECT_EQ(keeping->free(request(4), CancelToken(), {}).bytes, 0U);
+  for (const char* name : {"kept", "marked"}) {
+    EXPECT_TRUE(exists(volume_ / "all" + "/" + name + "/f"));
+    EXPECT_TRUE(exists(leftOf(name, kHalfPrefix) + "/f"));
+  }
+}
+
+TEST_F(WholeDirectories, WhatWasLeftOfADirectoryOfAnotherPatternIsNoneOfTheRules) {
+  writeFile(leftOf("oth\\er") + "/f", kMiB, 1);
+  volume_.settle();
+  for (const char* pattern : {"all/o?d*", "all/.*", "all/oth"}) {
+    const auto another = makeCache(
+        ruleFrom(directory(volume_ / pattern, "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
+    static_cast<void>(another->free(request(4), CancelToken(), {}));
+    EXPECT_TRUE(exists(leftOf("oth\\er") + "/f")) << pattern;
+  }
+  const auto its_own = makeCache(
+      ruleFrom(directory(volume_ / "all/oth\\er", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
+  EXPECT_EQ(its_own->free(request(1), CancelToken(), {}).bytes, kMiB);
 }
 
 TEST_F(WholeDirectories, TwoThatWereLeftOfOneNameBothGoAtOnce) {

@@ -2,14 +2,19 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <linux/kcmp.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/sysmacros.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <limits>
 #include <memory>
+#include <string_view>
 
 #include "services/cachedir/engine/elapsed.h"
 
@@ -30,7 +35,39 @@ File openText(const std::string& path) { return File(std::fopen(path.c_str(), "r
 
 bool isNumber(const char* name) { return name[0] >= '0' && name[0] <= '9'; }
 
-bool isRefusal(int error) { return error == EACCES || error == EPERM; }
+/// A process, a thread or a descriptor that ended meanwhile holds nothing. Anything else that went
+/// wrong, a lack of descriptors or memory too, leaves open what there was to see.
+bool hasGone(int error) { return error == ENOENT || error == ESRCH; }
+
+/// Shows `visit` the numbers that a directory of /proc holds, with its descriptor. False when not
+/// all of them were to be seen.
+template <class Visit>
+bool forEachNumber(const std::string& path, const Visit& visit) {
+  const Directory directory(::opendir(path.c_str()));
+  if (!directory) return hasGone(errno);
+  bool all = true;
+  for (errno = 0; const dirent* entry = ::readdir(directory.get()); errno = 0) {
+    if (isNumber(entry->d_name)) all = visit(::dirfd(directory.get()), entry->d_name) && all;
+  }
+  return hasGone(errno) || (errno == 0 && all);
+}
+
+/// In a PID name space of its own, as a container's, /proc has a first process too, and shows nobody
+/// who is outside. The kernel gives the name space that it starts in always this number.
+bool showsAllNamespaces(const std::string& proc) {
+  constexpr std::string_view kFirst = "pid:[4026531836]";
+  char target[kFirst.size() + 1];
+  const ssize_t size = ::readlink((proc + "/self/ns/pid").c_str(), target, sizeof target);
+  return size > 0 && std::string_view(target, static_cast<std::size_t>(size)) == kFirst;
+}
+
+/// Whether the thread has the descriptors of its process, as nearly all have, and the main one that
+/// the process goes by. No where nobody may tell.
+bool sharesDescriptors(const std::string& process, const char* thread) {
+  const long pid = std::atol(process.c_str() + process.rfind('/') + 1);
+  const long tid = std::atol(thread);
+  return pid == tid || ::syscall(SYS_kcmp, pid, tid, KCMP_FILES, 0, 0) == 0;
+}
 
 std::vector<std::uint64_t> devicesOf(const std::vector<Root>& roots) {
   std::vector<std::uint64_t> devices;
@@ -44,6 +81,12 @@ std::vector<std::uint64_t> devicesOf(const std::vector<Root>& roots) {
 
 }  // namespace
 
+bool isOurs(const std::string& process) {
+  struct stat facts {};
+  const uid_t own = ::geteuid();
+  return ::stat(process.c_str(), &facts) == 0 && (own == 0 || facts.st_uid == own);
+}
+
 bool OpenFiles::ensure(const std::vector<Root>& roots, std::uint64_t max_age_ns,
                        const CancelToken& cancel) {
   return (ageNs() <= max_age_ns && devices_ == devicesOf(roots)) || scan(roots, cancel);
@@ -51,20 +94,21 @@ bool OpenFiles::ensure(const std::vector<Root>& roots, std::uint64_t max_age_ns,
 
 bool OpenFiles::scan(const std::vector<Root>& roots, const CancelToken& cancel) {
   good_ = false;
-  hidden_ = 0;
+  hidden_ = hidden_own_ = 0;
   held_.clear();
   devices_ = devicesOf(roots);
   const Directory processes(::opendir(proc_.c_str()));
   if (!processes) return false;
   bool first_seen = false;
-  while (const dirent* entry = ::readdir(processes.get())) {
+  for (errno = 0; const dirent* entry = ::readdir(processes.get()); errno = 0) {
     if (cancel.cancelled() || held_.size() > kMaxHeldFiles) return false;
     if (!isNumber(entry->d_name)) continue;
     first_seen = first_seen || std::string_view(entry->d_name) == "1";
     scanProcess(proc_ + "/" + entry->d_name);
   }
+  if (errno != 0) return false;
   // Where whole processes are left out (hidepid, proc(5)) the first one is, too.
-  if (!first_seen) ++hidden_;
+  if (!first_seen || !showsAllNamespaces(proc_)) ++hidden_;
   scanLocks();
   std::ranges::sort(held_);
   held_.erase(std::unique(held_.begin(), held_.end()), held_.end());
@@ -74,37 +118,50 @@ bool OpenFiles::scan(const std::vector<Root>& roots, const CancelToken& cancel) 
 }
 
 void OpenFiles::scanProcess(const std::string& process) {
-  const bool descriptors = mayScanDescriptors(process);
-  const bool mappings = mayScanMappings(process);
-  if (!descriptors || !mappings) ++hidden_;
+  if (sawAllOf(process) && sawThreads(process)) return;
+  ++hidden_;
+  if (isOurs(process)) ++hidden_own_;
+}
+
+bool OpenFiles::sawAllOf(const std::string& process) {
+  const bool descriptors = sawDescriptors(process);
+  return sawMappings(process) && descriptors;
+}
+
+/// A process shows what its main thread has: nothing once that has ended while others go on, and not
+/// the descriptors of a thread that has some of its own (unshare(2)).
+bool OpenFiles::sawThreads(const std::string& process) {
+  const std::string threads = process + "/task";
+  return forEachNumber(threads, [&](int, const char* thread) {
+    return sharesDescriptors(process, thread) || sawAllOf(threads + "/" + thread);
+  });
 }
 
 /// Who may list the descriptors may not always ask what they are: a process with privileges that we
 /// lack shows their numbers alone.
-bool OpenFiles::mayScanDescriptors(const std::string& process) {
-  const Directory descriptors(::opendir((process + "/fd").c_str()));
-  if (!descriptors) return !isRefusal(errno);
-  bool allowed = true;
-  const int fd = ::dirfd(descriptors.get());
-  while (const dirent* entry = ::readdir(descriptors.get())) {
-    if (!isNumber(entry->d_name)) continue;
+bool OpenFiles::sawDescriptors(const std::string& process) {
+  return forEachNumber(process + "/fd", [this](int folder, const char* name) {
     char first = 0;
-    const ssize_t size = ::readlinkat(fd, entry->d_name, &first, 1);
-    if (size < 0 && isRefusal(errno)) allowed = false;
+    // A path that is too long to be told is still that of a file.
+    if (::readlinkat(folder, name, &first, 1) < 0 && errno != ENAMETOOLONG) return hasGone(errno);
     // Only what has a path is a file; asking a socket or a pipe further would be a waste.
-    if (size != 1 || first != '/') continue;
+    if (first != '/' && first != 0) return true;
     struct statx facts {};
     // Without a question to a server: a descriptor on a dead network mount must not hold us up.
-    if (::statx(fd, entry->d_name, AT_STATX_DONT_SYNC | AT_NO_AUTOMOUNT, STATX_INO, &facts) == 0) {
+    constexpr int kFlags = AT_STATX_DONT_SYNC | AT_NO_AUTOMOUNT;
+    if (::statx(folder, name, kFlags, STATX_INO, &facts) == 0) {
       remember({makedev(facts.stx_dev_major, facts.stx_dev_minor), facts.stx_ino});
+      return true;
     }
-  }
-  return allowed;
+    // Who mounted a file system in user space may keep all but its device to himself.
+    return hasGone(errno) || (::statx(folder, name, kFlags, 0, &facts) == 0 &&
+                              !isOnOurs(makedev(facts.stx_dev_major, facts.stx_dev_minor)));
+  });
 }
 
-bool OpenFiles::mayScanMappings(const std::string& process) {
+bool OpenFiles::sawMappings(const std::string& process) {
   const File maps = openText(process + "/maps");
-  if (!maps) return !isRefusal(errno);
+  if (!maps) return hasGone(errno);
   char line[512];
   bool at_start = true;
   while (std::fgets(line, sizeof line, maps.get()) != nullptr) {
@@ -119,7 +176,7 @@ bool OpenFiles::mayScanMappings(const std::string& process) {
       remember({makedev(major_number, minor_number), inode});
     }
   }
-  return true;
+  return std::ferror(maps.get()) == 0 || hasGone(errno);
 }
 
 /// Lines as "1: FLOCK  ADVISORY  WRITE 660 08:02:12345 0 EOF"; the device is hexadecimal
@@ -139,8 +196,12 @@ void OpenFiles::scanLocks() {
   }
 }
 
+bool OpenFiles::isOnOurs(std::uint64_t device) const {
+  return std::ranges::binary_search(devices_, device);
+}
+
 void OpenFiles::remember(const Inode& inode) {
-  if (std::ranges::binary_search(devices_, inode.device)) held_.push_back(inode);
+  if (isOnOurs(inode.device)) held_.push_back(inode);
 }
 
 std::uint64_t OpenFiles::ageNs() const {

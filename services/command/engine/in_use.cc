@@ -58,12 +58,6 @@ bool isCalled(const std::string& process, const std::string& name) {
   return comm == name.substr(0, kCommBytes) || comm.substr(0, comm.find(' ')) == name;
 }
 
-bool isOurs(const std::string& process) {
-  struct stat facts {};
-  const uid_t own = ::geteuid();
-  return ::stat(process.c_str(), &facts) == 0 && (own == 0 || facts.st_uid == own);
-}
-
 /// Some tools leave a process behind that only holds a name space open.
 bool isIdle(const std::string& process, const std::vector<std::string>& idle) {
   if (idle.empty()) return false;
@@ -78,7 +72,7 @@ bool runs(const Condition& condition, const std::string& proc) {
   while (const dirent* entry = ::readdir(processes.get())) {
     if (entry->d_name[0] < '0' || entry->d_name[0] > '9') continue;
     const std::string process = proc + "/" + entry->d_name;
-    if (isOurs(process) && isCalled(process, condition.subject) &&
+    if (cachedir::isOurs(process) && isCalled(process, condition.subject) &&
         !isIdle(process, condition.idle)) {
       return true;
     }

@@ -242,7 +242,8 @@ TEST_P(InUse, WithoutTheRightToALeaseWhatProcShowsDecidesIfItShowsEveryProcess) 
     return objectionTo(free_, rules, proc) == Left::kUnproven &&
            objectionTo(held_, rules, proc) == Left::kOpen;
   }));
-  run("mkdir -p " + proc + "/1/fd");
+  run("mkdir -p " + proc + "/1/fd " + proc + "/self/ns");
+  run("ln -s 'pid:[4026531836]' " + proc + "/self/ns/pid");
   EXPECT_TRUE(asRootWith(allButLeases, [&] {
     return objectionTo(free_, rules, proc) == std::nullopt &&
            objectionTo(held_, rules, proc) == Left::kOpen;
@@ -309,37 +310,6 @@ TEST_P(InUse, AFileThatCannotBeReadStays) {
            seen.result.left.of(Left::kUnreadable) == 1;
   }));
   EXPECT_TRUE(exists(held_));
-}
-
-TEST(OpenFilesScan, WithoutProcNobodyIsTakenForUnused) {
-  OpenFiles files("/nowhere");
-  EXPECT_FALSE(files.scan({}, {}));
-}
-
-TEST(OpenFilesScan, WhereTheFirstProcessIsNotShownOthersAreHiddenToo) {
-  const std::string proc = temporaryDirectory();
-  run("mkdir -p " + proc + "/17/fd");
-  OpenFiles files(proc);
-  ASSERT_TRUE(files.scan({}, {}));
-  EXPECT_EQ(files.hiddenProcesses(), 1U);
-  run("mkdir -p " + proc + "/1/fd");
-  ASSERT_TRUE(files.scan({}, {}));
-  EXPECT_EQ(files.hiddenProcesses(), 0U);
-}
-
-TEST(OpenFilesScan, TheScanIsKeptForARequestThatFollowsClosely) {
-  const std::string cache = temporaryDirectory();
-  writeFile(cache + "/file", 4096);
-  const OpenedRoots opened = openRoots(rulesFor(cache), {});
-  OpenFiles files;
-  ASSERT_TRUE(files.ensure(opened.roots, 0, {}));
-  const UniqueFd late(::open((cache + "/file").c_str(), O_RDONLY | O_CLOEXEC));
-  struct stat facts {};
-  ASSERT_EQ(::fstat(late.get(), &facts), 0);
-  ASSERT_TRUE(files.ensure(opened.roots, UINT64_MAX, {}));
-  EXPECT_FALSE(files.holds(inodeOf(facts), opened.roots[0].file_system));
-  ASSERT_TRUE(files.ensure(opened.roots, 0, {}));
-  EXPECT_TRUE(files.holds(inodeOf(facts), opened.roots[0].file_system));
 }
 
 }  // namespace

@@ -37,6 +37,10 @@ bool isOwnOrMissing(const std::string& path, uid_t uid) {
   return S_ISDIR(facts.st_mode) && facts.st_uid == uid;
 }
 
+bool holds(const std::string& folder, const std::string& other) {
+  return (other + "/").starts_with(folder == "/" ? folder : folder + "/");
+}
+
 class Reader {
  public:
   Reader(UserFolders& folders, const Variable& variable) : folders_(folders), variable_(variable) {}
@@ -45,26 +49,44 @@ class Reader {
   std::string folder(const char* name, const char* otherwise) {
     if (const auto named = believed(name)) return *named;
     const std::string usual = folders_.home + "/" + otherwise;
-    if (isOwnOrMissing(usual, folders_.uid)) return realPathOf(usual);
-    folders_.problems.push_back(usual + ": belongs to somebody else; nothing is done there");
+    const std::string why_not = objection(usual, "belongs to somebody else");
+    if (why_not.empty()) return realPathOf(usual);
+    folders_.problems.push_back(usual + ": " + why_not + "; nothing is done there");
     return kNowhere;
   }
   std::string runtime() { return believed("XDG_RUNTIME_DIR").value_or(""); }
 
  private:
+  /// Rules take what they find below a folder for what its name says; below the home directory they
+  /// would find everything.
+  std::string objection(const std::string& path, const char* to_others) const {
+    if (!isOwnOrMissing(path, folders_.uid)) return to_others;
+    return holds(realPathOf(path), folders_.home) ? "holds the home directory" : "";
+  }
   std::optional<std::string> believed(const char* name) {
     const auto value = variable_(name);
     // The convention itself says that a relative path is to be ignored.
     if (!value || value->empty() || value->front() != '/') return std::nullopt;
-    if (isOwnOrMissing(*value, folders_.uid)) return realPathOf(*value);
-    folders_.problems.push_back(std::string(name) + "=" + *value +
-                                ": not a directory of this user; the usual one is taken");
+    const std::string why_not = objection(*value, "not a directory of this user");
+    if (why_not.empty()) return realPathOf(*value);
+    folders_.problems.push_back(std::string(name) + "=" + *value + ": " + why_not +
+                                "; the usual one is taken");
     return std::nullopt;
   }
 
   UserFolders& folders_;
   const Variable& variable_;
 };
+
+/// What rules find in the cache folder goes, so it must not hold what is no cache.
+void keepApart(UserFolders& folders) {
+  for (const std::string& other : {folders.data, folders.config, folders.state}) {
+    if (folders.cache == kNowhere || !holds(folders.cache, other)) continue;
+    folders.problems.push_back(folders.cache + ": the cache folder holds " + other +
+                               "; nothing is done there");
+    folders.cache = kNowhere;
+  }
+}
 
 struct Prefix {
   std::string_view text;
@@ -107,6 +129,7 @@ std::variant<UserFolders, std::string> foldersBelow(uid_t uid, std::string name,
   folders.config = reader.folder("XDG_CONFIG_HOME", ".config");
   folders.state = reader.folder("XDG_STATE_HOME", ".local/state");
   folders.runtime = reader.runtime();
+  keepApart(folders);
   return folders;
 }
 

@@ -2,7 +2,8 @@
 //
 // Where a user's files are: the home directory of the passwd entry and the base directories of the
 // XDG convention. A variable only counts when what it names belongs to the user, because whoever
-// set the environment may have been somebody else (sudo, su).
+// set the environment may have been somebody else (sudo, su), and when that is no more than what its
+// name says: a cache folder that holds the home directory or another of the folders is none.
 #pragma once
 
 #include <sys/types.h>

@@ -62,6 +62,49 @@ TEST_F(UserFoldersTest, AnOwnFolderThatBelongsToSomebodyElseIsLeftAlone) {
               ElementsAre(home_ + "/.cache: belongs to somebody else; nothing is done there"));
 }
 
+TEST_F(UserFoldersTest, AVariableThatNamesTheHomeDirectoryOrOneAboveItDoesNotCount) {
+  cachedir::run("mkdir -p " + home_ + "/inner/home && ln -s inner/home " + home_ + "/link");
+  const auto in = [&](const std::string& value) {
+    const auto variable = [&value](const char* name) {
+      return std::string(name) == "XDG_CACHE_HOME" ? std::optional(value) : std::nullopt;
+    };
+    return std::get<UserFolders>(
+        foldersBelow(::geteuid(), "somebody", home_ + "/inner/home", variable));
+  };
+  const std::string usual = home_ + "/inner/home/.cache";
+  for (const char* wrong : {"/inner/home", "/inner/home/", "/inner", "/link", ""}) {
+    EXPECT_EQ(in(home_ + wrong).cache, usual) << wrong;
+    EXPECT_THAT(in(home_ + wrong).problems,
+                ElementsAre("XDG_CACHE_HOME=" + home_ + wrong +
+                            ": holds the home directory; the usual one is taken"));
+  }
+  EXPECT_EQ(in("/").cache, usual);
+  EXPECT_EQ(in(home_ + "/inner/home/x").cache, home_ + "/inner/home/x");
+  EXPECT_EQ(in(home_ + "/inner/hom").cache, home_ + "/inner/hom");
+}
+
+TEST_F(UserFoldersTest, ACacheFolderThatIsALinkToTheHomeDirectoryIsLeftAlone) {
+  ASSERT_EQ(::symlink(".", (home_ + "/.cache").c_str()), 0);
+  const auto folders = std::get<UserFolders>(find({}));
+  EXPECT_EQ(folders.cache, "/nonexistent");
+  EXPECT_THAT(folders.problems,
+              ElementsAre(home_ + "/.cache: holds the home directory; nothing is done there"));
+}
+
+TEST_F(UserFoldersTest, ACacheFolderThatHoldsOneOfTheOthersIsLeftAlone) {
+  for (const char* other : {"XDG_DATA_HOME", "XDG_CONFIG_HOME", "XDG_STATE_HOME"}) {
+    const auto folders = std::get<UserFolders>(
+        find({{"XDG_CACHE_HOME", home_ + "/x"}, {other, home_ + "/x/deep/y"}}));
+    EXPECT_EQ(folders.cache, "/nonexistent");
+    EXPECT_THAT(folders.problems, ElementsAre(home_ + "/x: the cache folder holds " + home_ +
+                                              "/x/deep/y; nothing is done there"));
+  }
+  EXPECT_THAT(std::get<UserFolders>(
+                  find({{"XDG_CACHE_HOME", home_ + "/x"}, {"XDG_DATA_HOME", home_ + "/xy"}}))
+                  .problems,
+              IsEmpty());
+}
+
 TEST_F(UserFoldersTest, AHomeOfSomebodyElseIsRefused) {
   EXPECT_EQ(
       std::get<std::string>(find({}, 12345)),

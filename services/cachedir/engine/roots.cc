@@ -58,7 +58,7 @@ bool alreadyThere(const std::vector<Root>& roots, const Inode& inode) {
 }  // namespace
 
 OpenedRoots openRoots(const Rules& rules, const std::optional<std::string>& volume) {
-  OpenedRoots opened;
+  OpenedRoots opened{.roots = {}, .problems = rules.problems};
   const auto file_systems = fileSystems();
   std::optional<std::uint64_t> wanted;
   if (volume) {

@@ -27,7 +27,7 @@ struct Root {
 
 struct OpenedRoots {
   std::vector<Root> roots;
-  std::vector<std::string> problems;  // a directory that is there and cannot be used, in words
+  std::vector<std::string> problems;  // a directory that cannot be used or is left out, in words
 };
 
 /// Opens each directory of `rules`; with `volume` (a mount point) only those on its file system. A

@@ -20,7 +20,7 @@ constexpr std::string_view kTopKeys[] = {"SPACEKEEP_ID", "SPACEKEEP_SERVICES",
                                          "DIRECTORIES"};
 constexpr std::string_view kDirectoryKeys[] = {"PATH", "UNUSED_DAYS", "PERIODIC_UNUSED_DAYS",
                                                "KEEP", "REMOVE_EMPTY_DIRECTORIES"};
-// Places that hold a whole system rather than a cache: naming one is a slip, and a costly one.
+// Naming one of these is a slip, and a costly one.
 constexpr std::string_view kNeverCaches[] = {
     "/",     "/bin", "/boot", "/dev", "/etc", "/home", "/lib", "/lib64",   "/opt",   "/proc",
     "/root", "/run", "/sbin", "/sys", "/tmp", "/usr",  "/var", "/var/lib", "/System"};
@@ -136,7 +136,7 @@ bool Reader::readPath(const Dictionary& from, const std::string& where, Director
     return fail(place, "\"" + *path + "\" holds an empty, \".\" or \"..\" component",
                 "write the path without them");
   }
-  if (std::ranges::find(kNeverCaches, rule.path) != std::end(kNeverCaches)) {
+  if (isSystemDirectory(rule.path)) {
     return fail(place, "\"" + *path + "\" is a system directory", "name the cache below it");
   }
   return true;
@@ -201,8 +201,7 @@ bool Reader::readEmpty(const Dictionary& from, const std::string& where, Directo
 
 bool Reader::apartFromOthers(const std::string& where, const DirectoryRule& rule) {
   for (const DirectoryRule& other : rules_.directories) {
-    if ((rule.path + "/").starts_with(other.path + "/") ||
-        (other.path + "/").starts_with(rule.path + "/")) {
+    if (overlap(rule.path, other.path)) {
       return fail(where + " PATH", "\"" + rule.path + "\" overlaps \"" + other.path + "\"",
                   "let each file stand under one directory only");
     }
@@ -305,6 +304,14 @@ std::variant<Value, RuleError> readDocument(const std::string& file) {
   if (used > kMaxPlistBytes) return RuleError{file + ": larger than 4 MiB; make it smaller"};
   bytes.resize(used);
   return parseDocument(bytes, file);
+}
+
+bool isSystemDirectory(std::string_view path) {
+  return std::ranges::find(kNeverCaches, path) != std::end(kNeverCaches);
+}
+
+bool overlap(const std::string& one, const std::string& other) {
+  return (one + "/").starts_with(other + "/") || (other + "/").starts_with(one + "/");
 }
 
 bool isKept(const DirectoryRule& rule, const std::string& path) {

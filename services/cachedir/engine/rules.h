@@ -48,6 +48,7 @@ struct Rules {
   bool periodic = false;
   std::vector<std::string> notifications;
   std::vector<DirectoryRule> directories;
+  std::vector<std::string> problems = {};  // why directories are left out, in words
 };
 
 /// What is wrong, where, and what to do; one line per finding is not needed, the first is enough.
@@ -63,6 +64,11 @@ struct RuleError {
 [[nodiscard]] std::variant<Rules, RuleError> readRules(const std::string& file);
 /// The property list in `file`, whatever it says.
 [[nodiscard]] std::variant<Value, RuleError> readDocument(const std::string& file);
+
+/// Whether `path` (without a slash at its end) holds a whole system rather than a cache.
+[[nodiscard]] bool isSystemDirectory(std::string_view path);
+/// Whether one is the other or lies below it; both without a slash at the end.
+[[nodiscard]] bool overlap(const std::string& one, const std::string& other);
 
 /// Whether a file or directory at `path` (relative to the rule's directory) is never taken. A
 /// pattern with a slash is compared with the whole path, one without with the last component.

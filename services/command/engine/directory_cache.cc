@@ -7,6 +7,7 @@
 #include "services/cachedir/engine/cache_cleaner.h"
 #include "services/command/engine/in_use.h"
 #include "services/command/engine/left_overs.h"
+#include "services/command/engine/matches.h"
 #include "services/command/engine/measure.h"
 #include "services/command/engine/opt_out.h"
 #include "services/command/engine/tool_cache.h"
@@ -17,7 +18,7 @@ namespace {
 
 /// What the patterns match now, without what its owner keeps.
 cachedir::Rules filesWanted(const DirectoryCaches& caches) {
-  cachedir::Rules found = matched(caches.files);
+  cachedir::Rules found = matched(caches).files;
   std::erase_if(found.directories,
                 [](const auto& rule) { return isOptedOut(AT_FDCWD, rule.path); });
   return found;
@@ -25,7 +26,7 @@ cachedir::Rules filesWanted(const DirectoryCaches& caches) {
 
 /// The same; KEEP of such a rule speaks of the directories themselves.
 cachedir::Rules wholeWanted(const DirectoryCaches& caches) {
-  cachedir::Rules found = matched(caches.whole);
+  cachedir::Rules found = matched(caches).whole;
   std::erase_if(found.directories, [](const auto& rule) {
     const std::string name = rule.path.substr(rule.path.rfind('/') + 1);
     return isOptedOut(AT_FDCWD, rule.path) || isKept(rule, name) || isLeftOver(name);

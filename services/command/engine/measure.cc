@@ -8,7 +8,6 @@
 
 #include "services/cachedir/engine/link_groups.h"
 #include "services/cachedir/engine/tree_walk.h"
-#include "services/command/base/path_patterns.h"
 #include "services/command/engine/file_age.h"
 
 namespace spacekeep::command {
@@ -65,19 +64,6 @@ std::optional<std::int64_t> timeNs(const FoundFile& found, const Root& root, Fil
 }
 
 }  // namespace
-
-cachedir::Rules matched(const cachedir::Rules& rules) {
-  cachedir::Rules found = rules;
-  found.directories.clear();
-  for (const cachedir::DirectoryRule& rule : rules.directories) {
-    for (std::string& path : matchesOf(rule.path)) {
-      cachedir::DirectoryRule each = rule;
-      each.path = std::move(path);
-      if (found.directories.size() < kMaxMatches) found.directories.push_back(std::move(each));
-    }
-  }
-  return found;
-}
 
 Measured measure(const std::vector<Root>& roots, const cachedir::CancelToken& cancel) {
   return measureIf(

@@ -23,9 +23,6 @@ struct Measured {
   bool whole = true;
 };
 
-/// `rules` with its patterns replaced by what they match now.
-[[nodiscard]] cachedir::Rules matched(const cachedir::Rules& rules);
-
 [[nodiscard]] Measured measure(const std::vector<cachedir::Root>& roots,
                                const cachedir::CancelToken& cancel);
 /// Only of those files that a clean would take.

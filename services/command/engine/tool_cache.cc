@@ -6,6 +6,7 @@
 
 #include "services/cachedir/engine/space_return.h"
 #include "services/command/engine/in_use.h"
+#include "services/command/engine/matches.h"
 #include "services/command/engine/measure.h"
 #include "services/command/engine/output_amount.h"
 #include "support/runtime/runtime.h"

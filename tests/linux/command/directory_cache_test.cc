@@ -18,8 +18,12 @@
 namespace spacekeep::command {
 namespace {
 
+using testing::AllOf;
 using testing::ElementsAre;
+using testing::HasSubstr;
 using testing::IsEmpty;
+using testing::StartsWith;
+using testing::UnorderedElementsAre;
 
 std::string directory(const std::string& path, const std::string& more = "") {
   return "<key>DIRECTORIES</key><array><dict><key>PATH</key><string>" + path + "</string>" + more +
@@ -65,6 +69,53 @@ TEST_F(DirectoryCacheTest, ADirectoryWithTheMarkerIsLeftAlone) {
     writeFile(volume_ / "p2/old", kMiB, 400);
     volume_.settle();
   }
+}
+
+TEST_F(DirectoryCacheTest, ADirectoryThatTwoPathsStandForIsLeftAloneAndTold) {
+  writeFile(volume_ / "p1/keep.db", kMiB, 400);
+  writeFile(volume_ / "p2/deep/keep.db", kMiB, 400);
+  writeFile(volume_ / "p3/old", kMiB, 400);
+  volume_.settle();
+  const auto entry = [this](const std::string& path, const std::string& more) {
+    return "<dict><key>PATH</key><string>" + (volume_ / path) + "</string>" + more + "</dict>";
+  };
+  const std::string keep = "<key>KEEP</key>" + arrayOf({"*.db"});
+  for (const char* whole : {"<false/>", "<true/>"}) {
+    const auto cache =
+        makeCache(ruleFrom("<key>DIRECTORIES</key><array>" +
+                           entry("p*", std::string("<key>WHOLE_DIRECTORIES</key>") + whole) +
+                           entry("p1", keep) + entry("p2/deep", keep) + "</array>"),
+                  nullptr);
+    EXPECT_THAT(offered(*cache), ElementsAre(kMiB, kMiB, kMiB, kMiB));
+    const Went went = freeAsForetold(*cache, request(4));
+    EXPECT_EQ(went.result.bytes, kMiB);
+    EXPECT_THAT(
+        went.result.problems,
+        UnorderedElementsAre(AllOf(StartsWith((volume_ / "p1") + ": left alone, and 1 more"),
+                                   HasSubstr((volume_ / "p*") + "\"")),
+                             StartsWith((volume_ / "p1") + ": left alone: it overlaps "),
+                             StartsWith((volume_ / "p2/deep") + ": left alone: it overlaps ")));
+    EXPECT_TRUE(exists(volume_ / "p1/keep.db"));
+    EXPECT_TRUE(exists(volume_ / "p2/deep/keep.db"));
+    EXPECT_FALSE(exists(volume_ / "p3/old"));
+    writeFile(volume_ / "p3/old", kMiB, 400);
+    volume_.settle();
+  }
+}
+
+TEST_F(DirectoryCacheTest, AWholeDirectoryThatIsKeptMayHaveAnEntryOfItsOwn) {
+  writeFile(volume_ / "p1/old", kMiB, 400);
+  writeFile(volume_ / "p2/old", kMiB, 400);
+  volume_.settle();
+  const auto cache = makeCache(
+      ruleFrom("<key>DIRECTORIES</key><array><dict><key>PATH</key><string>" + (volume_ / "p*") +
+               "</string><key>WHOLE_DIRECTORIES</key><true/><key>KEEP</key>" + arrayOf({"p1"}) +
+               "</dict><dict><key>PATH</key><string>" + (volume_ / "p1") +
+               "</string></dict></array>"),
+      nullptr);
+  const Went went = freeAsForetold(*cache, request(4));
+  EXPECT_THAT(went.what, ElementsAre(volume_ / "p1/old", volume_ / "p2/"));
+  EXPECT_THAT(went.result.problems, IsEmpty());
 }
 
 TEST_F(DirectoryCacheTest, NothingGoesWhileAnotherHoldsTheOwnersLock) {

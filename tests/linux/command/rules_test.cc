@@ -1,10 +1,12 @@
 // Rule files: what is read, how files of one name add up, and what is said of bad ones.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <fstream>
 #include <map>
 
 #include "services/command/base/path_patterns.h"
+#include "services/command/engine/matches.h"
 #include "tests/linux/command/command_world.h"
 
 namespace spacekeep::command {
@@ -183,6 +185,50 @@ TEST(PathPatterns, ComponentsMatchRealDirectoriesOnly) {
             (std::vector<std::string>{folder + "/a1/x", folder + "/a2/x"}));
   EXPECT_EQ(matchesOf(folder + "/nothing/x"), std::vector<std::string>{folder + "/nothing/x"});
   EXPECT_EQ(matchesOf(folder + "/z*/x"), std::vector<std::string>{});
+}
+
+std::vector<std::string> pathsOf(const cachedir::Rules& rules) {
+  std::vector<std::string> paths;
+  for (const auto& rule : rules.directories) paths.push_back(rule.path);
+  return paths;
+}
+
+/// What the matches of these paths are, taken together.
+cachedir::Rules matchesOfAll(const std::vector<std::string>& paths) {
+  cachedir::Rules rules;
+  for (const std::string& path : paths) rules.directories.push_back({.path = path});
+  return matched(rules);
+}
+
+TEST(Matches, ASystemDirectoryIsNoneWhateverPatternFindsIt) {
+  using Paths = std::vector<std::string>;
+  for (const char* pattern : {"/[u]sr", "/v?r/lib", "/*/lib", "/va*", "/", "/et*"}) {
+    const std::vector<std::string> paths = pathsOf(matchesOfAll({pattern}));
+    for (const char* never : {"/usr", "/var", "/var/lib", "/etc", "/"}) {
+      EXPECT_EQ(std::ranges::count(paths, never), 0) << pattern;
+    }
+  }
+  for (const char* pattern : {"/*", "/?*", "/var/*", "/*/*"}) {
+    const std::vector<std::string> paths = pathsOf(matchesOfAll({pattern}));
+    EXPECT_EQ(std::ranges::count(paths, "/var/log"), 0) << pattern;
+    EXPECT_EQ(std::ranges::count(paths, "/tmp"), 0) << pattern;
+  }
+  EXPECT_EQ(pathsOf(matchesOfAll({"/var/[l]og"})), Paths{"/var/log"});
+  EXPECT_EQ(matchesOfAll({"/us[r]"}).problems,
+            Paths{"/usr: left alone: it is a system directory; write PATH so that \"/us[r]\" does "
+                  "not match it"});
+}
+
+TEST(Matches, DirectoriesThatLieInEachOtherAreLeftOutAllOfThem) {
+  const std::string top = temporaryDirectory();
+  for (const char* name : {"/a/x/y", "/a-b", "/c/x", "/d"}) {
+    cachedir::run("mkdir -p " + top + name);
+  }
+  const auto found = matchesOfAll({top + "/*", top + "/a/x", top + "/a/x/y", top + "/[c]"});
+  EXPECT_EQ(pathsOf(found), (std::vector<std::string>{top + "/a-b", top + "/d"}));
+  EXPECT_EQ(found.problems.size(), 4U);
+  EXPECT_EQ(pathsOf(matchesOfAll({top + "/c", top + "/a*"})),
+            (std::vector<std::string>{top + "/c", top + "/a", top + "/a-b"}));
 }
 
 }  // namespace

@@ -71,6 +71,20 @@ TEST_F(ToolCacheTest, EachUrgencyTakesWhatItsCommandTakesAndTheDryRunForetellsIt
   EXPECT_FALSE(exists(cache_ + "/new1"));
 }
 
+TEST_F(ToolCacheTest, WhatTwoPathsStandForIsNotCountedTwiceAndTold) {
+  const std::string all = shellTool("rm -r " + volume_.path() + "/*/deep");
+  writeFile(volume_ / "other/deep/file", kMiB);
+  writeFile(cache_ + "/deep/file", kMiB);
+  const auto cache =
+      makeCache(ruleFrom("<key>MEASURE</key>" + arrayOf({volume_ / "*", cache_ + "/deep"}) +
+                         "<key>CLEAN</key><dict><key>1</key><dict><key>COMMAND</key>" +
+                         arrayOf({all}) + "</dict></dict>"),
+                nullptr);
+  const Went went = freeFrom(*cache, request(1));
+  EXPECT_EQ(went.result.bytes, kMiB) << "of the other";
+  EXPECT_EQ(went.result.problems.size(), 2U);
+}
+
 TEST_F(ToolCacheTest, TheMildestCommandThatSufficesIsTheLast) {
   const Went went = freeAsForetold(*cache(tool_), request(4, kMiB));
   EXPECT_EQ(went.result.bytes, 2 * kMiB);

@@ -67,19 +67,24 @@ Result CacheOfDirectories::free(const Request& request, const CancelToken& cance
     result.note = request.dry_run ? whoHolds(rule().locks) : locks.take(rule().locks);
   }
   if (!result.note.empty()) return result;
+  ConditionWatch watch(rule().not_while, ask_every_ns_);
   cachedir::FreeRequest wish{.amount = request.amount,
                              .urgency = request.urgency,
                              .periodic = request.periodic,
                              .volume = request.volume,
                              .dry_run = request.dry_run,
-                             .cancelled = [&cancel] { return cancel.cancelled(); }};
+                             .cancelled = [&] { return cancel.cancelled() || watch.holds(); }};
   cachedir::CacheCleaner cleaner(filesWanted(caches()));
   cachedir::FreeResult files = cleaner.free(wish, [&visit](const cachedir::TakenFile& file) {
     if (visit) visit(file.path, file.bytes);
   });
   result.bytes = files.bytes;
   append(result.problems, std::move(files.problems));
-  if (request.periodic || result.bytes >= request.amount || cancel.cancelled()) return result;
+  result.note = watch.why();
+  if (request.periodic || result.bytes >= request.amount || cancel.cancelled() ||
+      !result.note.empty()) {
+    return result;
+  }
   wish.amount -= result.bytes;
   WholeResult whole = freeWhole(wholeWanted(caches()), caches().whole, wish, cancel, visit);
   result.bytes += whole.bytes;

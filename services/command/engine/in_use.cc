@@ -18,10 +18,12 @@
 #include <string_view>
 
 #include "services/cachedir/engine/beneath.h"
+#include "services/cachedir/engine/elapsed.h"
 #include "services/cachedir/engine/open_files.h"
 #include "services/cachedir/engine/roots.h"
 #include "services/cachedir/engine/tree_walk.h"
 #include "services/command/base/path_patterns.h"
+#include "support/runtime/runtime.h"
 
 namespace spacekeep::command {
 namespace {
@@ -141,6 +143,22 @@ std::string whyNotNow(const std::vector<Condition>& conditions, const std::strin
     if (!why.empty()) return why;
   }
   return "";
+}
+
+ConditionWatch::ConditionWatch(const std::vector<Condition>& conditions, std::uint64_t every_ns)
+    : conditions_(conditions),
+      every_ns_(every_ns),
+      pause_ns_(every_ns),
+      asked_ticks_(rt::ticks()) {}
+
+bool ConditionWatch::holds() {
+  if (!why_.empty()) return true;
+  if (conditions_.empty() || cachedir::elapsedNs(asked_ticks_) < pause_ns_) return false;
+  const std::uint64_t begin = rt::ticks();
+  why_ = whyNotNow(conditions_);
+  pause_ns_ = std::clamp(9 * cachedir::elapsedNs(begin), every_ns_, 10 * every_ns_);
+  asked_ticks_ = rt::ticks();
+  return !why_.empty();
 }
 
 /// The lines of /proc/locks as proc_locks(5) describes them. Device numbers in them are those of the

@@ -1,8 +1,9 @@
-// Thread safety: pure functions over /proc and files; a HeldLocks belongs to one thread.
+// Thread safety: pure functions over /proc and files; a HeldLocks and a ConditionWatch belong to one thread.
 //
 // Whether a cache's owner is at work on it.
 #pragma once
 
+#include <cstdint>
 #include <string>
 #include <vector>
 
@@ -14,6 +15,30 @@ namespace spacekeep::command {
 /// In words what holds ("firefox is running"), empty when nothing does.
 [[nodiscard]] std::string whyNotNow(const std::vector<Condition>& conditions,
                                     const std::string& proc = "/proc");
+
+/// Asks again while a request goes on, because the owner may begin his work at any time. Asking
+/// costs a look at every process, so it is done about once a second, and where it takes long less
+/// often, down to once in ten.
+class ConditionWatch {
+ public:
+  static constexpr std::uint64_t kEveryNs = 1'000'000'000;
+
+  /// As of a moment ago none of them held. `conditions` must outlive this.
+  explicit ConditionWatch(const std::vector<Condition>& conditions,
+                          std::uint64_t every_ns = kEveryNs);
+
+  /// Whether one holds, or has held once when this was asked.
+  [[nodiscard]] bool holds();
+  /// In words which one; empty as long as none has been seen to hold.
+  [[nodiscard]] const std::string& why() const { return why_; }
+
+ private:
+  const std::vector<Condition>& conditions_;
+  const std::uint64_t every_ns_;
+  std::uint64_t pause_ns_;
+  std::uint64_t asked_ticks_;
+  std::string why_;
+};
 
 /// Whether somebody holds a lock of any kind on `path`, without touching the file.
 [[nodiscard]] bool isLocked(const std::string& path, const std::string& proc = "/proc");

@@ -8,6 +8,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <fstream>
+
 #include "services/cachedir/engine/link_groups.h"
 #include "services/command/engine/directory_cache.h"
 #include "services/command/engine/in_use.h"
@@ -145,6 +147,44 @@ TEST_F(DirectoryCacheTest, NothingGoesWhileAnotherHoldsTheOwnersLock) {
     EXPECT_THAT(offered(*cache), ElementsAre(0, 0, 0, 0));
   }
   EXPECT_TRUE(exists(volume_ / "cache/old"));
+}
+
+TEST_F(DirectoryCacheTest, WhatItsOwnerBeginsWhileFilesGoKeepsTheOthers) {
+  for (const char* name : {"a/1", "a/2", "whole/w1/f"}) writeFile(volume_ / name, kMiB, 400);
+  setAge(volume_ / "a/1", 500);
+  volume_.settle();
+  const std::string pid_file = volume_ / "pid";
+  const CacheOfDirectories cache(
+      ruleFrom("<key>DIRECTORIES</key><array><dict><key>PATH</key><string>" + (volume_ / "a") +
+               "</string></dict><dict><key>PATH</key><string>" + (volume_ / "whole/*") +
+               "</string><key>WHOLE_DIRECTORIES</key><true/></dict></array>"
+               "<key>NOT_WHILE</key><array><dict><key>PID_FILE</key><string>" +
+               pid_file + "</string></dict></array>"),
+      0);
+  const auto begin = [&pid_file](const std::string&, std::optional<std::uint64_t>) {
+    std::ofstream(pid_file) << ::getpid();
+  };
+  const Result result = cache.free(request(4), CancelToken(), begin);
+  EXPECT_EQ(result.bytes, kMiB);
+  EXPECT_EQ(result.note, "the process of " + pid_file + " is running");
+  EXPECT_FALSE(exists(volume_ / "a/1"));
+  EXPECT_TRUE(exists(volume_ / "a/2"));
+  EXPECT_TRUE(exists(volume_ / "whole/w1/f"));
+}
+
+TEST_F(DirectoryCacheTest, ConditionsAreAskedAgainNowAndThenAndOnceOneHasHeldItCounts) {
+  const std::string pid_file = volume_ / "pid";
+  const std::vector<Condition> conditions{
+      {.kind = Condition::Kind::kPidFile, .subject = pid_file, .idle = {}}};
+  ConditionWatch eager(conditions, 0);
+  ConditionWatch slow(conditions, 3600 * ConditionWatch::kEveryNs);
+  EXPECT_FALSE(eager.holds());
+  std::ofstream(pid_file) << ::getpid();
+  EXPECT_FALSE(slow.holds());
+  EXPECT_TRUE(eager.holds());
+  std::ofstream(pid_file) << "";
+  EXPECT_TRUE(eager.holds());
+  EXPECT_EQ(eager.why(), "the process of " + pid_file + " is running");
 }
 
 TEST_F(DirectoryCacheTest, TheOwnersLockIsHeldAsTheOwnerHoldsIt) {

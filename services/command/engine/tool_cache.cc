@@ -136,7 +136,11 @@ class CacheOfTool::Cleaning {
     occupied_ = before.bytes;
     for (int urgency = 1; urgency <= request_.urgency && !satisfied(); ++urgency) {
       const auto& step = cache_.tool().steps[static_cast<std::size_t>(urgency - 1)];
-      if (step) play(*step);
+      if (!step) continue;
+      // Counting and the command before took their time.
+      result_.note = whyNotNow(cache_.rule().not_while);
+      if (!result_.note.empty()) break;
+      play(*step);
     }
     if (request_.dry_run || result_.bytes == 0) return std::move(result_);
     space.add(result_.bytes);

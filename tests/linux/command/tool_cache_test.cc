@@ -175,6 +175,31 @@ TEST_F(ToolCacheTest, WhileItsOwnerRunsNothingIsTaken) {
   EXPECT_EQ(freeAsForetold(*free, request(4)).result.bytes, 5 * kMiB);
 }
 
+TEST_F(ToolCacheTest, WhatItsOwnerBeginsWhileACommandRunsKeepsTheNextOnesBack) {
+  const std::string pid_file = temporaryDirectory() + "/pid";
+  const std::string tool =
+      shellTool("[ \"$2\" = / ] && set -- \"$1\" ''; rm -f \"$1/$2\"*; echo $PPID >" + pid_file);
+  const auto kept = cache(tool, "<key>NOT_WHILE</key><array><dict><key>PID_FILE</key><string>" +
+                                    pid_file + "</string></dict></array>");
+  const Went went = freeFrom(*kept, request(4));
+  EXPECT_EQ(went.result.bytes, 2 * kMiB);
+  EXPECT_THAT(went.what, ElementsAre(tool + " " + cache_ + " old"));
+  EXPECT_EQ(went.result.note, "the process of " + pid_file + " is running");
+  EXPECT_TRUE(exists(cache_ + "/new1"));
+}
+
+TEST_F(ToolCacheTest, WhatItsOwnerBeginsWhileItIsCountedKeepsTheFirstCommandBack) {
+  const std::string pid_file = volume_ / "pid";
+  const auto kept = cache(tool_, "<key>NOT_WHILE</key><array><dict><key>PID_FILE</key><string>" +
+                                     pid_file + "</string></dict></array>");
+  const CancelToken while_counting([&pid_file] {
+    std::ofstream(pid_file) << ::getpid();
+    return false;
+  });
+  EXPECT_EQ(kept->free(request(4), while_counting, {}).bytes, 0U);
+  EXPECT_TRUE(exists(cache_ + "/old1"));
+}
+
 /// A shell that goes by another name than its executable, as rootless podman's does.
 TEST_F(ToolCacheTest, AProcessThatOnlyWaitsUnderANameOfItsOwnDoesNotKeepTheCache) {
   const std::string tool = volume_ / "busy-tool";

@@ -76,6 +76,7 @@ TEST(ValueEquality, NearbyNumbersOfDifferentKindsAreNotEqual) {
   const std::int64_t beyond_doubles = (std::int64_t{1} << 53) + 1;
   EXPECT_NE(Value(beyond_doubles), Value(static_cast<double>(beyond_doubles)));
   EXPECT_NE(Value(INT64_MAX), Value(kTwoTo63));
+  EXPECT_NE(Value(INT64_MIN), Value(kTwoTo63));
   EXPECT_NE(Value(UINT64_MAX), Value(2 * kTwoTo63));
   EXPECT_NE(Value(UINT64_MAX), Value(-1));
   EXPECT_NE(Value(1), Value(1.5));

@@ -12,6 +12,7 @@ namespace {
 
 TEST(DeclaredSocketName, IsMadeOfSafeServiceIdsOnly) {
   EXPECT_EQ(declaredSocketName("com.quorvel.cache-1_a"), "com.quorvel.cache-1_a.sock");
+  EXPECT_EQ(declaredSocketName("azAZ09"), "azAZ09.sock");
   EXPECT_EQ(declaredSocketName(std::string(64, 'a')), std::string(64, 'a') + ".sock");
   for (const std::string& unsafe :
        {std::string(), std::string("."), std::string(".."), std::string(".hidden"),

@@ -67,6 +67,16 @@ TEST_P(OnFileSystem, AnUnmountedVolumeIsUnknownAndHasNoSpace) {
   EXPECT_FALSE(holds(volumes_.getLocalVolumes(), path));
 }
 
+TEST_P(OnFileSystem, OneThatIsMountedOverIsNotMeasured) {
+  const std::string path = world_.mountFresh(GetParam(), "v", 400);
+  ASSERT_EQ(world_.mountFresh("tmpfs", "v", 30), path);
+  std::vector<std::uint64_t> sizes;
+  for (const VolumeSample& sample : volumes_.sampleLocalVolumes()) {
+    if (sample.volume == path) sizes.push_back(sample.space.size_bytes);
+  }
+  EXPECT_EQ(sizes, std::vector<std::uint64_t>{30 * kMiB});
+}
+
 TEST_P(OnFileSystem, WhatIsDeletedCountsAsPurgedOnlyOnceTheBlocksAreBack) {
   const std::string path = world_.mountFresh(GetParam(), "v", 400);
   const std::string file = path + "/cache";

@@ -104,12 +104,12 @@ bool BusCallers::forgetIdle(const std::function<bool(const BusCaller&)>& may_be_
 
 void BusCallers::tellLeftOut(const LeftOut& message) {
   const auto& header = message.header;
-  if (!header || header->fixed.type != kWireCall || !header->sender ||
+  if (!header || header->fixed.type != kWireCall || !header->sender || !header->member ||
       (header->fixed.flags & kWireNoReplyExpected) != 0 || link_.bus() == nullptr) {
     return;
   }
-  const OwnedMessage call =
-      callOfSerial(link_.bus(), header->fixed.serial, header->sender->c_str());
+  const OwnedMessage call = callOfSerial(link_.bus(), header->fixed.serial, header->sender->c_str(),
+                                         header->member->c_str());
   if (call == nullptr) return;
   if (message.brings_descriptors) {
     refuse(call.get(), kErrorNotSupported,

@@ -15,9 +15,10 @@ constexpr std::size_t kMaxErrorText = 2048;
 
 }  // namespace
 
-OwnedMessage callOfSerial(sd_bus* bus, std::uint64_t serial, const char* sender) {
+OwnedMessage callOfSerial(sd_bus* bus, std::uint64_t serial, const char* sender,
+                          const char* member) {
   sd_bus_message* call = nullptr;
-  if (sd_bus_message_new_method_call(bus, &call, nullptr, kObjectPath, nullptr, "Answered") < 0) {
+  if (sd_bus_message_new_method_call(bus, &call, nullptr, kObjectPath, nullptr, member) < 0) {
     return nullptr;
   }
   OwnedMessage owned(call);

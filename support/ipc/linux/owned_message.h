@@ -16,8 +16,9 @@ using OwnedMessage = std::unique_ptr<sd_bus_message, MessageUnref>;
 
 /// A call as sd-bus wants to see it to make an answer from, when the real one has been let go of or
 /// was never read: nothing but its serial matters, and `sender` where there is more than one (null
-/// otherwise). Null when it cannot be made.
-[[nodiscard]] OwnedMessage callOfSerial(sd_bus* bus, std::uint64_t serial, const char* sender);
+/// otherwise); its member only to who looks at it. Null when it cannot be made.
+[[nodiscard]] OwnedMessage callOfSerial(sd_bus* bus, std::uint64_t serial, const char* sender,
+                                        const char* member = "Answered");
 
 /// The answer to `call` that says what is wrong with it. Null when it cannot be made.
 [[nodiscard]] OwnedMessage errorAnswer(sd_bus_message* call, const char* error_name,

@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <iterator>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "tests/helpers/log_capture.h"
@@ -56,6 +57,17 @@ TEST_F(HostileBusCaller, AMessageBeyondTheLimitIsLeftOutAndToldSo) {
     EXPECT_NE(answer.text.find(", more than 65536"), std::string::npos) << answer.text;
     EXPECT_EQ(client->number(1), "");
   }
+  EXPECT_EQ(log.count(kLogProblem, "number of a caller of the bus refused: The message has "), 2U);
+}
+
+TEST_F(HostileBusCaller, ACallWithADescriptorIsRefusedUnderItsOwnNameInTheLog) {
+  OwnedMessage call = client->newCall("takeDescriptor");
+  ASSERT_GE(sd_bus_message_append(call.get(), "hs", STDIN_FILENO, "text"), 0);
+  EXPECT_EQ(client->call(std::move(call)).error, "org.freedesktop.DBus.Error.NotSupported");
+  EXPECT_EQ(
+      log.count(kLogProblem,
+                "takeDescriptor of a caller of the bus refused: Descriptors are not taken over "),
+      1U);
 }
 
 TEST_F(HostileBusCaller, DescriptorsAreNotLeftOpen) {

@@ -62,21 +62,36 @@ TEST_F(Declared, AnEndedConnectionIsReplacedByANewOne) {
   EXPECT_TRUE(callAndWait(connectTo("svc"), "number", {std::int32_t{2}}).reply);
 }
 
-// A service that ends when it is idle is started again by the next connection.
+// A service that ends when it is idle is started again by the next connection. One worker runs the
+// handlers here, so a failed call is told before the end of its connection is, and who then calls
+// anew has to get another connection all the same.
 TEST_F(Declared, AConnectionThatTheServiceEndedIsReplacedAtOnce) {
   TestServer next;
   declare("svc");
-  const auto first = connectTo("svc");
-  PendingCall held(first, "hold", {});
-  ASSERT_TRUE(eventually([&] { return server.held() == 1; }));
-  server.stop();
-  std::string why;
-  next.server().serveListening(bindListeningSocket(directory / "svc.sock", 0600, why));
-  ASSERT_EQ(why, "");
-  ASSERT_TRUE(held.wait().error);
-  const auto second = connectTo("svc");
-  ASSERT_NE(second, first);
-  EXPECT_TRUE(callAndWait(second, "number", {std::int32_t{1}}).reply);
+  ConcurrentQueue one_worker({.parallelism = 1});
+  {
+    LinuxConnector caller(server.loop, one_worker, directory.path());
+    const auto first = caller.connectionToDeclared("svc", testInterface());
+    std::shared_ptr<Connection> second;
+    // Shared, because who signals may still be inside when the wait has ended.
+    const auto failed = std::make_shared<CountingSemaphore>(0U);
+    const auto proxy = first->remoteProxy([&, failed](const Error&) {
+      second = caller.connectionToDeclared("svc", testInterface());
+      failed->signal();
+    });
+    proxy->call("hold", {}, nullptr);
+    ASSERT_TRUE(eventually([&] { return server.held() == 1; }));
+    ASSERT_EQ(::unlink((directory / "svc.sock").c_str()), 0);
+    std::string why;
+    next.server().serveListening(bindListeningSocket(directory / "svc.sock", 0600, why));
+    ASSERT_EQ(why, "");
+    server.stop();
+    ASSERT_EQ(failed->waitForNs(kLongNs), WaitResult::kSignalled);
+    ASSERT_NE(second, nullptr);
+    ASSERT_NE(second, first);
+    EXPECT_TRUE(callAndWait(second, "number", {std::int32_t{1}}).reply);
+  }
+  server.loop.runAndWait([] {});  // the connections are gone before their queue is
 }
 
 TEST_F(Declared, NobodyListeningIsNoConnection) { EXPECT_EQ(connectTo("svc"), nullptr); }

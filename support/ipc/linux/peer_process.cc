@@ -12,10 +12,12 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <filesystem>
 #include <memory>
 #include <optional>
 #include <sstream>
 #include <string>
+#include <system_error>
 #include <utility>
 
 namespace spacekeep::ipc {
@@ -51,12 +53,11 @@ pid_t peerPid(int socket) {
   return ::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &peer, &length) == 0 ? peer.pid : 0;
 }
 
-/// Whether the process has begun to exit, by its flags in /proc/PID/stat (proc(5)); none when they
-/// cannot be read. The kernel sets PF_EXITING before it closes the descriptors of a process.
-std::optional<bool> isExiting(pid_t pid) {
+/// Whether a thread has begun to exit, by the flags in its stat file (proc(5)); none when they cannot
+/// be read. The kernel sets PF_EXITING before it closes the descriptors that the thread shares.
+std::optional<bool> threadIsExiting(const std::string& directory) {
   constexpr unsigned long kExiting = 0x4;  // PF_EXITING of the kernel's sched.h
-  const Descriptor file(
-      ::open(("/proc/" + std::to_string(pid) + "/stat").c_str(), O_RDONLY | O_CLOEXEC));
+  const Descriptor file(::open((directory + "/stat").c_str(), O_RDONLY | O_CLOEXEC));
   std::array<char, 1024> bytes{};  // the flags come within the first hundred or so
   const ssize_t size = file.fd() < 0 ? -1 : ::read(file.fd(), bytes.data(), bytes.size());
   if (size <= 0) return std::nullopt;
@@ -70,6 +71,21 @@ std::optional<bool> isExiting(pid_t pid) {
   unsigned long flags = 0;
   if (!(fields >> flags)) return std::nullopt;
   return (flags & kExiting) != 0;
+}
+
+/// Whether the process has begun to exit; none when that cannot be read. The flags of a process are
+/// those of its main thread, which may have ended for good while others work on, so that each is
+/// looked at. One that has gone meanwhile has exited.
+std::optional<bool> processIsExiting(pid_t pid) {
+  const std::string directory = "/proc/" + std::to_string(pid);
+  const std::optional<bool> of_main_thread = threadIsExiting(directory);
+  if (of_main_thread != true) return of_main_thread;
+  std::error_code problem;
+  for (std::filesystem::directory_iterator threads(directory + "/task", problem), end;
+       !problem && threads != end; threads.increment(problem)) {
+    if (threadIsExiting(threads->path().string()) == false) return false;
+  }
+  return problem ? std::nullopt : of_main_thread;
 }
 
 }  // namespace
@@ -90,7 +106,7 @@ void PeerProcess::whenKnown(std::uint64_t patience_ns, std::function<void(bool)>
     tell(died_already_);
     return;
   }
-  const std::optional<bool> is_exiting = pid_ > 0 ? isExiting(pid_) : std::nullopt;
+  const std::optional<bool> is_exiting = pid_ > 0 ? processIsExiting(pid_) : std::nullopt;
   if (isDead(pidfd_->fd())) {  // so that the number may be another one's by now
     tell(true);
     return;

@@ -4,15 +4,19 @@
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/prctl.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <systemd/sd-daemon.h>
 #include <unistd.h>
 
 #include <array>
 #include <cstdlib>
+#include <fstream>
 #include <functional>
+#include <iterator>
 #include <optional>
 #include <string>
+#include <thread>
 
 #include "tests/linux/ipc/ipc_world.h"
 
@@ -54,6 +58,7 @@ class OtherProcess {
   OtherProcess(const OtherProcess&) = delete;
   OtherProcess& operator=(const OtherProcess&) = delete;
 
+  [[nodiscard]] pid_t pid() const { return pid_; }
   void end() {
     if (pid_ <= 0) return;
     ::kill(pid_, SIGKILL);
@@ -65,28 +70,30 @@ class OtherProcess {
   pid_t pid_ = -1;
 };
 
-/// What is said of this process at the other end of a socket, if it is said at once.
-std::optional<bool> hasDied(IpcLoop& loop) {
-  const SocketPair pair = makeSocketPair();
+/// What is said of the process at the other end of a socket, if it is said at once. `meanwhile` comes
+/// after it was remembered.
+std::optional<bool> hasDied(
+    IpcLoop& loop, int socket, const std::function<void()>& meanwhile = [] {}) {
+  std::optional<PeerProcess> peer;
   std::optional<bool> died;
+  loop.runAndWait([&] { peer.emplace(loop).remember(socket); });
+  meanwhile();
   loop.runAndWait([&] {
-    PeerProcess peer(loop);
-    peer.remember(pair.first->fd());
-    peer.whenKnown(10'000'000'000, [&died](bool has_died) { died = has_died; });
-    peer.forget();
+    peer->whenKnown(10'000'000'000, [&died](bool has_died) { died = has_died; });
+    peer.reset();
   });
   return died;
 }
 
 TEST(PeerProcess, ThatLivesIsKnownToLiveAtOnce) {
-  TestServer server;
-  EXPECT_EQ(hasDied(server.loop), false);
+  IpcLoop loop;
+  EXPECT_EQ(hasDied(loop, makeSocketPair().first->fd()), false);
 }
 
 TEST(PeerProcess, IsNotHeldForDyingBecauseItsNameLooksLikeTheFlagsOfOneThatDies) {
-  TestServer server;
+  IpcLoop loop;
   const ProcessName name(")R 1 1 1 1 1 4");
-  EXPECT_EQ(hasDied(server.loop), false);
+  EXPECT_EQ(hasDied(loop, makeSocketPair().first->fd()), false);
 }
 
 /// As the service manager hands it over.
@@ -106,17 +113,40 @@ TEST(PeerProcess, AtASocketThatWasHandedOverIsWhoListensThereNow) {
   ASSERT_NE(listening, nullptr) << why;
   OtherProcess successor([&](int ready) { takeOver(listening->fd(), ready); });
   IpcLoop loop;
-  std::optional<PeerProcess> peer;
-  std::optional<bool> died;
   const auto connected = connectSocket(directory / "s", why);
   ASSERT_NE(connected, nullptr) << why;
-  loop.runAndWait([&] { peer.emplace(loop).remember(connected->fd()); });
-  successor.end();
-  loop.runAndWait([&] {
-    peer->whenKnown(10'000'000'000, [&died](bool has_died) { died = has_died; });
-    peer.reset();
-  });
-  EXPECT_EQ(died, true);
+  EXPECT_EQ(hasDied(loop, connected->fd(), [&] { successor.end(); }), true);
+}
+
+/// Listens, and goes on without its main thread.
+void listenInAnotherThread(const std::string& path, int ready) {
+  std::string why;
+  static SharedDescriptor listening;  // of the process, whichever threads it has
+  listening = bindListeningSocket(path, 0600, why);
+  if (listening == nullptr || ::write(ready, "x", 1) != 1) ::_exit(1);
+  std::thread([] {
+    while (true) ::pause();
+  }).detach();
+  ::syscall(SYS_exit, 0);
+}
+
+char stateOfMainThread(pid_t pid) {
+  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
+  const std::string text((std::istreambuf_iterator<char>(file)), {});
+  const std::size_t name_end = text.rfind(") ");
+  return name_end == std::string::npos ? '?' : text.at(name_end + 2);
+}
+
+TEST(PeerProcess, WhoseMainThreadHasEndedLivesWhileAnotherOneDoes) {
+  const spacekeep::test::TemporaryDirectory directory;
+  OtherProcess process([&](int ready) { listenInAnotherThread(directory / "s", ready); });
+  ASSERT_TRUE(eventually([&] { return stateOfMainThread(process.pid()) == 'Z'; }));
+  IpcLoop loop;
+  std::string why;
+  const auto connected = connectSocket(directory / "s", why);
+  ASSERT_NE(connected, nullptr) << why;
+  EXPECT_EQ(hasDied(loop, connected->fd()), false);
+  EXPECT_EQ(hasDied(loop, connected->fd(), [&] { process.end(); }), true);
 }
 
 }  // namespace

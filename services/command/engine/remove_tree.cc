@@ -7,11 +7,12 @@
 
 #include <cerrno>
 #include <memory>
-#include <string>
-#include <vector>
+#include <optional>
 
 #include "services/cachedir/engine/beneath.h"
 #include "services/cachedir/engine/entry.h"
+#include "services/cachedir/engine/file_guard.h"
+#include "services/cachedir/engine/own_blocks.h"
 
 namespace spacekeep::command {
 namespace {
@@ -40,6 +41,38 @@ Directory opened(int folder_fd, const char* name) {
   return directory;
 }
 
+cachedir::UniqueFd openedFile(int folder_fd, const char* name) {
+  struct stat facts {};
+  if (::fstatat(folder_fd, name, &facts, AT_SYMLINK_NOFOLLOW) != 0 || !S_ISREG(facts.st_mode)) {
+    return cachedir::UniqueFd();
+  }
+  return cachedir::openBeneath(folder_fd, name, O_RDONLY | O_NONBLOCK | O_NOCTTY);
+}
+
+/// One file that is to be unlinked, and what that gives back.
+class Going {
+ public:
+  /// `fd` stays the caller's.
+  explicit Going(int fd) : fd_(fd), guard_(fd) {
+    struct stat facts {};
+    if (::fstat(fd_, &facts) == 0) bytes_ = cachedir::ownBytes(fd_, facts);
+  }
+
+  /// Asked afterwards. Nothing while it has another name, or somebody has it open.
+  [[nodiscard]] std::uint64_t cameBack() const {
+    using Verdict = cachedir::FileGuard::Verdict;
+    if (guard_.verdict() == Verdict::kOpen || guard_.verdict() == Verdict::kLocked) return 0;
+    struct stat facts {};
+    const bool gone = ::fstat(fd_, &facts) == 0 && facts.st_nlink == 0;
+    return gone && guard_.stillAlone() ? bytes_ : 0;
+  }
+
+ private:
+  const int fd_;
+  const cachedir::FileGuard guard_;
+  std::uint64_t bytes_ = 0;
+};
+
 class Removal {
  public:
   explicit Removal(const cachedir::CancelToken& cancel) : cancel_(cancel) {}
@@ -57,19 +90,29 @@ class Removal {
     return empty && (::unlinkat(folder_fd, name, AT_REMOVEDIR) == 0 || errno == ENOENT);
   }
 
+  [[nodiscard]] std::uint64_t bytes() const { return bytes_; }
+
  private:
   bool removeEntry(int folder_fd, const char* name, std::size_t depth) {
-    if (::unlinkat(folder_fd, name, 0) == 0 || errno == ENOENT) return true;
-    return errno == EISDIR && remove(folder_fd, name, depth + 1);
+    const cachedir::UniqueFd fd = openedFile(folder_fd, name);
+    const std::optional<Going> going = fd ? std::optional<Going>(fd.get()) : std::nullopt;
+    if (::unlinkat(folder_fd, name, 0) == 0) {
+      if (going) bytes_ += going->cameBack();
+      return true;
+    }
+    return errno == ENOENT || (errno == EISDIR && remove(folder_fd, name, depth + 1));
   }
 
   const cachedir::CancelToken& cancel_;
+  std::uint64_t bytes_ = 0;
 };
 
 }  // namespace
 
-bool removeTree(int folder_fd, const char* name, const cachedir::CancelToken& cancel) {
-  return Removal(cancel).remove(folder_fd, name, 0);
+Removed removeTree(int folder_fd, const char* name, const cachedir::CancelToken& cancel) {
+  Removal removal(cancel);
+  const bool all = removal.remove(folder_fd, name, 0);
+  return {all, removal.bytes()};
 }
 
 }  // namespace spacekeep::command

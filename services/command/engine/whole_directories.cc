@@ -19,7 +19,6 @@
 #include "services/command/base/path_patterns.h"
 #include "services/command/engine/left_overs.h"
 #include "services/command/engine/lived_in.h"
-#include "services/command/engine/measure.h"
 #include "services/command/engine/opt_out.h"
 #include "services/command/engine/remove_tree.h"
 #include "support/runtime/runtime.h"
@@ -205,13 +204,6 @@ class Check {
   bool whole_ = false;
 };
 
-std::uint64_t occupiedBy(const std::string& path) {
-  cachedir::Rules rules;
-  rules.directories.push_back({.path = path});
-  const cachedir::OpenedRoots opened = openRoots(rules, std::nullopt);
-  return measure(opened.roots, CancelToken()).bytes;
-}
-
 /// One request's removing of directories.
 class Removing {
  public:
@@ -233,7 +225,7 @@ class Removing {
     const Terms terms{.latest_ns = unit.used_ns};
     const Checked checked = Check(place, going, terms, open_files_, cancel_).result();
     if (checked.all && place.rename(going, kHalfPrefix + name)) {
-      return removeHalf(place, name, checked.bytes);
+      return removeHalf(place, name);
     }
     if (checked.all) problems_.push_back(path + ": what is left of an earlier one is in the way");
     if (!place.rename(going, name)) {
@@ -256,6 +248,11 @@ class Removing {
     return freed;
   }
 
+  /// Until the file system shows what was freed.
+  void waitForSpace() {
+    if (space_) space_->wait(cancel_);
+  }
+
  private:
   std::uint64_t finishIn(const Place& place, const cachedir::DirectoryRule& rule) {
     std::uint64_t freed = 0;
@@ -276,7 +273,7 @@ class Removing {
     const Checked checked = wanted ? check.result() : Checked();
     const bool half = left.prefix == kHalfPrefix;
     if (checked.all && (half || place.rename(now, kHalfPrefix + left.name))) {
-      return removeHalf(place, left.name, checked.bytes);
+      return removeHalf(place, left.name);
     }
     if (!checked.all && !half && !cancel_.cancelled()) {
       static_cast<void>(place.rename(now, left.name));
@@ -284,18 +281,22 @@ class Removing {
     return 0;
   }
 
-  std::uint64_t removeHalf(const Place& place, const std::string& name, std::uint64_t bytes) {
+  std::uint64_t removeHalf(const Place& place, const std::string& name) {
     const std::string half = kHalfPrefix + name;
-    const std::string path = place.path + "/" + half;
-    if (removeTree(place.fd.get(), half.c_str(), cancel_)) return bytes;
-    if (!cancel_.cancelled()) problems_.push_back(path + ": not all of it could be removed");
-    return bytes - std::min(bytes, occupiedBy(path));
+    if (!space_) space_.emplace(place.fd.get());
+    const Removed removed = removeTree(place.fd.get(), half.c_str(), cancel_);
+    space_->add(removed.bytes);
+    if (!removed.all && !cancel_.cancelled()) {
+      problems_.push_back(place.path + "/" + half + ": not all of it could be removed");
+    }
+    return removed.bytes;
   }
 
   const std::optional<std::string>& volume_;
   cachedir::OpenFiles& open_files_;
   const CancelToken& cancel_;
   std::vector<std::string>& problems_;
+  std::optional<cachedir::SpaceReturn> space_;  // since the first removal
 };
 
 }  // namespace
@@ -328,9 +329,6 @@ WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::Rules& patte
   result.problems.insert(result.problems.end(), found.problems.begin(), found.problems.end());
   std::ranges::sort(found.units, {}, [](const Unit& unit) { return unit.used_ns; });
   const std::int64_t now_ns = rt::wallClockNs();
-  if (found.units.empty()) return result;
-  const std::uint64_t old_work = result.bytes;
-  cachedir::SpaceReturn space(found.opened.roots.front().fd.get());
   for (const Unit& unit : found.units) {
     if (result.bytes >= request.amount || cancel.cancelled()) break;
     if (cachedir::mildestUrgency(*unit.rule, unit.used_ns, now_ns) > request.urgency) continue;
@@ -347,10 +345,7 @@ WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::Rules& patte
     result.bytes += bytes;
     if (visit && bytes > 0) visit(path + "/", bytes);
   }
-  if (!request.dry_run) {
-    space.add(result.bytes - old_work);
-    space.wait(cancel);
-  }
+  removing.waitForSpace();
   return result;
 }
 

@@ -436,6 +436,31 @@ TEST_F(WholeDirectories, AfterACancelTheRestNeverGetsItsNameBackAndGoesOnceNobod
   EXPECT_FALSE(exists(rest));
 }
 
+TEST_F(WholeDirectories, WhatAnotherTookMeanwhileIsNotClaimed) {
+  const std::string going = leftOf("oldest", kHalfPrefix) + "/g";
+  const CancelToken another_takes_a_file([&going] {
+    static_cast<void>(::unlink(going.c_str()));
+    return false;
+  });
+  EXPECT_EQ(cache()->free(request(1, 1), another_takes_a_file, {}).bytes, kMiB);
+  EXPECT_FALSE(exists(volume_ / "all/oldest"));
+}
+
+TEST_F(WholeDirectories, TheAnswerComesOnceTheFileSystemShowsAlsoWhatWasLeft) {
+  const Volume volume("btrfs");
+  for (int i = 0; i < 50; ++i) {
+    writeFile(volume / "all/" + kGoingPrefix + "x/" + std::to_string(i), kMiB);
+  }
+  volume.settle();
+  const auto all = makeCache(
+      ruleFrom(directory(volume / "all/*", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
+  const std::uint64_t before = volume.freeBytes();
+  Request on = request(1);
+  on.volume = volume.path();
+  EXPECT_EQ(all->free(on, CancelToken(), {}).bytes, 50 * kMiB);
+  EXPECT_GE(volume.freeBytes(), before + 50 * kMiB);
+}
+
 TEST_F(WholeDirectories, WhatWasLeftOnAnotherVolumeStaysAndDoesNotCount) {
   const Volume other("tmpfs");
   writeFile(leftOf("gone") + "/f", kMiB, 1);

@@ -11,11 +11,9 @@
 #include <fstream>
 
 #include "services/cachedir/engine/link_groups.h"
-#include "services/command/engine/directory_cache.h"
 #include "services/command/engine/in_use.h"
-#include "services/command/engine/left_overs.h"
 #include "services/command/engine/opt_out.h"
-#include "tests/linux/command/command_world.h"
+#include "tests/linux/command/directory_world.h"
 
 namespace spacekeep::command {
 namespace {
@@ -26,22 +24,6 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::StartsWith;
 using testing::UnorderedElementsAre;
-
-std::string directory(const std::string& path, const std::string& more = "") {
-  return "<key>DIRECTORIES</key><array><dict><key>PATH</key><string>" + path + "</string>" + more +
-         "</dict></array>";
-}
-
-class DirectoryCacheTest : public testing::Test {
- protected:
-  [[nodiscard]] Request request(int urgency, std::uint64_t amount = 100 * kMiB) const {
-    return {.amount = amount, .urgency = urgency, .volume = volume_.path()};
-  }
-  [[nodiscard]] std::array<std::uint64_t, 4> offered(const Cache& cache) const {
-    return cache.offer(volume_.path(), CancelToken()).bytes;
-  }
-  Volume volume_{"ext4"};
-};
 
 TEST_F(DirectoryCacheTest, FilesOfAllDirectoriesThatMatchGoByAge) {
   writeFile(volume_ / "p1/cache/old", kMiB, 40);
@@ -199,39 +181,6 @@ TEST_F(DirectoryCacheTest, TheOwnersLockIsHeldAsTheOwnerHoldsIt) {
             (volume_ / "lock") + " is locked");
   EXPECT_FALSE(exists(volume_ / "not-there"));
 }
-
-class WholeDirectories : public DirectoryCacheTest {
- protected:
-  void SetUp() override {
-    writeFile(volume_ / "all/oldest/deep/f", kMiB, 300);
-    writeFile(volume_ / "all/oldest/g", kMiB, 250);
-    writeFile(volume_ / "all/older/f", kMiB, 220);
-    writeFile(volume_ / "all/mixed/old", kMiB, 300);
-    writeFile(volume_ / "all/mixed/young", kMiB, 2);
-    volume_.settle();
-  }
-  [[nodiscard]] std::unique_ptr<Cache> cache(const std::string& more = "") const {
-    return makeCache(
-        ruleFrom(directory(volume_ / "all/*", "<key>WHOLE_DIRECTORIES</key><true/>" + more)),
-        nullptr);
-  }
-  /// Frees at `urgency`, and has `happen` run once the first directory has gone; all that went.
-  [[nodiscard]] std::vector<std::string> goneWhile(int urgency,
-                                                   const std::function<void()>& happen) const {
-    std::vector<std::string> gone;
-    const auto visit = [&](const std::string& what, std::optional<std::uint64_t>) {
-      gone.push_back(what);
-      if (gone.size() == 1) happen();
-    };
-    static_cast<void>(cache()->free(request(urgency), CancelToken(), visit));
-    return gone;
-  }
-  /// What an earlier request left of the directory of that name.
-  [[nodiscard]] std::string leftOf(const std::string& name,
-                                   const char* prefix = kGoingPrefix) const {
-    return volume_ / ("all/" + std::string(prefix) + name);
-  }
-};
 
 TEST_F(WholeDirectories, ADirectoryIsAsYoungAsItsYoungestFileAndTheOldestGoesFirst) {
   const auto all = cache();
@@ -394,48 +343,6 @@ TEST_F(WholeDirectories, OneInWhichSomethingIsMountedWhileAnotherGoesIsKept) {
   cachedir::run("umount " + place);
 }
 
-TEST_F(WholeDirectories, WhatWasLeftIsKeptWhileItIsInUseAndGetsItsNameBackIfThatIsFree) {
-  const std::function<bool(const std::string&)> uses[] = {
-      [](const std::string& left) { return ::open((left + "/f").c_str(), O_RDONLY) >= 0; },
-      [](const std::string& left) {
-        return ::flock(::open((left + "/f").c_str(), O_RDONLY), LOCK_SH) == 0;
-      },
-      [](const std::string& left) { return ::chdir(left.c_str()) == 0; },
-      [](const std::string& left) { return ::open(left.c_str(), O_DIRECTORY) >= 0; },
-      [](const std::string& left) { return ::mkfifo((left + "/pipe").c_str(), 0600) == 0; }};
-  for (const auto& use : uses) {
-    writeFile(leftOf("free") + "/f", kMiB, 1);
-    writeFile(leftOf("taken") + "/f", kMiB, 1);
-    writeFile(volume_ / "all/taken/new", kMiB, 0);
-    volume_.settle();
-    {
-      const cachedir::Holder holder([&] { return use(leftOf("free")); });
-      const cachedir::Holder another([&] { return use(leftOf("taken")); });
-      EXPECT_THAT(cache()->free(request(1), CancelToken(), {}).problems, IsEmpty());
-    }
-    EXPECT_TRUE(exists(volume_ / "all/free/f"));
-    EXPECT_TRUE(exists(leftOf("taken") + "/f"));
-    EXPECT_TRUE(exists(volume_ / "all/taken/new"));
-    cachedir::run("rm -rf " + (volume_ / "all/free") + " " + leftOf("taken"));
-  }
-}
-
-TEST_F(WholeDirectories, AfterACancelTheRestNeverGetsItsNameBackAndGoesOnceNobodyUsesIt) {
-  const std::string rest = leftOf("oldest", kHalfPrefix);
-  const CancelToken once_it_goes([&rest] { return exists(rest); });
-  EXPECT_EQ(cache()->free(request(1), once_it_goes, {}).bytes, 0U);
-  ASSERT_TRUE(exists(rest + "/g"));
-  EXPECT_FALSE(exists(volume_ / "all/oldest"));
-  {
-    const cachedir::Holder holder([&rest] { return ::open((rest + "/g").c_str(), O_RDONLY) >= 0; });
-    EXPECT_EQ(cache()->free(request(1), CancelToken(), {}).bytes, kMiB) << "of another one";
-    EXPECT_TRUE(exists(rest + "/g"));
-    EXPECT_FALSE(exists(volume_ / "all/oldest"));
-  }
-  EXPECT_EQ(cache()->free(request(3), CancelToken(), {}).bytes, 4 * kMiB);
-  EXPECT_FALSE(exists(rest));
-}
-
 TEST_F(WholeDirectories, WhatAnotherTookMeanwhileIsNotClaimed) {
   const std::string going = leftOf("oldest", kHalfPrefix) + "/g";
   const CancelToken another_takes_a_file([&going] {
@@ -444,30 +351,6 @@ TEST_F(WholeDirectories, WhatAnotherTookMeanwhileIsNotClaimed) {
   });
   EXPECT_EQ(cache()->free(request(1, 1), another_takes_a_file, {}).bytes, kMiB);
   EXPECT_FALSE(exists(volume_ / "all/oldest"));
-}
-
-TEST_F(WholeDirectories, TheAnswerComesOnceTheFileSystemShowsAlsoWhatWasLeft) {
-  const Volume volume("btrfs");
-  for (int i = 0; i < 50; ++i) {
-    writeFile(volume / "all/" + kGoingPrefix + "x/" + std::to_string(i), kMiB);
-  }
-  volume.settle();
-  const auto all = makeCache(
-      ruleFrom(directory(volume / "all/*", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
-  const std::uint64_t before = volume.freeBytes();
-  Request on = request(1);
-  on.volume = volume.path();
-  EXPECT_EQ(all->free(on, CancelToken(), {}).bytes, 50 * kMiB);
-  EXPECT_GE(volume.freeBytes(), before + 50 * kMiB);
-}
-
-TEST_F(WholeDirectories, WhatWasLeftOnAnotherVolumeStaysAndDoesNotCount) {
-  const Volume other("tmpfs");
-  writeFile(leftOf("gone") + "/f", kMiB, 1);
-  Request elsewhere = request(4);
-  elsewhere.volume = other.path();
-  EXPECT_EQ(cache()->free(elsewhere, CancelToken(), {}).bytes, 0U);
-  EXPECT_TRUE(exists(leftOf("gone") + "/f"));
 }
 
 TEST_F(WholeDirectories, ASubvolumeInsideKeepsAllOfIt) {
@@ -484,81 +367,6 @@ TEST_F(WholeDirectories, ASubvolumeInsideKeepsAllOfIt) {
   EXPECT_THAT(freeAsForetold(*all, on).what, ElementsAre(volume / "all/two/"));
   EXPECT_TRUE(exists(volume / "all/one/f"));
   EXPECT_TRUE(exists(volume / "all/one/inner/f"));
-}
-
-TEST_F(WholeDirectories, WhatACrashLeftIsFinishedFirstAndCounts) {
-  const std::string left = leftOf("gone");
-  writeFile(left + "/f", kMiB, 1);
-  volume_.settle();
-  const Went went{cache()->free(request(1, kMiB), CancelToken(), {}), {}, 0};
-  EXPECT_EQ(went.result.bytes, kMiB);
-  EXPECT_FALSE(exists(left));
-  EXPECT_TRUE(exists(volume_ / "all/oldest")) << "the rest of the last one was enough";
-}
-
-TEST_F(WholeDirectories, WhatWasLeftGoesAlsoWhereNoOtherDirectoryIs) {
-  const std::string left = volume_ / ("alone/" + std::string(kGoingPrefix) + "x");
-  writeFile(left + "/f", kMiB, 1);
-  volume_.settle();
-  const auto alone = makeCache(
-      ruleFrom(directory(volume_ / "al*e/*", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
-  EXPECT_EQ(alone->free(request(1), CancelToken(), {}).bytes, kMiB);
-  EXPECT_FALSE(exists(left));
-}
-
-TEST_F(WholeDirectories, WhatWasLeftIsKeptByNameOrMarkerAndGetsItsNameBackIfNothingHadGone) {
-  for (const char* name : {"kept", "marked"}) {
-    for (const char* prefix : {kGoingPrefix, kHalfPrefix}) {
-      writeFile(leftOf(name, prefix) + "/f", kMiB, 1);
-    }
-  }
-  for (const char* prefix : {kGoingPrefix, kHalfPrefix}) {
-    writeFile(leftOf("marked", prefix) + "/" + kOptOutMarker, 0);
-  }
-  volume_.settle();
-  const auto keeping = cache("<key>KEEP</key>" + arrayOf({"kept", "old*", "mixed"}));
-  EXPECT_EQ(keeping->free(request(4), CancelToken(), {}).bytes, 0U);
-  for (const char* name : {"kept", "marked"}) {
-    EXPECT_TRUE(exists(volume_ / "all" + "/" + name + "/f"));
-    EXPECT_TRUE(exists(leftOf(name, kHalfPrefix) + "/f"));
-  }
-}
-
-TEST_F(WholeDirectories, WhatWasLeftOfADirectoryOfAnotherPatternIsNoneOfTheRules) {
-  writeFile(leftOf("oth\\er") + "/f", kMiB, 1);
-  volume_.settle();
-  for (const char* pattern : {"all/o?d*", "all/.*", "all/oth"}) {
-    const auto another = makeCache(
-        ruleFrom(directory(volume_ / pattern, "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
-    static_cast<void>(another->free(request(4), CancelToken(), {}));
-    EXPECT_TRUE(exists(leftOf("oth\\er") + "/f")) << pattern;
-  }
-  const auto its_own = makeCache(
-      ruleFrom(directory(volume_ / "all/oth\\er", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
-  EXPECT_EQ(its_own->free(request(1), CancelToken(), {}).bytes, kMiB);
-}
-
-TEST_F(WholeDirectories, TwoThatWereLeftOfOneNameBothGoAtOnce) {
-  writeFile(leftOf("gone") + "/f", kMiB, 1);
-  writeFile(leftOf("gone", kHalfPrefix) + "/f", kMiB, 1);
-  volume_.settle();
-  EXPECT_EQ(cache()->free(request(1, 2 * kMiB), CancelToken(), {}).bytes, 2 * kMiB);
-  EXPECT_FALSE(exists(leftOf("gone")));
-}
-
-TEST_F(WholeDirectories, WhatWasLeftIsLookedForInTheVeryFoldersWhateverTheirNames) {
-  const std::string left = std::string("/") + kHalfPrefix + "x";
-  for (const char* folder : {"each/a", "each/[ab]", "each/?"}) {
-    writeFile(volume_ / folder + left + "/f", kMiB, 1);
-    writeFile(volume_ / folder + "/present/f", kMiB, 1);
-  }
-  volume_.settle();
-  const auto each = makeCache(
-      ruleFrom(directory(volume_ / "each/*/*", "<key>WHOLE_DIRECTORIES</key><true/>")), nullptr);
-  EXPECT_EQ(each->free(request(1), CancelToken(), {}).bytes, 3 * kMiB);
-  for (const char* folder : {"each/a", "each/[ab]", "each/?"}) {
-    EXPECT_FALSE(exists(volume_ / folder + left));
-  }
 }
 
 TEST_F(WholeDirectories, AFileThatIsLinkedElsewhereGivesNothingAndGoes) {

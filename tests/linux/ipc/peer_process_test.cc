@@ -118,6 +118,19 @@ TEST(PeerProcess, AtASocketThatWasHandedOverIsWhoListensThereNow) {
   EXPECT_EQ(hasDied(loop, connected->fd(), [&] { successor.end(); }), true);
 }
 
+TEST(PeerProcess, ThatHadDiedBeforeAnybodyConnectedIsKnownToBeDead) {
+  const spacekeep::test::TemporaryDirectory directory;
+  std::string why;
+  const auto listening = bindListeningSocket(directory / "s", 0600, why);
+  ASSERT_NE(listening, nullptr) << why;
+  OtherProcess successor([&](int ready) { takeOver(listening->fd(), ready); });
+  successor.end();
+  IpcLoop loop;
+  const auto connected = connectSocket(directory / "s", why);
+  ASSERT_NE(connected, nullptr) << why;
+  EXPECT_EQ(hasDied(loop, connected->fd()), true);
+}
+
 /// Listens, and goes on without its main thread.
 void listenInAnotherThread(const std::string& path, int ready) {
   std::string why;

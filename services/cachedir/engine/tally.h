@@ -4,6 +4,7 @@
 // answer here.
 #pragma once
 
+#include <algorithm>
 #include <array>
 #include <cstddef>
 #include <cstdint>
@@ -41,6 +42,9 @@ struct Tally {
   std::array<std::uint64_t, static_cast<std::size_t>(Left::kCount)> counts{};
 
   void add(Left why) { ++counts[static_cast<std::size_t>(why)]; }
+  [[nodiscard]] bool empty() const {
+    return std::ranges::all_of(counts, [](std::uint64_t count) { return count == 0; });
+  }
   [[nodiscard]] std::uint64_t of(Left why) const { return counts[static_cast<std::size_t>(why)]; }
 };
 

@@ -15,6 +15,7 @@
 #include <cstdlib>
 #include <fstream>
 #include <memory>
+#include <optional>
 #include <string_view>
 
 #include "services/cachedir/engine/beneath.h"
@@ -68,9 +69,12 @@ bool isIdle(const std::string& process, const std::vector<std::string>& idle) {
       idle, [&](const std::string& name) { return comm == name.substr(0, kCommBytes); });
 }
 
-bool runs(const Condition& condition, const std::string& proc) {
+/// None when nobody can tell.
+using Answer = std::optional<bool>;
+
+Answer runs(const Condition& condition, const std::string& proc) {
   const std::unique_ptr<DIR, DirectoryCloser> processes(::opendir(proc.c_str()));
-  if (!processes) return true;  // nobody can tell
+  if (!processes) return std::nullopt;
   while (const dirent* entry = ::readdir(processes.get())) {
     if (entry->d_name[0] < '0' || entry->d_name[0] > '9') continue;
     const std::string process = proc + "/" + entry->d_name;
@@ -82,22 +86,27 @@ bool runs(const Condition& condition, const std::string& proc) {
   return false;
 }
 
-bool livesByPidFile(const std::string& path, const std::string& proc) {
-  std::ifstream stream(path);
+/// The number is asked for and not looked up in /proc, which may hide others' processes (hidepid).
+Answer livesByPidFile(const std::string& path) {
+  const cachedir::UniqueFd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  if (!fd) return errno == ENOENT ? Answer(false) : std::nullopt;
+  char text[64] = {};
+  if (::read(fd.get(), text, sizeof text - 1) < 0) return std::nullopt;
   long pid = 0;
-  return stream >> pid && pid > 0 && pid <= INT_MAX &&
-         ::access((proc + "/" + std::to_string(pid)).c_str(), F_OK) == 0;
+  return std::sscanf(text, "%ld", &pid) == 1 && pid > 0 && pid <= INT_MAX &&
+         (::kill(static_cast<pid_t>(pid), 0) == 0 || errno != ESRCH);
 }
 
-/// Also when nobody can tell.
-bool isAnyOpenBelow(const std::string& pattern) {
+/// What is hidden of others does not count for a user, to whom nearly all of them are hidden.
+Answer isAnyOpenBelow(const std::string& pattern, const std::string& proc) {
   cachedir::Rules rules;
   for (std::string& path : matchesOf(pattern))
     rules.directories.push_back({.path = std::move(path)});
   const cachedir::OpenedRoots opened = openRoots(rules, std::nullopt);
-  cachedir::OpenFiles open_files;
+  if (!opened.problems.empty()) return std::nullopt;
   if (opened.roots.empty()) return false;
-  if (!open_files.scan(opened.roots, cachedir::CancelToken())) return true;
+  cachedir::OpenFiles open_files(proc);
+  if (!open_files.scan(opened.roots, cachedir::CancelToken())) return std::nullopt;
   bool found = false;
   cachedir::Tally tally;
   cachedir::TreeWalk(opened.roots)
@@ -107,21 +116,47 @@ bool isAnyOpenBelow(const std::string& pattern) {
             found = found || open_files.holds(file.inode, root.file_system);
           },
           cachedir::CancelToken([&found] { return found; }), tally);
-  return found;
+  if (found) return true;
+  return open_files.hiddenOwnProcesses() == 0 && tally.empty() ? Answer(false) : std::nullopt;
+}
+
+/// The lines of /proc/locks as proc_locks(5) describes them. Device numbers in them are those of the
+/// file system; on btrfs a file's own differ, so there the number of the inode decides alone.
+Answer hasLock(const std::string& path, const std::string& proc) {
+  struct stat facts {};
+  if (::stat(path.c_str(), &facts) != 0) return errno == ENOENT ? Answer(false) : std::nullopt;
+  std::ifstream table(proc + "/locks");
+  if (!table) return std::nullopt;
+  for (std::string line; std::getline(table, line);) {
+    unsigned major_number = 0, minor_number = 0;
+    unsigned long long inode = 0;
+    if (std::sscanf(line.c_str(), "%*d: %*s %*s %*s %*d %x:%x:%llu", &major_number, &minor_number,
+                    &inode) != 3 ||
+        inode != facts.st_ino) {
+      continue;
+    }
+    const bool virtual_device = major(facts.st_dev) == 0;
+    if (virtual_device || makedev(major_number, minor_number) == facts.st_dev) return true;
+  }
+  return table.bad() ? std::nullopt : Answer(false);
+}
+
+std::string inWords(const Answer& answer, const std::string& what) {
+  if (!answer) return "nobody can tell whether " + what;
+  return *answer ? what : "";
 }
 
 std::string whyNot(const Condition& condition, const std::string& proc) {
+  const std::string& subject = condition.subject;
   switch (condition.kind) {
     case Condition::Kind::kProcess:
-      return runs(condition, proc) ? condition.subject + " is running" : "";
+      return inWords(runs(condition, proc), subject + " is running");
     case Condition::Kind::kLocked:
-      return isLocked(condition.subject, proc) ? condition.subject + " is locked" : "";
+      return inWords(hasLock(subject, proc), subject + " is locked");
     case Condition::Kind::kPidFile:
-      return livesByPidFile(condition.subject, proc)
-                 ? "the process of " + condition.subject + " is running"
-                 : "";
+      return inWords(livesByPidFile(subject), "the process of " + subject + " is running");
     case Condition::Kind::kOpen:
-      return isAnyOpenBelow(condition.subject) ? "a file in " + condition.subject + " is open" : "";
+      return inWords(isAnyOpenBelow(subject, proc), "a file in " + subject + " is open");
   }
   return "";
 }
@@ -161,24 +196,8 @@ bool ConditionWatch::holds() {
   return !why_.empty();
 }
 
-/// The lines of /proc/locks as proc_locks(5) describes them. Device numbers in them are those of the
-/// file system; on btrfs a file's own differ, so there the number of the inode decides alone.
 bool isLocked(const std::string& path, const std::string& proc) {
-  struct stat facts {};
-  if (::stat(path.c_str(), &facts) != 0) return false;
-  std::ifstream table(proc + "/locks");
-  for (std::string line; std::getline(table, line);) {
-    unsigned major_number = 0, minor_number = 0;
-    unsigned long long inode = 0;
-    if (std::sscanf(line.c_str(), "%*d: %*s %*s %*s %*d %x:%x:%llu", &major_number, &minor_number,
-                    &inode) != 3 ||
-        inode != facts.st_ino) {
-      continue;
-    }
-    const bool virtual_device = major(facts.st_dev) == 0;
-    if (virtual_device || makedev(major_number, minor_number) == facts.st_dev) return true;
-  }
-  return false;
+  return hasLock(path, proc).value_or(true);
 }
 
 std::string HeldLocks::take(const std::vector<OwnersLock>& wanted) {
@@ -194,7 +213,8 @@ std::string HeldLocks::take(const std::vector<OwnersLock>& wanted) {
 
 std::string whoHolds(const std::vector<OwnersLock>& locks) {
   for (const OwnersLock& lock : locks) {
-    if (isLocked(lock.path)) return lock.path + " is locked";
+    std::string why = inWords(hasLock(lock.path, "/proc"), lock.path + " is locked");
+    if (!why.empty()) return why;
   }
   return "";
 }

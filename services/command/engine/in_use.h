@@ -12,7 +12,8 @@
 
 namespace spacekeep::command {
 
-/// In words what holds ("firefox is running"), empty when nothing does.
+/// In words what holds ("firefox is running"), or of what nobody can tell whether it does; empty when
+/// nothing does.
 [[nodiscard]] std::string whyNotNow(const std::vector<Condition>& conditions,
                                     const std::string& proc = "/proc");
 
@@ -40,7 +41,8 @@ class ConditionWatch {
   std::string why_;
 };
 
-/// Whether somebody holds a lock of any kind on `path`, without touching the file.
+/// Whether somebody holds a lock of any kind on `path`, without touching the file. Also when nobody
+/// can tell.
 [[nodiscard]] bool isLocked(const std::string& path, const std::string& proc = "/proc");
 
 /// The owner's own locks, held until this is destroyed. A lock file that is not there is held by

@@ -31,8 +31,7 @@ Measured measureIf(const std::vector<Root>& roots, const Wanted& wanted,
     if (found.links == 1) return add(found.bytes);
     if (const auto group = groups.offer(found, 0)) add(group->bytes);
   };
-  sum.whole = cachedir::TreeWalk(roots).forEachFile(visit, cancel, tally) &&
-              std::ranges::all_of(tally.counts, [](std::uint64_t count) { return count == 0; });
+  sum.whole = cachedir::TreeWalk(roots).forEachFile(visit, cancel, tally) && tally.empty();
   return sum;
 }
 

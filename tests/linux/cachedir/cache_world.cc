@@ -144,6 +144,20 @@ Holder::~Holder() {
   ::waitpid(child_, nullptr, 0);
 }
 
+bool becomeNobody() {
+  return ::setresgid(kNobody, kNobody, kNobody) == 0 && ::setresuid(kNobody, kNobody, kNobody) == 0;
+}
+
+bool asAnother(const std::function<bool()>& become, const std::function<bool()>& body) {
+  const pid_t child = ::fork();
+  if (child == 0) ::_exit(become() && body() ? 0 : 1);
+  int status = 0;
+  EXPECT_EQ(::waitpid(child, &status, 0), child);
+  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+bool asNobody(const std::function<bool()>& body) { return asAnother(becomeNobody, body); }
+
 Rules rulesFor(const std::string& directory) {
   Rules rules;
   rules.service_id = "com.example.cache";

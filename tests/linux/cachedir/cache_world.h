@@ -62,6 +62,14 @@ class Holder {
   pid_t child_ = -1;
 };
 
+inline constexpr uid_t kNobody = 65534;
+/// Makes this process one of a user without any rights.
+bool becomeNobody();
+/// Runs `body` in another process once it has become what `become` makes of it; answers whether both
+/// said true.
+bool asAnother(const std::function<bool()>& become, const std::function<bool()>& body);
+bool asNobody(const std::function<bool()>& body);
+
 /// Rules for one directory, with the default ages.
 Rules rulesFor(const std::string& directory);
 

@@ -7,7 +7,6 @@
 #include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -172,12 +171,6 @@ TEST_P(InUse, AFileLinkedAfterTheWalkIsSpared) {
   EXPECT_TRUE(exists(held_));
 }
 
-constexpr uid_t kNobody = 65534;
-
-bool becomeNobody() {
-  return ::setresgid(kNobody, kNobody, kNobody) == 0 && ::setresuid(kNobody, kNobody, kNobody) == 0;
-}
-
 /// Keeps the privileges of which `keep` says so.
 bool limitPrivileges(const std::function<bool(unsigned)>& keep) {
   __user_cap_header_struct about{_LINUX_CAPABILITY_VERSION_3, 0};
@@ -190,18 +183,6 @@ bool limitPrivileges(const std::function<bool(unsigned)>& keep) {
   }
   return ::syscall(SYS_capset, &about, sets) == 0;
 }
-
-/// Runs `body` in another process once it has become what `become` makes of it; answers whether both
-/// said true.
-bool asAnother(const std::function<bool()>& become, const std::function<bool()>& body) {
-  const pid_t child = ::fork();
-  if (child == 0) ::_exit(become() && body() ? 0 : 1);
-  int status = 0;
-  EXPECT_EQ(::waitpid(child, &status, 0), child);
-  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
-}
-
-bool asNobody(const std::function<bool()>& body) { return asAnother(becomeNobody, body); }
 
 bool asRootWith(const std::function<bool(unsigned)>& privileges,
                 const std::function<bool()>& body) {

@@ -113,8 +113,6 @@ TEST_F(OpenFilesScan, AFileIsSeenThatIsHeldByAPathTooLongToBeTold) {
   EXPECT_TRUE(holds(held_));
 }
 
-constexpr uid_t kNobody = 65534;
-
 /// A /proc of one process that holds one file, looked at by another user.
 class HiddenProcesses : public testing::Test {
  protected:
@@ -128,22 +126,15 @@ class HiddenProcesses : public testing::Test {
   struct Hidden {
     std::uint64_t all = 0;
     std::uint64_t own = 0;
-    bool operator==(const Hidden&) const = default;
   };
   /// Whether another user finds so many hidden, once `limit` has been run.
   [[nodiscard]] bool findsHidden(
       const Hidden& hidden, const std::function<bool()>& limit = [] { return true; }) const {
-    const pid_t child = ::fork();
-    if (child == 0) {
+    return asNobody([&] {
       OpenFiles files(proc_);
-      const bool is_so = ::setresuid(kNobody, kNobody, kNobody) == 0 && limit() &&
-                         files.scan({}, {}) && files.hiddenProcesses() == hidden.all &&
-                         files.hiddenOwnProcesses() == hidden.own;
-      ::_exit(is_so ? 0 : 1);
-    }
-    int status = 0;
-    EXPECT_EQ(::waitpid(child, &status, 0), child);
-    return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+      return limit() && files.scan({}, {}) && files.hiddenProcesses() == hidden.all &&
+             files.hiddenOwnProcesses() == hidden.own;
+    });
   }
   void expectHiddenAfter(const std::string& change, const std::string& back) const {
     run(change);
@@ -208,24 +199,14 @@ TEST_F(HiddenProcesses, InAContainerAllOutsideAreHidden) {
 
 TEST_F(HiddenProcesses, APidNamespaceOfItsOwnCountsAsAContainer) {
   const std::string proc = temporaryDirectory();
-  const pid_t child = ::fork();
-  if (child == 0) {
-    if (::unshare(CLONE_NEWPID | CLONE_NEWNS) != 0) ::_exit(2);
-    const pid_t inside = ::fork();
-    if (inside == 0) {
-      OpenFiles files(proc);
-      const bool is_so = ::mount("none", proc.c_str(), "proc", 0, nullptr) == 0 &&
-                         files.scan({}, {}) && files.hiddenProcesses() == 1;
-      ::_exit(is_so ? 0 : 1);
-    }
-    int status = 0;
-    ::waitpid(inside, &status, 0);
-    ::_exit(WIFEXITED(status) ? WEXITSTATUS(status) : 3);
-  }
-  int status = 0;
-  ASSERT_EQ(::waitpid(child, &status, 0), child);
-  EXPECT_TRUE(WIFEXITED(status));
-  EXPECT_EQ(WEXITSTATUS(status), 0);
+  const auto leave = [] { return ::unshare(CLONE_NEWPID | CLONE_NEWNS) == 0; };
+  const auto is_so = [&proc] {
+    OpenFiles files(proc);
+    return ::mount("none", proc.c_str(), "proc", 0, nullptr) == 0 && files.scan({}, {}) &&
+           files.hiddenProcesses() == 1;
+  };
+  // The first child is the first process of the new name space.
+  EXPECT_TRUE(asAnother(leave, [&] { return asAnother([] { return true; }, is_so); }));
 }
 
 }  // namespace

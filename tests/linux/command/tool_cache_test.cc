@@ -303,7 +303,10 @@ TEST_F(ToolCacheTest, WhileAnyFileInItIsOpenNothingIsTakenIfTheRuleSaysSo) {
         [this] { return ::open((cache_ + "/new1").c_str(), O_RDONLY) >= 0; });
     EXPECT_EQ(freeAsForetold(*kept, request(4)).result.note, "a file in " + cache_ + " is open");
   }
-  EXPECT_EQ(freeAsForetold(*kept, request(4)).result.bytes, 5 * kMiB);
+  // As a user, who does not depend on what root may see of the first process here.
+  cachedir::run("chown -R 65534 " + cache_);
+  EXPECT_TRUE(cachedir::asNobody(
+      [&] { return freeAsForetold(*kept, request(4)).result.bytes == 5 * kMiB; }));
 }
 
 TEST(TrashTime, WhatWasThrownAwayIsAsOldAsItsRecordSays) {

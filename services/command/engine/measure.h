@@ -19,7 +19,7 @@ namespace spacekeep::command {
 struct Measured {
   std::uint64_t bytes = 0;  // allocated
   std::uint64_t files = 0;
-  /// Something could not be looked at, or the looking was cancelled.
+  /// Everything could be looked at, and the looking was not cancelled.
   bool whole = true;
 };
 

@@ -3,6 +3,7 @@
 #include <sys/statvfs.h>
 
 #include <algorithm>
+#include <set>
 
 #include "services/cachedir/engine/space_return.h"
 #include "services/command/engine/in_use.h"
@@ -42,6 +43,16 @@ bool dependsOnAmount(const Words& words) {
   return std::ranges::any_of(words, [](const std::string& word) {
     return word.find("{AMOUNT}") != std::string::npos || word.find("{KEEP}") != std::string::npos;
   });
+}
+
+/// Of all the file systems together.
+std::uint64_t freeBytesOn(const std::vector<Root>& roots) {
+  std::uint64_t sum = 0;
+  std::set<std::uint64_t> seen;
+  for (const Root& root : roots) {
+    if (seen.insert(root.file_system).second) sum += freeBytesOf(root);
+  }
+  return sum;
 }
 
 bool onOneFileSystem(const std::vector<Root>& roots) {
@@ -129,10 +140,10 @@ class CacheOfTool::Cleaning {
 
   Result result() {
     if (opened_.roots.empty() || isNotNow()) return std::move(result_);
-    const std::uint64_t free_before = freeBytesOf(opened_.roots.front());
+    const std::uint64_t free_before = freeBytesOn(opened_.roots);
     cachedir::SpaceReturn space(opened_.roots.front().fd.get());
     const Measured before = measure(opened_.roots, cancel_);
-    const bool steady = freeBytesOf(opened_.roots.front()) == free_before;
+    const bool steady = freeBytesOn(opened_.roots) == free_before;
     occupied_ = before.bytes;
     for (int urgency = 1; urgency <= request_.urgency && !satisfied(); ++urgency) {
       const auto& step = cache_.tool().steps[static_cast<std::size_t>(urgency - 1)];
@@ -145,7 +156,7 @@ class CacheOfTool::Cleaning {
     if (request_.dry_run || result_.bytes == 0) return std::move(result_);
     space.add(result_.bytes);
     space.wait(cancel_);
-    if (steady && onOneFileSystem(opened_.roots)) capByGain(free_before);
+    if (!whole_ || (steady && onOneFileSystem(opened_.roots))) capByGain(free_before);
     return std::move(result_);
   }
 
@@ -174,17 +185,31 @@ class CacheOfTool::Cleaning {
         result_.problems.push_back(problemOf(words, run));
       }
       // What has gone has gone, wanted or not: the count after a cancel is made all the same.
-      const std::uint64_t left = measure(opened_.roots, CancelToken()).bytes;
-      freed = occupied_ - std::min(occupied_, left);
-      occupied_ = left;
+      const Measured left = countAgain();
+      freed = occupied_ - std::min(occupied_, left.bytes);
+      occupied_ = left.bytes;
+      whole_ = whole_ && left.whole;
     }
     result_.bytes += freed.value_or(0);
     if (visit_ && freed != std::uint64_t{0}) visit_(textOf(words), freed);
   }
 
-  /// The volume stood still before, so what it did not gain did not come back.
+  /// By name and not in what was opened before: a tool may make a directory anew and put it in the
+  /// place of the old one, or give it another name of the pattern.
+  [[nodiscard]] Measured countAgain() const {
+    cachedir::Rules rules = matched(cache_.tool().measured);
+    rules.directories.insert(rules.directories.end(), rules_.directories.begin(),
+                             rules_.directories.end());
+    const OpenedRoots opened = openRoots(rules, request_.volume);
+    Measured now = measure(opened.roots, CancelToken());
+    now.whole = now.whole && opened.problems.empty();
+    return now;
+  }
+
+  /// Where the volume stood still before, what it did not gain did not come back. And what could not
+  /// be counted may be there still.
   void capByGain(std::uint64_t free_before) {
-    const std::uint64_t now = freeBytesOf(opened_.roots.front());
+    const std::uint64_t now = freeBytesOn(opened_.roots);
     result_.bytes = std::min(result_.bytes, now - std::min(now, free_before));
   }
 
@@ -195,6 +220,7 @@ class CacheOfTool::Cleaning {
   const cachedir::Rules rules_;
   const OpenedRoots opened_;
   std::uint64_t occupied_ = 0;
+  bool whole_ = true;  // all that the commands left could be counted
   Result result_;
 };
 

@@ -104,6 +104,43 @@ TEST_F(ToolCacheTest, NothingIsDoneForNothingOrAtNoUrgencyOrOnAnotherVolume) {
   EXPECT_TRUE(exists(cache_ + "/old1"));
 }
 
+/// On two file systems, where what statvfs shows does not bound what is claimed.
+class ToolOnTwoVolumes : public ToolCacheTest {
+ protected:
+  void SetUp() override {
+    ToolCacheTest::SetUp();
+    writeFile(other_ / "cache/file", 4096);
+  }
+  [[nodiscard]] std::unique_ptr<Cache> cleanedBy(const std::string& body,
+                                                 const std::string& measured) const {
+    return makeCache(
+        ruleFrom("<key>MEASURE</key>" + arrayOf({measured, other_ / "cache"}) +
+                 "<key>CLEAN</key><dict><key>1</key><dict><key>COMMAND</key>" +
+                 arrayOf({shellTool("cd " + volume_.path() + " && " + body)}) + "</dict></dict>"),
+        nullptr);
+  }
+  static std::uint64_t freedOf(const Cache& cache) {
+    return cache.free({.amount = 100 * kMiB, .urgency = 1}, CancelToken(), {}).bytes;
+  }
+  Volume other_{"tmpfs"};
+};
+
+TEST_F(ToolOnTwoVolumes, WhatAToolPutsInThePlaceOfTheOldIsNotFreed) {
+  const auto in_place =
+      cleanedBy("mkdir new && mv cache/new2 new && rm -r cache && mv new cache", cache_);
+  EXPECT_EQ(freedOf(*in_place), 3 * kMiB);
+  const auto by_another_name =
+      cleanedBy("mkdir ca2 && cp cache/new2 ca2 && rm -r cache", volume_ / "ca*");
+  EXPECT_EQ(freedOf(*by_another_name), 0U);
+}
+
+TEST_F(ToolOnTwoVolumes, WhatCannotBeCountedAnyMoreIsFreedOnlyIfTheVolumeShowsIt) {
+  cachedir::run("chmod 777 " + volume_.path() + " && chown -R 65534 " + cache_);
+  const auto hides = cleanedBy(
+      "cd cache && mkdir hidden && mv new1 old1 hidden && chmod 0 hidden && rm old2", cache_);
+  EXPECT_TRUE(cachedir::asNobody([&] { return freedOf(*hides) == kMiB; }));
+}
+
 TEST_F(ToolCacheTest, WhatTheToolClaimsCountsForNothing) {
   const std::string liar = shellTool("echo 'freed 99 GB'");
   EXPECT_EQ(freeFrom(*cache(liar), request(4)).result.bytes, 0U);

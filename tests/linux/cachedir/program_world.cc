@@ -57,6 +57,7 @@ Program::Program(const std::vector<std::string>& arguments, int listening,
   pid_ = ::fork();
   if (pid_ != 0) return;
   ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+  ::signal(SIGPIPE, SIG_DFL);  // whatever whoever started the tests has made of it
   sendTo(out_, STDOUT_FILENO);
   sendTo(err_, STDERR_FILENO);
   handOver(listening);

@@ -33,21 +33,19 @@ std::string ruleText(const std::string& id, const std::string& path, const std::
          "</string></dict></array>" + more + "</dict></plist>\n";
 }
 
-/// How the program ends that says something on standard error, is no longer read from then on, and
-/// is told to stop.
-Ended stoppedWhenNobodyReads(const std::vector<std::string>& arguments) {
+/// The program, which has said something on standard error and is no longer read from then on.
+std::unique_ptr<Program> readNoMore(const std::vector<std::string>& arguments) {
   const std::string fifo = temporaryDirectory() + "/fifo";
   EXPECT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
   const int reader = ::open(fifo.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
   std::vector<std::string> words{"-c", "exec \"$@\" 2>\"$0\"", fifo, kProgram};
   words.insert(words.end(), arguments.begin(), arguments.end());
-  Program running(words, -1, "/bin/sh");
+  auto running = std::make_unique<Program>(words, -1, "/bin/sh");
   pollfd said{.fd = reader, .events = POLLIN, .revents = 0};
   EXPECT_EQ(::poll(&said, 1, 20'000), 1) << "it says nothing";
   EXPECT_NE(said.revents & POLLIN, 0) << "it has ended at once";
   ::close(reader);
-  running.signal(SIGTERM);
-  return running.wait();
+  return running;
 }
 
 class CommandProgram : public testing::Test {
@@ -131,12 +129,6 @@ TEST_F(CommandProgram, EachRuleDescribesItself) {
 
 TEST_F(CommandProgram, AServiceEndsAsUsualWhereNobodyReadsWhatItSays) {
   EXPECT_EQ(cachedir::statusWithoutAReader(kProgram, {"--rules-dir", rules_}), 4);
-}
-
-TEST_F(CommandProgram, AServiceGoesOnWhenNobodyReadsWhatItSaysAnyMore) {
-  const Ended served =
-      stoppedWhenNobodyReads({"--rules-dir", rules_, "--check-in", "--socket", "/nowhere/socket"});
-  EXPECT_EQ(served.status, 0);
 }
 
 TEST_F(CommandProgram, MistakesAreSaidWithAnExitCodeOfTheirOwn) {
@@ -236,6 +228,18 @@ TEST_F(CommandServing, TwoUsersServicesStandBesideEachOtherAndEachFreesItsOwn) {
   EXPECT_EQ(purge(*services_.get()[1], 1), kMiB) << "one cache suffices";
   alice->signal(SIGTERM);
   EXPECT_EQ(alice->wait().status, 0);
+}
+
+TEST_F(CommandServing, AServiceGoesOnWhenNobodyReadsWhatItSaysAnyMore) {
+  write("one", ruleText("com.example.one", cacheOf("bob") + "/web"));
+  const auto service = readNoMore(
+      {"--rules-dir", rules_, "--only", "one", "--check-in", "--socket", sockets_.daemonSocket()});
+  daemon_.start();
+  // It says so when it has found the daemon.
+  ASSERT_TRUE(eventually([this] { return services_.get().size() == 1; })) << "it has ended";
+  EXPECT_EQ(purge(*services_.get()[0], 10 * kMiB), kMiB);
+  service->signal(SIGTERM);
+  EXPECT_EQ(service->wait().status, 0);
 }
 
 TEST_F(CommandServing, AUserWithoutTheRightIsToldHowToGetIt) {

@@ -89,6 +89,7 @@ Result CacheOfDirectories::free(const Request& request, const CancelToken& cance
   WholeResult whole = freeWhole(wholeWanted(caches()), caches().whole, wish, cancel, visit);
   result.bytes += whole.bytes;
   append(result.problems, std::move(whole.problems));
+  result.note = watch.why();
   return result;
 }
 

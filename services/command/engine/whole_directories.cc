@@ -331,6 +331,7 @@ WholeResult freeWhole(const cachedir::Rules& rules, const cachedir::Rules& patte
   const std::int64_t now_ns = rt::wallClockNs();
   for (const Unit& unit : found.units) {
     if (result.bytes >= request.amount || cancel.cancelled()) break;
+    if (request.cancelled && request.cancelled()) break;
     if (cachedir::mildestUrgency(*unit.rule, unit.used_ns, now_ns) > request.urgency) continue;
     const std::string& path = unit.rule->path;
     std::uint64_t bytes = 0;

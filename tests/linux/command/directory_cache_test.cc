@@ -154,6 +154,26 @@ TEST_F(DirectoryCacheTest, WhatItsOwnerBeginsWhileFilesGoKeepsTheOthers) {
   EXPECT_TRUE(exists(volume_ / "whole/w1/f"));
 }
 
+TEST_F(DirectoryCacheTest, WhatItsOwnerBeginsWhileWholeDirectoriesGoKeepsTheOthers) {
+  writeFile(volume_ / "whole/w1/f", kMiB, 500);
+  writeFile(volume_ / "whole/w2/f", kMiB, 400);
+  volume_.settle();
+  const std::string pid_file = volume_ / "pid";
+  const CacheOfDirectories cache(
+      ruleFrom(directory(volume_ / "whole/*", "<key>WHOLE_DIRECTORIES</key><true/>") +
+               "<key>NOT_WHILE</key><array><dict><key>PID_FILE</key><string>" + pid_file +
+               "</string></dict></array>"),
+      0);
+  const auto begin = [&pid_file](const std::string&, std::optional<std::uint64_t>) {
+    std::ofstream(pid_file) << ::getpid();
+  };
+  const Result result = cache.free(request(4), CancelToken(), begin);
+  EXPECT_EQ(result.bytes, kMiB);
+  EXPECT_EQ(result.note, "the process of " + pid_file + " is running");
+  EXPECT_FALSE(exists(volume_ / "whole/w1"));
+  EXPECT_TRUE(exists(volume_ / "whole/w2/f"));
+}
+
 TEST_F(DirectoryCacheTest, ConditionsAreAskedAgainNowAndThenAndOnceOneHasHeldItCounts) {
   const std::string pid_file = volume_ / "pid";
   const std::vector<Condition> conditions{

@@ -27,6 +27,9 @@ constexpr std::size_t kLeftOutPerTurn = 64 * 1024;
 // Over a bus. Headers that anybody has a use for are much shorter.
 constexpr std::uint64_t kMaxBusHeaderBytes = 8 * 1024;
 
+/// Of what is sent to a peer that takes nothing any more. A message has a smaller one.
+constexpr std::uint64_t kFirstLostSerial = 1ULL << 32U;
+
 std::string cannotBeWritten(int problem) {
   return std::string("messages for it cannot be written: ") + std::strerror(problem);
 }
@@ -147,14 +150,19 @@ void BusLink::authenticate() {
 }
 
 bool BusLink::open() {
-  io_ = sd_event_source_unref(io_);
   timer_ = sd_event_source_disable_unref(timer_);
   authentication_.reset();
+  return takeBus();
+}
+
+/// In the place of the one before, if there was one.
+bool BusLink::takeBus() {
+  io_ = sd_event_source_disable_unref(io_);
   const AuthenticatedBus made = makeAuthenticatedBus(
       fd_, sends_descriptors_ ? BusDescriptors::kTaken : BusDescriptors::kClosed);
   if (made.bus == nullptr) return false;
   socket_.reset();
-  bus_ = made.bus;
+  sd_bus_close_unref(std::exchange(bus_, made.bus));
   input_ = made.input;
   fd_ = made.output;
   return sd_bus_add_filter(bus_, nullptr, &BusLink::onMessage, this) >= 0 && watch();
@@ -196,15 +204,37 @@ void BusLink::writeQueued() {
   } else if (progress < 0) {
     end(LinkEnd::kRefused, cannotBeWritten(-progress));
   } else if (sd_bus_is_open(bus_) <= 0) {
-    end(LinkEnd::kPeerLeft, "the peer has left");
+    stopWriting();
   } else {
     forgetWritten();
   }
 }
 
+/// When a write has told that the peer takes nothing any more. What it said before is still in the
+/// socket; closed on this side as well, its stream has an end behind that, which is told as ever.
+void BusLink::stopWriting() {
+  only_reads_ = true;
+  queued_sizes_.clear();
+  queued_bytes_ = 0;
+  ::shutdown(fd_, SHUT_RDWR);
+}
+
+/// sd-bus reads nothing more after a write that failed, so another bus reads what is left. Of a message
+/// that had come in part, the beginning is lost with the first one. Answers whether there is a bus.
+bool BusLink::readOn() {
+  if (sd_bus_is_open(bus_) > 0) return true;
+  if (in_message_ && message_read_ > 0) {
+    end(LinkEnd::kPeerLeft, "the peer has left");
+  } else if (!takeBus()) {
+    end(LinkEnd::kRefused, "this process has no descriptor left");
+  }
+  return !ended_;
+}
+
 /// Lets sd-bus read at most one message, and only one whose size is known to be within the limit.
 /// Answers whether there may be more to do.
 bool BusLink::processOnce() {
+  if (!readOn()) return false;
   if (left_out_ > 0) return leaveOut();
   if (!in_message_) {
     switch (lookAhead()) {
@@ -228,6 +258,7 @@ bool BusLink::processOnce() {
 bool BusLink::readJudged() {
   const std::size_t available = bytesAvailable(fd_);
   const bool is_continued = message_read_ > 0;
+  const bool could_write = !only_reads_;
   const std::size_t queued = queued_sizes_.size();
   const int progress = sd_bus_process(bus_, nullptr);
   if (ended_) return false;
@@ -236,8 +267,12 @@ bool BusLink::readJudged() {
     return false;
   }
   if (sd_bus_is_open(bus_) <= 0) {
-    end(LinkEnd::kPeerLeft, "the peer has left");
-    return false;
+    if (could_write) {
+      stopWriting();
+    } else {
+      end(LinkEnd::kPeerLeft, "the peer has left");
+    }
+    return could_write;
   }
   if (in_message_) {
     forgetWritten();
@@ -393,13 +428,16 @@ void BusLink::updateEvents() {
 
 std::optional<std::uint64_t> BusLink::send(sd_bus_message* message, std::size_t bytes) {
   if (ended_ || bus_ == nullptr) return std::nullopt;
+  if (only_reads_) return kFirstLostSerial + lost_++;
   std::uint64_t serial = 0;
   const int result = sd_bus_send(bus_, message, &serial);
   if (result < 0) {
     const bool gone = result == -ECONNRESET || result == -EPIPE || result == -ENOTCONN;
     if (gone) {
-      end(LinkEnd::kPeerLeft, "the peer has left");
-    } else if (sd_bus_is_open(bus_) <= 0 || result == -ENOBUFS || result == -ENOMEM) {
+      stopWriting();
+      return kFirstLostSerial + lost_++;
+    }
+    if (sd_bus_is_open(bus_) <= 0 || result == -ENOBUFS || result == -ENOMEM) {
       end(LinkEnd::kRefused, cannotBeWritten(-result));
     }
     return std::nullopt;

@@ -89,7 +89,8 @@ class BusLink {
   [[nodiscard]] sd_bus* bus() const { return bus_; }
 
   /// Sends or queues the message; `bytes` is its estimated size. Answers its serial, none when it
-  /// was not sent. A peer that leaves too much unread is cut off.
+  /// was not sent. A peer that leaves too much unread is cut off. To one that takes nothing any more
+  /// it counts as sent: the end is told once what the peer said before is read.
   std::optional<std::uint64_t> send(sd_bus_message* message, std::size_t bytes);
   /// May follow a linkMayRead that said no, also when the link has ended.
   void resumeReading();
@@ -104,9 +105,12 @@ class BusLink {
   bool watch();
   void authenticate();
   bool open();
+  bool takeBus();
   void process();
   bool processOnce();
   void writeQueued();
+  void stopWriting();
+  bool readOn();
   bool readJudged();
   enum class Ahead { kNothing, kIncomplete, kMessage, kDescriptors, kLeftOut, kRefused };
   Ahead lookAhead();
@@ -143,6 +147,7 @@ class BusLink {
   bool processing_ = false;
   bool ended_ = false;
   bool peer_hung_up_ = false;
+  bool only_reads_ = false;  // the peer takes nothing any more
   bool header_is_incomplete_ = false;
   bool in_message_ = false;       // its header was judged, it has not arrived as a whole
   std::size_t message_size_ = 0;  // of that message
@@ -150,6 +155,7 @@ class BusLink {
   std::uint64_t left_out_ = 0;    // bytes that are still to be left out
   std::deque<std::size_t> queued_sizes_;
   std::size_t queued_bytes_ = 0;
+  std::uint64_t lost_ = 0;  // messages that were to be sent since it only reads
 };
 
 }  // namespace spacekeep::ipc

@@ -3,6 +3,7 @@
 // Keeps the IPC thread from its sockets until it is let go.
 #pragma once
 
+#include <functional>
 #include <memory>
 
 #include "support/ipc/linux/ipc_loop.h"
@@ -15,11 +16,13 @@ class BusyLoop {
   /// Returns once the thread is busy.
   explicit BusyLoop(IpcLoop& loop) : BusyLoop(loop, nullptr) {}
   /// Lets `before` go, so that the thread does no more in between than what comes before this task.
-  BusyLoop(IpcLoop& loop, BusyLoop* before) {
+  /// What `post_behind` posts runs right after this task, before the sockets are looked at.
+  BusyLoop(IpcLoop& loop, BusyLoop* before, const std::function<void()>& post_behind = nullptr) {
     loop.post([state = state_] {
       state->begun.signal();
       state->released.wait();
     });
+    if (post_behind) post_behind();
     if (before != nullptr) before->letGo();
     state_->begun.wait();
   }

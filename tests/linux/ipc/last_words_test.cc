@@ -126,37 +126,77 @@ TEST_F(LastWords, OfAClientThatStaysButReadsNothingMoreEndTheConnection) {
   EXPECT_TRUE(hasEnded());
 }
 
-TEST(LastAnswer, OfAServiceThatIsCalledAgainInTheMomentItLeavesIsTaken) {
-  TestServer service;
-  ConcurrentQueue global{{}};
-  IpcLoop loop;
-  {
+/// A connection to a service that owes an answer, and a loop of its own.
+class LastAnswer : public ::testing::Test {
+ protected:
+  void SetUp() override {
     std::string why;
-    const auto connection = connectToPath(loop, global, service.path(), why);
+    connection = connectToPath(loop, global, service.path(), why);
     ASSERT_NE(connection, nullptr) << why;
     connection->setRemoteInterface(testInterface());
     connection->resume();
-    PendingCall first(connection, "hold", {});
-    ASSERT_TRUE(eventually([&] { return service.held() == 1; }));
-    BusyLoop before(loop);
-    std::vector<PendingCall> later;
-    BusyLoop busy(loop, &before, [&] {
-      for (std::int32_t i = 0; i < 3; ++i) later.emplace_back(connection, "number", Arguments{i});
-    });
+    owed = std::make_unique<PendingCall>(connection, "hold", Arguments{});
+    ASSERT_TRUE(eventually([this] { return service.held() == 1; }));
+  }
+  void callThreeTimes() {
+    for (std::int32_t i = 0; i < 3; ++i) later.emplace_back(connection, "number", Arguments{i});
+  }
+  void answerAndLeave() {
     service.takeHeld().reply({std::string("freed")});
     service.loop.runAndWait([] {});
     service.stop();
-    busy.letGo();
-    const Outcome outcome = first.wait();
-    ASSERT_TRUE(outcome.reply);
-    EXPECT_EQ(std::get<std::string>(outcome.reply->at(0)), "freed");
-    for (PendingCall& call : later) {
-      EXPECT_EQ(call.wait().error.value().name, "org.freedesktop.DBus.Error.Disconnected");
-      // Who hears of it may connect again at once, and must not find this connection.
-      EXPECT_TRUE(connection->ended());
-      EXPECT_EQ(call.ends(), 1U);
-    }
   }
+  /// Once what was submitted so far has run.
+  void waitForGlobal() {
+    CountingSemaphore reached(0);
+    global.async([&reached] { reached.signal(); });
+    reached.wait();
+  }
+
+  TestServer service;
+  ConcurrentQueue global{{.parallelism = 1}};
+  IpcLoop loop;
+  std::shared_ptr<Connection> connection;
+  std::unique_ptr<PendingCall> owed;
+  std::vector<PendingCall> later;
+};
+
+TEST_F(LastAnswer, OfAServiceThatIsCalledAgainInTheMomentItLeavesIsTaken) {
+  BusyLoop before(loop);
+  BusyLoop busy(loop, &before, [this] { callThreeTimes(); });
+  answerAndLeave();
+  busy.letGo();
+  const Outcome outcome = owed->wait();
+  ASSERT_TRUE(outcome.reply);
+  EXPECT_EQ(std::get<std::string>(outcome.reply->at(0)), "freed");
+  for (PendingCall& call : later) {
+    EXPECT_EQ(call.wait().error.value().name, "org.freedesktop.DBus.Error.Disconnected");
+    EXPECT_EQ(call.ends(), 1U);
+  }
+}
+
+// Who hears of a failed call may connect again at once, and must not be given this connection.
+TEST_F(LastAnswer, IsTakenBeforeTheCallsThatCameTooLateFail) {
+  CountingSemaphore sent(0);
+  CountingSemaphore released(0);
+  BusyLoop before(loop);
+  BusyLoop busy(loop, &before, [&] {
+    callThreeTimes();
+    loop.post([&] {
+      sent.signal();
+      released.wait();
+    });
+  });
+  answerAndLeave();
+  busy.letGo();
+  sent.wait();
+  waitForGlobal();
+  for (const PendingCall& call : later) EXPECT_EQ(call.ends(), 0U);
+  EXPECT_FALSE(connection->ended());
+  released.signal();
+  for (PendingCall& call : later) EXPECT_TRUE(call.wait().error);
+  EXPECT_TRUE(connection->ended());
+  EXPECT_TRUE(owed->wait().reply);
 }
 
 }  // namespace

@@ -19,6 +19,7 @@ constexpr SuiteFileKind kKind = {
     .application_id = 0x534b4849,
     .version = 1,
     .what = "the history",
+    .table = kName,
     .table_sql =
         "CREATE TABLE history (number INTEGER PRIMARY KEY AUTOINCREMENT, volume TEXT,"
         " entry BLOB NOT NULL)"};

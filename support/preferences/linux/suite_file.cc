@@ -109,14 +109,13 @@ Finding checkOwner(sqlite3* database, const SuiteFileKind& kind) {
 }
 
 // A table of another make passes every check of the database and may lose what is put into it.
-Finding checkTable(sqlite3* database, const std::string& name, const SuiteFileKind& kind) {
-  if (kind.table_sql == nullptr) return {};
+Finding checkTable(sqlite3* database, const SuiteFileKind& kind) {
   int code = SQLITE_OK;
   const std::int64_t version = queryInteger(database, "PRAGMA user_version", code);
   if (code != SQLITE_ROW) return findingOf(database, code);
   const Statement find = prepare(database, "SELECT sql FROM sqlite_schema WHERE name = ?1");
   if (!find) return findingOf(database, sqlite3_extended_errcode(database));
-  sqlite3_bind_text(find.get(), 1, name.c_str(), -1, SQLITE_STATIC);
+  sqlite3_bind_text(find.get(), 1, kind.table, -1, SQLITE_STATIC);
   code = sqlite3_step(find.get());
   if (code != SQLITE_ROW && code != SQLITE_DONE) return findingOf(database, code);
   const bool is_fresh = code == SQLITE_DONE && version != kind.version;
@@ -127,9 +126,9 @@ Finding checkTable(sqlite3* database, const std::string& name, const SuiteFileKi
   return {Soundness::kDamaged, "its table is not as this program makes it"};
 }
 
-Finding checkFile(sqlite3* database, const std::string& name, const SuiteFileKind& kind) {
+Finding checkFile(sqlite3* database, const SuiteFileKind& kind) {
   Finding finding = checkOwner(database, kind);
-  if (finding.soundness == Soundness::kSound) finding = checkTable(database, name, kind);
+  if (finding.soundness == Soundness::kSound) finding = checkTable(database, kind);
   return finding.soundness == Soundness::kSound ? checkIntegrity(database) : finding;
 }
 
@@ -165,8 +164,7 @@ Problem setAside(const std::string& directory, const std::string& name, const st
   return syncDirectory(directory);
 }
 
-std::variant<Database, Finding> openAndCheck(const std::string& path, const std::string& name,
-                                             const SuiteFileKind& kind) {
+std::variant<Database, Finding> openAndCheck(const std::string& path, const SuiteFileKind& kind) {
   sqlite3* raw = nullptr;
   const int code =
       sqlite3_open_v2(path.c_str(), &raw, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX, nullptr);
@@ -175,7 +173,7 @@ std::variant<Database, Finding> openAndCheck(const std::string& path, const std:
   sqlite3_extended_result_codes(database.get(), 1);
   // Another process may hold the file for a moment; that alone must not cost the suite.
   sqlite3_busy_timeout(database.get(), 2000);
-  const Finding finding = checkFile(database.get(), name, kind);
+  const Finding finding = checkFile(database.get(), kind);
   if (finding.soundness != Soundness::kSound) return finding;
   return database;
 }
@@ -196,7 +194,7 @@ std::variant<Database, SuiteFileError> openSuiteFile(const std::string& director
   const std::string path = directory + "/" + name + ".sqlite";
   for (int attempt = 0; attempt < 2; ++attempt) {
     if (Problem problem = lockDownFile(path)) return SuiteFileError{*problem};
-    auto opened = openAndCheck(path, name, kind);
+    auto opened = openAndCheck(path, kind);
     if (auto* database = std::get_if<Database>(&opened)) return std::move(*database);
     const auto& finding = std::get<Finding>(opened);
     if (finding.soundness != Soundness::kDamaged) {

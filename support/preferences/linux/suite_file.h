@@ -15,15 +15,19 @@ namespace spacekeep {
 /// In the file's header, so that the file of another program is not taken for a suite ("SKPF").
 inline constexpr std::int64_t kSuiteApplicationId = 0x534b5046;
 inline constexpr std::int64_t kSuiteVersion = 1;
+inline constexpr const char* kSuiteTable = "preferences";
+inline constexpr const char* kSuiteTableSql =
+    "CREATE TABLE preferences (key TEXT PRIMARY KEY NOT NULL, value BLOB NOT NULL) WITHOUT ROWID";
 
 /// What tells one kind of file from another.
 struct SuiteFileKind {
   std::int64_t application_id = kSuiteApplicationId;
   std::int64_t version = kSuiteVersion;  ///< the newest that this program understands
   const char* what = "the suite";        ///< in log lines
-  /// The statement that makes its table, which is called as the file, as the database keeps it; a
-  /// file with another such table, or of this version without it, is damaged. Null: not looked at.
-  const char* table_sql = nullptr;
+  const char* table = kSuiteTable;
+  /// The statement that makes its table, as the database keeps it; a file with another such table, or
+  /// of this version without it, is damaged.
+  const char* table_sql = kSuiteTableSql;
 };
 
 struct SuiteFileError {

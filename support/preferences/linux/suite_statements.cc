@@ -39,11 +39,9 @@ int SuiteStatements::run(Statement& statement, const char* sql) {
 }
 
 int SuiteStatements::makeTable() {
-  static const std::string sql =
-      "PRAGMA application_id = " + std::to_string(kSuiteApplicationId) +
-      "; PRAGMA user_version = " + std::to_string(kSuiteVersion) +
-      "; CREATE TABLE IF NOT EXISTS preferences"
-      " (key TEXT PRIMARY KEY NOT NULL, value BLOB NOT NULL) WITHOUT ROWID";
+  static const std::string sql = "PRAGMA application_id = " + std::to_string(kSuiteApplicationId) +
+                                 "; PRAGMA user_version = " + std::to_string(kSuiteVersion) + "; " +
+                                 kSuiteTableSql;
   return execute(database_, sql.c_str());
 }
 

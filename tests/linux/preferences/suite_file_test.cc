@@ -93,6 +93,30 @@ TEST(SuiteFile, ADatabaseWhoseKeysAreOutOfOrderIsSetAsideAndWhatIsStoredThenIsKe
   EXPECT_EQ(contentOf(std::min(aside[0], aside[1])), content);
 }
 
+TEST(SuiteFile, ATableThatIsNotAsThisProgramMakesItIsSetAsideAndWhatIsStoredThenIsKept) {
+  const TemporaryDirectory directory;
+  store(directory, "k", 1);
+  std::string content = contentOf(fileOf(directory));
+  const std::size_t at = content.find("key TEXT PRIMARY KEY NOT NULL");
+  ASSERT_NE(at, std::string::npos);
+  content.replace(at, 3, "KEY");  // a key all the same, but nobody here has written that
+  directory.write(std::string(kName) + ".sqlite", content);
+  LogCapture log;
+  store(directory, "k", 2);
+  EXPECT_EQ(log.count(kLogProblem, "its table is not as this program makes it"), 1U);
+  EXPECT_FALSE(setAsideFiles(directory).empty());
+  EXPECT_EQ(fetch(directory, "k"), Value(2));
+}
+
+TEST(SuiteFile, ADatabaseOfItsOwnWithoutItsTableIsSetAside) {
+  const TemporaryDirectory directory;
+  store(directory, "k", 1);
+  ASSERT_EQ(execute(outside(fileOf(directory)).get(), "DROP TABLE preferences"), SQLITE_OK);
+  store(directory, "k", 2);
+  EXPECT_FALSE(setAsideFiles(directory).empty());
+  EXPECT_EQ(fetch(directory, "k"), Value(2));
+}
+
 TEST(SuiteFile, ATruncatedDatabaseIsSetAside) {
   const TemporaryDirectory directory;
   store(directory, "k", Data{std::vector<std::uint8_t>(50'000, 1)});

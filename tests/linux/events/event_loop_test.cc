@@ -7,6 +7,7 @@
 
 #include <array>
 #include <ctime>
+#include <memory>
 #include <optional>
 
 #include "support/queues/waiting.h"
@@ -25,6 +26,18 @@ TEST(EventLoop, PostedCallbacksRunInOrder) {
   done.wait();
   ASSERT_EQ(order.size(), 100U);
   EXPECT_TRUE(std::is_sorted(order.begin(), order.end()));
+}
+
+TEST(EventLoop, WhatADelayedCallbackHoldsIsLetGoWhenItStops) {
+  EventLoop loop;
+  auto held = std::make_shared<int>(1);
+  CountingSemaphore done(0);
+  loop.postAfter(3600'000 * kMs, [held] {});
+  loop.post([&] { done.signal(); });
+  done.wait();
+  EXPECT_EQ(held.use_count(), 2);
+  loop.stop();
+  EXPECT_EQ(held.use_count(), 1);
 }
 
 TEST(EventLoop, ADescriptorThatBecomesReadableIsNoticed) {

@@ -1,9 +1,13 @@
 // Peers that mean no good, and the honest client beside each of them.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
+#include <array>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "support/access/peer_identity.h"
@@ -62,6 +66,22 @@ TEST(HostilePeer, HalfAnAuthenticationIsCutOffInTime) {
   EXPECT_EQ(log.count(kLogProblem, "it did not authenticate in time"), 2U);
   EXPECT_TRUE(eventually([&] { return server.server().connections() == 0; }));
   expectHonestClientIsServed(server);
+}
+
+TEST(HonestPeer, WhoNamesHimselfByManyDigitsIsBelieved) {
+  ASSERT_EQ(::geteuid(), 0U) << "this test is another user for a moment and has to run as root";
+  TestServer server;
+  ASSERT_EQ(::chmod(server.directory.path().c_str(), 0755), 0);
+  ASSERT_EQ(::chmod(server.path().c_str(), 0666), 0);
+  // Of this thread only.
+  ASSERT_EQ(::syscall(SYS_setresuid, -1, 1234567890, -1), 0);
+  RawPeer peer(server.path());
+  ASSERT_EQ(::syscall(SYS_setresuid, -1, 0, -1), 0);
+  ASSERT_TRUE(peer.send("\0AUTH EXTERNAL 31323334353637383930\r\n"sv));
+  std::array<char, 64> answer{};
+  ASSERT_TRUE(eventually(
+      [&] { return ::recv(peer.fd(), answer.data(), answer.size(), MSG_DONTWAIT) > 0; }));
+  EXPECT_TRUE(std::string_view(answer.data()).starts_with("OK ")) << answer.data();
 }
 
 TEST(HostilePeer, AnAuthenticationByteForByteIsHonest) {

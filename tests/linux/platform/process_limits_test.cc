@@ -98,8 +98,11 @@ TEST(ProcessLimits, FreeMemoryBetweenWhatIsInUseIsGivenBack) {
 }
 
 TEST(ProcessLimits, AllDescriptorsThatTheKernelAllowsMayBeOpen) {
-  raiseDescriptorLimit();
   rlimit files = {};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &files), 0);
+  files.rlim_cur = 64;
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &files), 0);
+  raiseDescriptorLimit();
   ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &files), 0);
   EXPECT_EQ(files.rlim_cur, files.rlim_max);
 }

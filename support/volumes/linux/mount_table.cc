@@ -14,6 +14,7 @@
 #include <system_error>
 #include <utility>
 
+#include "support/files/linux/descriptor.h"
 #include "support/logging/log.h"
 
 namespace spacekeep {
@@ -24,20 +25,6 @@ struct FreeTable {
 };
 struct FreeIterator {
   void operator()(libmnt_iter* iterator) const { mnt_free_iter(iterator); }
-};
-
-class OpenDescriptor {
- public:
-  explicit OpenDescriptor(int fd) : fd_(fd) {}
-  ~OpenDescriptor() {
-    if (fd_ >= 0) ::close(fd_);
-  }
-  OpenDescriptor(const OpenDescriptor&) = delete;
-  OpenDescriptor& operator=(const OpenDescriptor&) = delete;
-  [[nodiscard]] int fd() const { return fd_; }
-
- private:
-  const int fd_;
 };
 
 std::string textOrNothing(const char* text) { return text == nullptr ? "" : text; }
@@ -85,8 +72,8 @@ bool isThatMount(int fd, const MountEntry& mount) {
 
 /// Single files are mounted too (containers do it); such a mount is no place to keep data in.
 bool isDirectoryMount(const MountEntry& mount) {
-  const OpenDescriptor directory(openMountPoint(mount));
-  return directory.fd() >= 0 && isThatMount(directory.fd(), mount);
+  const FileDescriptor directory(openMountPoint(mount));
+  return directory.valid() && isThatMount(directory.get(), mount);
 }
 
 }  // namespace
@@ -133,10 +120,10 @@ void MountTable::readAgain() {
 }
 
 std::optional<VolumeSpace> measureSpace(const MountEntry& mount) {
-  const OpenDescriptor directory(openMountPoint(mount));
-  if (directory.fd() < 0 || !isThatMount(directory.fd(), mount)) return std::nullopt;
+  const FileDescriptor directory(openMountPoint(mount));
+  if (!directory.valid() || !isThatMount(directory.get(), mount)) return std::nullopt;
   struct statvfs status {};
-  while (::fstatvfs(directory.fd(), &status) < 0) {
+  while (::fstatvfs(directory.get(), &status) < 0) {
     if (errno != EINTR) return std::nullopt;
   }
   return VolumeSpace{.size_bytes = status.f_blocks * status.f_frsize,

@@ -84,6 +84,15 @@ TEST(Page, EndsBeforeItGetsTooLargeForAMessage) {
   EXPECT_LE(wireBytesAtMost(*answer.find(keys::kEntries)), 5000U + 24U);
 }
 
+TEST(Page, MayBeFullToTheLastByte) {
+  const std::size_t entry_bytes =
+      wireBytesAtMost(Dictionary{{keys::kKind, "x"}, {keys::kEntry, 1}});
+  Page page(10, 2 * entry_bytes);
+  EXPECT_TRUE(page.take(stored(9, {{keys::kKind, "x"}})));
+  EXPECT_TRUE(page.take(stored(8, {{keys::kKind, "x"}})));
+  EXPECT_FALSE(page.take(stored(7, {{keys::kKind, "x"}})));
+}
+
 TEST(Page, TakesItsFirstEntryWhateverItsSize) {
   Page page(10, 100);
   EXPECT_TRUE(page.take(stored(1, {{keys::kKind, std::string(1000, 'x')}})));

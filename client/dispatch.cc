@@ -68,7 +68,8 @@ std::optional<Dictionary> Spacekeep::purge(const Value& info, OperationCompletio
         waiting->group.leave();
       });
   waiting->group.wait();
-  if (operation && waiting->own_outcome) rememberPurge(*operation, *waiting->own_outcome);
+  const std::optional<Dictionary>& own = waiting->own_outcome;
+  if (operation && own) rememberPurge(*operation, *own);
   return std::move(waiting->answer);
 }
 

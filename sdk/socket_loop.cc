@@ -90,7 +90,8 @@ void SocketLoop::run() {
 }
 
 void SocketLoop::waitForIdleness() {
-  const auto idle_ms = std::max<std::int64_t>(0, options_.stop_when_idle->count());
+  const auto patience = options_.stop_when_idle.value_or(std::chrono::milliseconds(0));
+  const auto idle_ms = std::max<std::int64_t>(0, patience.count());
   const std::uint64_t idle_ns = static_cast<std::uint64_t>(idle_ms) * 1'000'000;
   while (!control_->stopping()) {
     const auto before = served_->activity();

@@ -96,6 +96,11 @@ std::string closedOnTheWayTo(const Place& place, const fs::path& directory) {
   return "";
 }
 
+std::string modeOf(const std::string& path) {
+  const auto status = statusOf(path);
+  return status ? modeText(status->st_mode) : "gone by now";
+}
+
 bool tellClosedDirectory(const Place& place, const std::string& directory, Group& group) {
   const std::string closed = closedOnTheWayTo(place, directory);
   if (closed.empty()) return false;
@@ -103,7 +108,7 @@ bool tellClosedDirectory(const Place& place, const std::string& directory, Group
       "rule-directory",
       fmt::format("{} is closed to the daemon ({}): what the rules in {} deny is not known, "
                   "so no rule of any directory holds",
-                  harmless(closed), modeText(statusOf(closed)->st_mode), harmless(directory)),
+                  harmless(closed), modeOf(closed), harmless(directory)),
       fmt::format("as root: chmod 0755 {}; systemctl restart spacekeepd", harmless(closed)));
   return true;
 }
@@ -116,7 +121,7 @@ void tellClosedFiles(const Place& place, const std::string& directory, Group& gr
     group.problem(
         "rule-file",
         fmt::format("{} is closed to the daemon ({}) and grants nothing", harmless(path),
-                    modeText(statusOf(path)->st_mode)),
+                    modeOf(path)),
         fmt::format("as root: chmod 0644 {}; systemctl restart spacekeepd", harmless(path)));
   }
 }

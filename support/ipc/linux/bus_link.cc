@@ -15,7 +15,6 @@
 #include <utility>
 
 #include "support/ipc/linux/authenticated_bus.h"
-#include "support/ipc/linux/descriptor_message.h"
 
 namespace spacekeep::ipc {
 
@@ -24,11 +23,11 @@ namespace {
 constexpr int kMessagesPerTurn = 8;  // then other connections have their turn
 constexpr std::size_t kLeftOutPerTurn = 64 * 1024;
 
-// Over a bus. Headers that anybody has a use for are much shorter.
-constexpr std::uint64_t kMaxBusHeaderBytes = 8 * 1024;
-
 /// Of what is sent to a peer that takes nothing any more. A message has a smaller one.
 constexpr std::uint64_t kFirstLostSerial = 1ULL << 32U;
+
+constexpr const char* kThePeerHasLeft = "the peer has left";
+constexpr const char* kNoDescriptorLeft = "this process has no descriptor left";
 
 std::string cannotBeWritten(int problem) {
   return std::string("messages for it cannot be written: ") + std::strerror(problem);
@@ -50,10 +49,7 @@ BusLink::~BusLink() { close(); }
 void BusLink::start(int fd, uid_t peer_uid, bool sends_descriptors) {
   sends_descriptors_ = sends_descriptors;
   fd_ = ::fcntl(fd, F_DUPFD_CLOEXEC, 3);
-  if (fd_ < 0) {
-    end(LinkEnd::kRefused, "this process has no descriptor left");
-    return;
-  }
+  if (fd_ < 0) return end(LinkEnd::kRefused, kNoDescriptorLeft);
   socket_ = std::make_shared<Descriptor>(fd_);
   // The other side of a passed descriptor may have changed the mode, and the IPC thread never
   // waits.
@@ -62,10 +58,9 @@ void BusLink::start(int fd, uid_t peer_uid, bool sends_descriptors) {
   const std::uint64_t usec = std::max<std::uint64_t>(limits_.authentication_ns / 1000, 1);
   if (!watch() || sd_event_add_time_relative(loop_.event(), &timer_, CLOCK_MONOTONIC, usec, 1000,
                                              &BusLink::onTimeout, this) < 0) {
-    end(LinkEnd::kRefused, "this process cannot watch another connection");
-    return;
+    return end(LinkEnd::kRefused, "this process cannot watch another connection");
   }
-  if (!authentication_->begin()) end(LinkEnd::kPeerLeft, "the peer has left");
+  if (!authentication_->begin()) end(LinkEnd::kPeerLeft, kThePeerHasLeft);
 }
 
 // Once it is open, each arrival is told once and read to its end: of a thousand sockets that wait for
@@ -116,7 +111,7 @@ int BusLink::onIo(sd_event_source*, int, std::uint32_t events, void* self) {
   link->process();
   // What was left of a header does not get longer once the peer is gone.
   if (!link->ended_ && link->header_is_incomplete_ && link->peer_hung_up_) {
-    link->end(LinkEnd::kPeerLeft, "the peer has left");
+    link->end(LinkEnd::kPeerLeft, kThePeerHasLeft);
   }
   return 0;
 }
@@ -132,20 +127,16 @@ void BusLink::authenticate() {
     case Authentication::Progress::kMore:
       return;
     case Authentication::Progress::kFailed:
-      end(LinkEnd::kRefused, why);
-      return;
+      return end(LinkEnd::kRefused, why);
     case Authentication::Progress::kLeft:
       // A server writes down who came and went without a word; a client has to find out whether
       // the server has died.
-      end(role_ == Authentication::Role::kServer ? LinkEnd::kRefused : LinkEnd::kPeerLeft, why);
-      return;
+      return end(role_ == Authentication::Role::kServer ? LinkEnd::kRefused : LinkEnd::kPeerLeft,
+                 why);
     case Authentication::Progress::kDone:
       break;
   }
-  if (!open()) {
-    end(LinkEnd::kRefused, "this process has no descriptor left");
-    return;
-  }
+  if (!open()) return end(LinkEnd::kRefused, kNoDescriptorLeft);
   owner_.linkReady();
 }
 
@@ -183,10 +174,7 @@ void BusLink::process() {
   int turns = 0;
   while (turns < kMessagesPerTurn && !ended_ && processOnce()) ++turns;
   processing_ = false;
-  if (ended_) {
-    release();
-    return;
-  }
+  if (ended_) return release();
   forgetWritten();
   updateEvents();
   setPriority(turns == kMessagesPerTurn && bringsCalls());
@@ -224,9 +212,9 @@ void BusLink::stopWriting() {
 bool BusLink::readOn() {
   if (sd_bus_is_open(bus_) > 0) return true;
   if (in_message_ && message_read_ > 0) {
-    end(LinkEnd::kPeerLeft, "the peer has left");
+    end(LinkEnd::kPeerLeft, kThePeerHasLeft);
   } else if (!takeBus()) {
-    end(LinkEnd::kRefused, "this process has no descriptor left");
+    end(LinkEnd::kRefused, kNoDescriptorLeft);
   }
   return !ended_;
 }
@@ -236,23 +224,43 @@ bool BusLink::readOn() {
 bool BusLink::processOnce() {
   if (!readOn()) return false;
   if (left_out_ > 0) return leaveOut();
-  if (!in_message_) {
-    switch (lookAhead()) {
-      case Ahead::kRefused:
-      case Ahead::kNothing:
-      case Ahead::kIncomplete:
-        return false;
-      case Ahead::kLeftOut:
-        return leaveOut();
-      case Ahead::kDescriptors:
-        return readWithDescriptors();
-      case Ahead::kMessage:
-        in_message_ = true;
-        message_read_ = 0;
-        break;
-    }
+  return in_message_ ? readJudged() : readNext();
+}
+
+bool BusLink::readNext() {
+  const NextMessage next = lookAhead(fd_, rules());
+  // A header of which a part has arrived is left in the socket.
+  header_is_incomplete_ = next.kind == NextMessage::Kind::kIncomplete;
+  message_size_ = static_cast<std::size_t>(next.bytes);
+  switch (next.kind) {
+    case NextMessage::Kind::kNothing:
+    case NextMessage::Kind::kIncomplete:
+      return false;
+    case NextMessage::Kind::kPeerLeft:
+      end(LinkEnd::kPeerLeft, kThePeerHasLeft);
+      return false;
+    case NextMessage::Kind::kRefused:
+      end(LinkEnd::kRefused, next.problem);
+      return false;
+    case NextMessage::Kind::kLeftOut:
+      left_out_ = next.left_out.bytes;
+      owner_.linkLeftOut(next.left_out);
+      return !ended_ && leaveOut();
+    case NextMessage::Kind::kDescriptors:
+      return readWithDescriptors();
+    case NextMessage::Kind::kMessage:
+      in_message_ = true;
+      message_read_ = 0;
+      return readJudged();
   }
-  return readJudged();
+  return false;
+}
+
+LookAheadRules BusLink::rules() const {
+  DescriptorsFrom from = DescriptorsFrom::kNobody;
+  if (role_ == Authentication::Role::kServer) from = DescriptorsFrom::kCalls;
+  if (sends_descriptors_) from = DescriptorsFrom::kAnybody;
+  return {.traffic = traffic_, .descriptors = from, .message_bytes = limits_.message_bytes};
 }
 
 bool BusLink::readJudged() {
@@ -270,7 +278,7 @@ bool BusLink::readJudged() {
     if (could_write) {
       stopWriting();
     } else {
-      end(LinkEnd::kPeerLeft, "the peer has left");
+      end(LinkEnd::kPeerLeft, kThePeerHasLeft);
     }
     return could_write;
   }
@@ -286,50 +294,13 @@ bool BusLink::readJudged() {
   return is_continued || available != message_size_;
 }
 
-BusLink::Ahead BusLink::lookAhead() {
-  std::array<char, kWireFixedBytes> header{};
-  iovec part{.iov_base = header.data(), .iov_len = header.size()};
-  msghdr message{};
-  message.msg_iov = &part;
-  message.msg_iovlen = 1;
-  const ssize_t seen = ::recvmsg(fd_, &message, MSG_PEEK | MSG_DONTWAIT);
-  if (seen == 0 || (seen < 0 && errno != EAGAIN && errno != EINTR)) {
-    end(LinkEnd::kPeerLeft, "the peer has left");
-    return Ahead::kRefused;
-  }
-  if (seen < 0) return Ahead::kNothing;
-  // A header of which a part has arrived is left in the socket.
-  header_is_incomplete_ = static_cast<std::size_t>(seen) < header.size();
-  if (header_is_incomplete_) return Ahead::kIncomplete;
-  const auto fixed = readWireFixedHeader({header.data(), header.size()});
-  if (!fixed) {
-    end(LinkEnd::kRefused, "it sent something that is no D-Bus message");
-    return Ahead::kRefused;
-  }
-  // Without room for them the kernel says that there are descriptors, and leaves them where they
-  // are.
-  const bool brings_descriptors = (message.msg_flags & MSG_CTRUNC) != 0;
-  if (traffic_ == Traffic::kOfABus) return judgeBusMessage(*fixed, brings_descriptors);
-  if (!judgeHeader(*fixed)) return Ahead::kRefused;
-  return brings_descriptors && !sends_descriptors_ ? judgeDescriptors() : Ahead::kMessage;
-}
-
-BusLink::Ahead BusLink::judgeDescriptors() {
-  const std::string problem = role_ == Authentication::Role::kServer
-                                  ? descriptorMessageProblem(fd_, message_size_)
-                                  : "it sent a descriptor with an answer";
-  if (problem.empty()) return Ahead::kDescriptors;
-  end(LinkEnd::kRefused, problem);
-  return Ahead::kRefused;
-}
-
 /// By a bus for this one message: the connection's own takes no descriptors. Answers whether there
 /// may be more to do.
 bool BusLink::readWithDescriptors() {
   sd_bus* reader = makeAuthenticatedBus(fd_, BusDescriptors::kTaken).bus;
   if (reader == nullptr || sd_bus_add_filter(reader, nullptr, &BusLink::onMessage, this) < 0) {
     sd_bus_close_unref(reader);
-    end(LinkEnd::kRefused, "this process has no descriptor left");
+    end(LinkEnd::kRefused, kNoDescriptorLeft);
     return false;
   }
   in_message_ = true;
@@ -342,54 +313,6 @@ bool BusLink::readWithDescriptors() {
   return !ended_;
 }
 
-bool BusLink::judgeHeader(const WireFixedHeader& header) {
-  if (header.type > kWireSignal) {
-    end(LinkEnd::kRefused, "it sent something that is no D-Bus message");
-    return false;
-  }
-  const std::uint64_t size = header.messageBytes();
-  if (size > limits_.message_bytes) {
-    end(LinkEnd::kRefused, "it sent a message of " + std::to_string(size) + " bytes, more than " +
-                               std::to_string(limits_.message_bytes));
-    return false;
-  }
-  message_size_ = static_cast<std::size_t>(size);
-  return true;
-}
-
-/// The broker has checked each message, but by its own rules. sd-bus reads on behind what it drops, and
-/// so past what was judged: it is shown only what certainly makes sense to it.
-BusLink::Ahead BusLink::judgeBusMessage(const WireFixedHeader& fixed, bool brings_descriptors) {
-  LeftOut message;
-  message.bytes = fixed.messageBytes();
-  message.brings_descriptors = brings_descriptors;
-  if (fixed.headerBytes() <= kMaxBusHeaderBytes) {
-    const std::string bytes = peek(static_cast<std::size_t>(fixed.headerBytes()));
-    header_is_incomplete_ = bytes.size() < fixed.headerBytes();
-    if (header_is_incomplete_) return Ahead::kIncomplete;
-    message.header = readWireHeader(bytes);
-  }
-  message_size_ = static_cast<std::size_t>(message.bytes);
-  if (brings_descriptors && message.header && fixed.type == kWireReturn &&
-      message.header->sender == kBrokerName) {
-    return Ahead::kDescriptors;
-  }
-  if (message.header && !brings_descriptors && message.bytes <= limits_.message_bytes) {
-    return Ahead::kMessage;
-  }
-  left_out_ = message.bytes;
-  owner_.linkLeftOut(message);
-  return ended_ ? Ahead::kRefused : Ahead::kLeftOut;
-}
-
-/// What is there of the next `size` bytes.
-std::string BusLink::peek(std::size_t size) const {
-  std::string bytes(size, '\0');
-  const ssize_t seen = ::recv(fd_, bytes.data(), size, MSG_PEEK | MSG_DONTWAIT);
-  bytes.resize(seen > 0 ? static_cast<std::size_t>(seen) : 0);
-  return bytes;
-}
-
 /// Reads without room for descriptors, so that the kernel closes them. Answers whether there may be
 /// more to do.
 bool BusLink::leaveOut() {
@@ -400,7 +323,7 @@ bool BusLink::leaveOut() {
     if (count < 0 && errno == EINTR) continue;
     if (count < 0 && errno == EAGAIN) return false;
     if (count <= 0) {
-      end(LinkEnd::kPeerLeft, "the peer has left");
+      end(LinkEnd::kPeerLeft, kThePeerHasLeft);
       return false;
     }
     left_out_ -= static_cast<std::uint64_t>(count);

@@ -18,7 +18,7 @@
 #include "support/ipc/arguments.h"
 #include "support/ipc/linux/authentication.h"
 #include "support/ipc/linux/ipc_loop.h"
-#include "support/ipc/linux/wire_header.h"
+#include "support/ipc/linux/look_ahead.h"
 
 namespace spacekeep::ipc {
 
@@ -33,23 +33,6 @@ enum class LinkEnd {
   kPeerLeft,  ///< the peer closed its end or is gone
   kRefused,   ///< this side cut it off: authentication, a limit, a broken message
 };
-
-/// Who speaks over the connection.
-enum class Traffic {
-  kOfOnePeer,  ///< what is wrong with its messages costs it the connection
-  /// The broker at the other end passes on what anybody sends. A message that cannot be taken is left
-  /// out, and descriptors are taken from the broker's own answers only.
-  kOfABus,
-};
-
-/// A message of a bus that was left out.
-struct LeftOut {
-  std::optional<WireHeader> header;  ///< none when it makes no sense or is too long
-  std::uint64_t bytes = 0;
-  bool brings_descriptors = false;
-};
-
-inline constexpr const char* kBrokerName = "org.freedesktop.DBus";
 
 class BusLink {
  public:
@@ -111,13 +94,9 @@ class BusLink {
   void writeQueued();
   void stopWriting();
   bool readOn();
+  bool readNext();
+  [[nodiscard]] LookAheadRules rules() const;
   bool readJudged();
-  enum class Ahead { kNothing, kIncomplete, kMessage, kDescriptors, kLeftOut, kRefused };
-  Ahead lookAhead();
-  bool judgeHeader(const WireFixedHeader& header);
-  Ahead judgeDescriptors();
-  Ahead judgeBusMessage(const WireFixedHeader& fixed, bool brings_descriptors);
-  std::string peek(std::size_t size) const;
   bool leaveOut();
   bool readWithDescriptors();
   bool messageWasDropped(std::size_t available);

@@ -102,19 +102,10 @@ void PeerProcess::remember(int socket) {
 
 void PeerProcess::whenKnown(std::uint64_t patience_ns, std::function<void(bool)> done) {
   done_ = std::move(done);
-  if (pidfd_ == nullptr) {
-    tell(died_already_);
-    return;
-  }
+  if (pidfd_ == nullptr) return tell(died_already_);
   const std::optional<bool> is_exiting = pid_ > 0 ? processIsExiting(pid_) : std::nullopt;
-  if (isDead(pidfd_->fd())) {  // so that the number may be another one's by now
-    tell(true);
-    return;
-  }
-  if (is_exiting) {
-    tell(*is_exiting);
-    return;
-  }
+  if (isDead(pidfd_->fd())) return tell(true);  // so that the number may be another one's by now
+  if (is_exiting) return tell(*is_exiting);
   const std::uint64_t patience_usec = std::max<std::uint64_t>(patience_ns / 1000, 1);
   if (sd_event_add_io(loop_.event(), &death_, pidfd_->fd(), EPOLLIN, &PeerProcess::onDeath, this) <
           0 ||

@@ -162,7 +162,7 @@ class Spacekeep : public SpacekeepClientProtocol,
   void startListener();
   [[nodiscard]] bool connectionIsEntitled(std::string_view entitlement) const;
   void registerService(const CheckIn& check_in);
-  [[nodiscard]] static std::string refusalOf(const CheckIn& check_in);
+  [[nodiscard]] std::string refusalOf(const CheckIn& check_in) const;
   [[nodiscard]] std::shared_ptr<SKService> openService(const CheckIn& check_in);
   [[nodiscard]] std::function<void()> removalHandler(const std::shared_ptr<SKService>& service);
   void deliverNotification(const ServiceMap& recipients, const std::string& name,

@@ -41,13 +41,6 @@ bool Spacekeep::connectionIsEntitled(std::string_view entitlement) const {
 
 void Spacekeep::registerService(const CheckIn& check_in) {
   std::shared_ptr<SKService> service = registry_.find(check_in.service_id);
-  const std::size_t registered = registry_.services().size();
-  if (!service && registered >= kMaxRegisteredServices) {
-    logProblem("%s refusing %@, %llu services are registered", "clientCheckin", check_in.service_id,
-               registered);
-    check_in.reply(std::nullopt, "too many services are registered, try again later");
-    return;
-  }
   const std::string why = service ? std::string() : refusalOf(check_in);
   if (!why.empty()) {
     logProblem("%s refusing %@, %@", "clientCheckin",
@@ -70,7 +63,11 @@ void Spacekeep::registerService(const CheckIn& check_in) {
 
 /// Why no service can be made of it, empty when one can. Nobody stands behind a useless endpoint to
 /// answer the ping, and the ping is waited for without a limit.
-std::string Spacekeep::refusalOf(const CheckIn& check_in) {
+std::string Spacekeep::refusalOf(const CheckIn& check_in) const {
+  const std::size_t registered = registry_.services().size();
+  if (registered >= kMaxRegisteredServices) {
+    return std::to_string(registered) + " services are registered, try again later";
+  }
   if (check_in.service_id.size() > kMaxServiceIdBytes) {
     return "its ID has " + std::to_string(check_in.service_id.size()) + " bytes, more than " +
            std::to_string(kMaxServiceIdBytes);

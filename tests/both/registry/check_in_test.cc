@@ -198,10 +198,10 @@ TEST(CheckIn, BeyondTheMostServicesANewOneIsRefusedWithAnErrorAndAKnownOneIsNot)
     const auto refused = world.world.checkIn(late, kPurges);
     EXPECT_EQ(refused->wait(), std::nullopt);
     EXPECT_EQ(std::get<ipc::OptionalString>(refused->answer()[1]),
-              "too many services are registered, try again later");
+              "4096 services are registered, try again later");
     EXPECT_TRUE(late->calls().empty());
-    EXPECT_TRUE(
-        world.world.trace().hasLine("clientCheckin refusing late, 4096 services are registered"));
+    EXPECT_TRUE(world.world.trace().hasLine(
+        "clientCheckin refusing late, 4096 services are registered, try again later"));
     EXPECT_TRUE(world.world.checkIn(known, kPurges)->wait().has_value());
   });
 }

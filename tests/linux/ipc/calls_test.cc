@@ -178,6 +178,18 @@ TEST(Calls, BeyondTheCallersOwnLimitEndTheConnection) {
   EXPECT_EQ(log.count(kLogProblem, "3 calls are unanswered"), 1U);
 }
 
+TEST(Calls, UnlessToldOtherwiseTwoHundredAndFiftySixMayWaitForOnePeer) {
+  ServerOptions options = TestServer::defaultOptions();
+  options.limits.unanswered_calls = 1000;
+  TestServer server(options);
+  const auto connection = server.connect();
+  std::vector<PendingCall> calls;
+  for (int i = 0; i < 256; ++i) calls.emplace_back(connection, "hold", Arguments{});
+  ASSERT_TRUE(eventually([&] { return server.held() == 256; }));
+  calls.emplace_back(connection, "hold", Arguments{});
+  for (PendingCall& call : calls) EXPECT_TRUE(call.wait().error);
+}
+
 TEST(Calls, TheLoopSleepsWhileNothingHappens) {
   TestServer server;
   const auto connection = server.connect();

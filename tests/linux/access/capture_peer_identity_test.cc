@@ -9,7 +9,6 @@
 #include <sys/socket.h>
 #include <sys/syscall.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
@@ -19,6 +18,7 @@
 #include <string>
 
 #include "support/access/entitlement_rules.h"
+#include "tests/helpers/threads/other_process.h"
 
 namespace spacekeep::access {
 namespace {
@@ -51,31 +51,16 @@ class Door {
   socklen_t bytes_ = 0;
 };
 
-/// A process that connects as another user and then waits to be told to end.
-class Visitor {
+/// A process that connects as another user.
+class Visitor : public test::OtherProcess {
  public:
-  Visitor(const Door& door, uid_t uid, gid_t gid, const std::vector<gid_t>& groups) {
-    pid_ = ::fork();
-    if (pid_ != 0) return;
-    const bool changed =
-        ::setgroups(groups.size(), groups.data()) == 0 && ::setgid(gid) == 0 && ::setuid(uid) == 0;
-    const int fd = changed ? door.enter() : -1;
-    char byte = 0;
-    (void)!::read(fd, &byte, 1);  // until the other end is closed
-    ::_exit(fd < 0 ? 1 : 0);
-  }
-  ~Visitor() { end(); }
-  [[nodiscard]] pid_t pid() const { return pid_; }
-  void end() {
-    if (pid_ > 0) {
-      ::kill(pid_, SIGKILL);
-      ::waitpid(pid_, nullptr, 0);
-    }
-    pid_ = -1;
-  }
-
- private:
-  pid_t pid_ = -1;
+  Visitor(const Door& door, uid_t uid, gid_t gid, const std::vector<gid_t>& groups)
+      : OtherProcess([&](int ready) {
+          const bool changed = ::setgroups(groups.size(), groups.data()) == 0 &&
+                               ::setgid(gid) == 0 && ::setuid(uid) == 0;
+          if (!changed || door.enter() < 0) ::_exit(1);
+          test::tellReady(ready);
+        }) {}
 };
 
 /// Makes the kernel answer this process as one that does not know the socket option.
@@ -98,14 +83,10 @@ bool holdsWithoutOption(unsigned option, bool (*claim)(const PeerIdentity& ident
   const Door door;
   const ipc::Descriptor entered(door.enter());
   const ipc::Descriptor accepted(door.accept());
-  const pid_t child = ::fork();
-  if (child == 0) {
+  return test::holdsInAnotherProcess([&] {
     const auto identity = forgetOption(option) ? capturePeerIdentity(accepted.fd()) : nullptr;
-    ::_exit(identity != nullptr && claim(*identity) ? 0 : 1);
-  }
-  int status = -1;
-  EXPECT_EQ(::waitpid(child, &status, 0), child);
-  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+    return identity != nullptr && claim(*identity);
+  });
 }
 
 /// User 4711 may purge, the unit may not.

@@ -6,10 +6,8 @@
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
-#include <csignal>
 #include <cstdlib>
 #include <filesystem>
 
@@ -119,43 +117,22 @@ std::uint64_t allocated(const std::string& path) {
   return allocatedBytes(facts);
 }
 
-Holder::Holder(const std::function<bool()>& hold) {
-  int ends[2];
-  EXPECT_EQ(::pipe2(ends, O_CLOEXEC), 0);
-  child_ = ::fork();
-  if (child_ == 0) {
-    // What this process has open at the moment would be held by the other one as well.
-    const auto answer = static_cast<unsigned>(ends[1]);
-    static_cast<void>(::close_range(3, answer - 1, 0));
-    static_cast<void>(::close_range(answer + 1, ~0U, 0));
-    const char good = hold() ? 'y' : 'n';
-    static_cast<void>(!::write(ends[1], &good, 1));
-    for (;;) ::pause();
-  }
-  char answer = 0;
-  EXPECT_EQ(::read(ends[0], &answer, 1), 1);
-  EXPECT_EQ(answer, 'y') << "the other process could not take hold";
-  ::close(ends[0]);
-  ::close(ends[1]);
-}
-
-Holder::~Holder() {
-  ::kill(child_, SIGKILL);
-  ::waitpid(child_, nullptr, 0);
-}
+Holder::Holder(const std::function<bool()>& hold)
+    : process_([&](int ready) {
+        // What the test has open at the moment would be held by the other process as well.
+        const auto kept = static_cast<unsigned>(ready);
+        static_cast<void>(::close_range(3, kept - 1, 0));
+        static_cast<void>(::close_range(kept + 1, ~0U, 0));
+        if (!hold()) ::_exit(1);
+        test::tellReady(ready);
+      }) {}
 
 bool becomeNobody() {
   return ::setresgid(kNobody, kNobody, kNobody) == 0 && ::setresuid(kNobody, kNobody, kNobody) == 0;
 }
 
 bool asAnother(const std::function<bool()>& become, const std::function<bool()>& body) {
-  // What it throws must not reach the test runner, which would go on in both processes.
-  const auto both = [&]() noexcept { return become() && body(); };
-  const pid_t child = ::fork();
-  if (child == 0) ::_exit(both() ? 0 : 1);
-  int status = 0;
-  EXPECT_EQ(::waitpid(child, &status, 0), child);
-  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+  return test::holdsInAnotherProcess([&] { return become() && body(); });
 }
 
 bool asNobody(const std::function<bool()>& body) { return asAnother(becomeNobody, body); }

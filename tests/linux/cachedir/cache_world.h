@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "services/cachedir/engine/cache_cleaner.h"
+#include "tests/helpers/threads/other_process.h"
 
 namespace spacekeep::cachedir {
 
@@ -54,12 +55,9 @@ std::uint64_t allocated(const std::string& path);
 class Holder {
  public:
   explicit Holder(const std::function<bool()>& hold);
-  ~Holder();
-  Holder(const Holder&) = delete;
-  Holder& operator=(const Holder&) = delete;
 
  private:
-  pid_t child_ = -1;
+  test::OtherProcess process_;
 };
 
 inline constexpr uid_t kNobody = 65534;

@@ -9,7 +9,6 @@
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <thread>
@@ -61,30 +60,22 @@ bool isThere(int fd) {
 }
 
 TEST_F(OpenFilesScan, WhatAProcessHoldsThatGoesOnWithoutItsMainThreadIsSeen) {
-  int ends[2];
-  ASSERT_EQ(::pipe(ends), 0);
-  const pid_t child = ::fork();
-  if (child == 0) {
+  test::OtherProcess process([this](int ready) {
     const int held = ::open(held_.c_str(), O_RDONLY);
     const int mapped = ::open(mapped_.c_str(), O_RDONLY);
     static_cast<void>(::mmap(nullptr, 4096, PROT_READ, MAP_PRIVATE, mapped, 0));
     ::close(mapped);
-    std::thread([held, &ends] {
+    std::thread([held, ready] {
       while (isThere(held)) ::sched_yield();
-      static_cast<void>(!::write(ends[1], "y", 1));
+      test::tellReady(ready);
       for (;;) ::pause();
     }).detach();
     ::syscall(SYS_exit, 0);
-  }
-  char ready = 0;
-  ASSERT_EQ(::read(ends[0], &ready, 1), 1);
+  });
   EXPECT_TRUE(holds(held_));
   EXPECT_TRUE(holds(mapped_));
-  ::kill(child, SIGKILL);
-  ::waitpid(child, nullptr, 0);
+  process.end();
   EXPECT_FALSE(holds(held_));
-  ::close(ends[0]);
-  ::close(ends[1]);
 }
 
 TEST_F(OpenFilesScan, WhatAThreadHoldsAmongDescriptorsOfItsOwnIsSeen) {

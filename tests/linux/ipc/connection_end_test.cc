@@ -3,11 +3,9 @@
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <poll.h>
-#include <signal.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <systemd/sd-id128.h>
 #include <unistd.h>
 
@@ -17,10 +15,14 @@
 #include <cstddef>
 
 #include "tests/helpers/log_capture.h"
+#include "tests/helpers/threads/other_process.h"
 #include "tests/linux/ipc/ipc_world.h"
 
 namespace spacekeep::ipc::test {
 namespace {
+
+using spacekeep::test::OtherProcess;
+using spacekeep::test::tellReady;
 
 struct Ends {
   std::atomic<int> invalidations{0};
@@ -77,43 +79,37 @@ TEST(ConnectionEnd, APeerThatClosesWhileItLivesIsToldWithoutWaitingForItsDeath) 
   EXPECT_TRUE(eventually([&] { return ends.invalidations == 1; }));
 }
 
-enum class Does { kServe, kNeverAccept };
-
-/// A process that listens at `path`, serves one connection and answers nothing, ended by a signal.
-class OtherProcess {
- public:
-  explicit OtherProcess(const std::string& path, Does does = Does::kServe) : pid_(::fork()) {
-    if (pid_ != 0) return;
-    std::string why;
-    const auto listening = bindListeningSocket(path, 0600, why);
-    while (does == Does::kNeverAccept) ::pause();
-    sd_bus* bus = nullptr;
-    int fd = -1;
-    while (fd < 0) fd = ::accept(listening->fd(), nullptr, nullptr);
-    sd_bus_new(&bus);
-    sd_bus_set_fd(bus, fd, fd);
-    sd_bus_set_server(bus, 1, sd_id128_t{{1}});
-    sd_bus_start(bus);
-    while (true) {
-      if (sd_bus_process(bus, nullptr) < 0) ::_exit(1);
-      sd_bus_wait(bus, 100'000);
-    }
+/// The work of a process that takes one connection at `path` and answers nothing.
+void serveOne(const std::string& path, int ready) {
+  std::string why;
+  const auto listening = bindListeningSocket(path, 0600, why);
+  if (listening == nullptr) ::_exit(1);
+  tellReady(ready);
+  sd_bus* bus = nullptr;
+  int fd = -1;
+  while (fd < 0) fd = ::accept(listening->fd(), nullptr, nullptr);
+  sd_bus_new(&bus);
+  sd_bus_set_fd(bus, fd, fd);
+  sd_bus_set_server(bus, 1, sd_id128_t{{1}});
+  sd_bus_start(bus);
+  while (true) {
+    if (sd_bus_process(bus, nullptr) < 0) ::_exit(1);
+    sd_bus_wait(bus, 100'000);
   }
-  ~OtherProcess() { end(); }
-  void end() {
-    if (pid_ <= 0) return;
-    ::kill(pid_, SIGKILL);
-    ::waitpid(pid_, nullptr, 0);
-    pid_ = -1;
-  }
+}
 
- private:
-  pid_t pid_;
-};
+/// The same for one that never takes a connection.
+void neverAccept(const std::string& path, int ready) {
+  std::string why;
+  const auto listening = bindListeningSocket(path, 0600, why);
+  if (listening == nullptr) ::_exit(1);
+  tellReady(ready);
+  while (true) ::pause();
+}
 
 TEST(ConnectionEnd, APeerWhoseProcessIsKilledIsAnInterruption) {
   const spacekeep::test::TemporaryDirectory directory;
-  OtherProcess service(directory / "service.sock");
+  OtherProcess service([&](int ready) { serveOne(directory / "service.sock", ready); });
   ConcurrentQueue global{{}};
   IpcLoop loop;
   Ends ends;
@@ -136,7 +132,7 @@ TEST(ConnectionEnd, APeerWhoseProcessIsKilledIsAnInterruption) {
 
 TEST(ConnectionEnd, APeerWhoseProcessIsKilledDuringAuthenticationIsAnInterruption) {
   const spacekeep::test::TemporaryDirectory directory;
-  OtherProcess service(directory / "service.sock", Does::kNeverAccept);
+  OtherProcess service([&](int ready) { neverAccept(directory / "service.sock", ready); });
   ConcurrentQueue global{{}};
   IpcLoop loop;
   Ends ends;

@@ -1,11 +1,8 @@
 #include "support/ipc/linux/peer_process.h"
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
-#include <signal.h>
 #include <sys/prctl.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <systemd/sd-daemon.h>
 #include <unistd.h>
 
@@ -18,10 +15,14 @@
 #include <string>
 #include <thread>
 
+#include "tests/helpers/threads/other_process.h"
 #include "tests/linux/ipc/ipc_world.h"
 
 namespace spacekeep::ipc::test {
 namespace {
+
+using spacekeep::test::OtherProcess;
+using spacekeep::test::tellReady;
 
 /// The name of this process as others see it, for a while.
 class ProcessName {
@@ -36,38 +37,6 @@ class ProcessName {
 
  private:
   std::array<char, 16> before_{};
-};
-
-/// A process that does `work`, which says when it is ready, and then nothing until it is ended.
-class OtherProcess {
- public:
-  explicit OtherProcess(const std::function<void(int ready)>& work) {
-    std::array<int, 2> ready{};
-    EXPECT_EQ(::pipe2(ready.data(), O_CLOEXEC), 0);
-    pid_ = ::fork();
-    if (pid_ == 0) {
-      work(ready[1]);
-      while (true) ::pause();
-    }
-    ::close(ready[1]);
-    char byte = 0;
-    EXPECT_EQ(::read(ready[0], &byte, 1), 1);
-    ::close(ready[0]);
-  }
-  ~OtherProcess() { end(); }
-  OtherProcess(const OtherProcess&) = delete;
-  OtherProcess& operator=(const OtherProcess&) = delete;
-
-  [[nodiscard]] pid_t pid() const { return pid_; }
-  void end() {
-    if (pid_ <= 0) return;
-    ::kill(pid_, SIGKILL);
-    ::waitpid(pid_, nullptr, 0);
-    pid_ = -1;
-  }
-
- private:
-  pid_t pid_ = -1;
 };
 
 /// What is said of the process at the other end of a socket, if it is said at once. `meanwhile` comes
@@ -102,7 +71,8 @@ void takeOver(int listening, int ready) {
   ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
   ::setenv("LISTEN_FDS", "1", 1);
   const auto taken = listeningSocketFromServiceManager();
-  if (taken == nullptr || ::write(ready, "x", 1) != 1) ::_exit(1);
+  if (taken == nullptr) ::_exit(1);
+  tellReady(ready);
   while (true) ::pause();
 }
 
@@ -136,7 +106,8 @@ void listenInAnotherThread(const std::string& path, int ready) {
   std::string why;
   static SharedDescriptor listening;  // of the process, whichever threads it has
   listening = bindListeningSocket(path, 0600, why);
-  if (listening == nullptr || ::write(ready, "x", 1) != 1) ::_exit(1);
+  if (listening == nullptr) ::_exit(1);
+  tellReady(ready);
   std::thread([] {
     while (true) ::pause();
   }).detach();

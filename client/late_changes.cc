@@ -19,12 +19,14 @@ void LateChanges::forget(const std::string& key) { changes_.erase(key); }
 
 void LateChanges::wereWritten() {
   for (auto change = changes_.begin(); change != changes_.end();) {
-    auto& [record, value] = change->second;
-    if (hasNoBytes(change->second)) {
+    Change& written = change->second;
+    if (hasNoBytes(written)) {
       ++change;
       continue;
     }
-    if (record) keepWritten(change->first, std::move(record), *value->data());
+    if (written.record && written.value) {
+      keepWritten(change->first, std::move(written.record), *written.value->data());
+    }
     change = changes_.erase(change);
   }
 }
@@ -37,19 +39,21 @@ LateChanges::Record LateChanges::recordAt(const std::string& key) const {
 const Value* LateChanges::find(const std::string& key, const Dictionary& state) {
   const auto found = changes_.find(key);
   if (found == changes_.end()) return state.find(key);
-  archive(found->second);
-  if (hasNoBytes(found->second)) return state.find(key);
-  return found->second.value ? &*found->second.value : nullptr;
+  Change& change = found->second;
+  archive(change);
+  if (hasNoBytes(change)) return state.find(key);
+  return change.value ? &*change.value : nullptr;
 }
 
 void LateChanges::layOver(Dictionary& state) {
-  for (auto& [key, change] : changes_) {
+  for (auto& entry : changes_) {
+    Change& change = entry.second;
     archive(change);
     if (hasNoBytes(change)) continue;
     if (change.value) {
-      state.set(key, *change.value);
+      state.set(entry.first, *change.value);
     } else {
-      state.remove(key);
+      state.remove(entry.first);
     }
   }
 }

@@ -106,7 +106,7 @@ SharedDescriptor bindListeningSocket(const std::string& path, mode_t mode, std::
     if (why.empty()) why = failure("cannot replace", path);
     return nullptr;
   }
-  const SharedDescriptor listening = newSocket();
+  SharedDescriptor listening = newSocket();
   // The permissions are set on the socket before it gets its name, so that it never stands there
   // with others (they are cut by the umask, hence once more by path).
   if (listening == nullptr || ::fchmod(listening->fd(), mode) != 0 ||

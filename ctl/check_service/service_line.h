@@ -26,7 +26,7 @@ class ServiceLine {
     std::string member;
     std::uint64_t sent_ticks = 0;
     std::uint64_t answered_ticks = 0;      ///< of the first answer
-    std::optional<ipc::Arguments> answer;  ///< of the described form
+    std::optional<ipc::Arguments> answer;  ///< of the form that the interface has
     std::optional<ipc::Error> error;  ///< the service answered with an error, or in another form
     unsigned answers = 0;
     bool lost = false;  ///< the connection ended before an answer came

@@ -21,7 +21,7 @@ namespace spacekeep::sim {
 
 enum class SystemEnd {
   kFinished,    ///< every call has ended and nothing is left to do
-  kSilentPing,  ///< the daemon waits for a ping that was never answered, as described
+  kSilentPing,  ///< the daemon waits for a ping that was never answered, as it does
   kDeadlock,    ///< somebody waits who ought not to
   kStuck,       ///< goes round in circles
 };

@@ -34,7 +34,7 @@
 // - A volume whose free space is read wrong: what the volume shows is the truth here.
 // - Two purges of clients that need the very same number of bytes: the log tells purges apart by it.
 //
-// One fault is described to block: a service that never answers its ping holds the registry, and
+// One fault is known to block: a service that never answers its ping holds the registry, and
 // with it everybody who needs that (Fault::kSilentPing; a connection that ends before the ping is
 // answered is the same thing). Runs without that fault let a service die only after its check-in
 // has been answered; runs with it end as SystemEnd::kSilentPing where that has come to pass.

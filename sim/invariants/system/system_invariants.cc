@@ -84,7 +84,7 @@ bool stoodStillOnPings(const SystemStory& story) {
   });
 }
 
-/// The one deadlock that there may be is the described one: a service that is silent to its ping.
+/// The one deadlock that there may be is the known one: a service that is silent to its ping.
 std::vector<Violation> judgeEnd(const SystemStory& story) {
   const SystemRun& run = story.run;
   const bool finished = run.end == SystemEnd::kFinished && run.blocked.empty();

@@ -79,6 +79,7 @@ TEST(ValueEquality, NearbyNumbersOfDifferentKindsAreNotEqual) {
   EXPECT_NE(Value(INT64_MIN), Value(kTwoTo63));
   EXPECT_NE(Value(UINT64_MAX), Value(2 * kTwoTo63));
   EXPECT_NE(Value(0u), Value(2 * kTwoTo63));
+  EXPECT_NE(Value(std::uint64_t{1} << 63), Value(2 * kTwoTo63));
   EXPECT_NE(Value(UINT64_MAX), Value(-1));
   EXPECT_NE(Value(1), Value(1.5));
   EXPECT_NE(Value(0), Value(std::nan("")));

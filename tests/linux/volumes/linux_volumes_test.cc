@@ -11,6 +11,7 @@
 #include <fstream>
 #include <thread>
 
+#include "tests/helpers/threads/other_process.h"
 #include "tests/linux/volumes/volume_world.h"
 
 namespace spacekeep {
@@ -75,6 +76,17 @@ TEST_P(OnFileSystem, OneThatIsMountedOverIsNotMeasured) {
     if (sample.volume == path) sizes.push_back(sample.space.size_bytes);
   }
   EXPECT_EQ(sizes, std::vector<std::uint64_t>{30 * kMiB});
+}
+
+TEST_P(OnFileSystem, OneThatCannotBeReachedAnyMoreIsNotMeasured) {
+  const std::string path = world_.mountFresh(GetParam(), "closed/v", 400);
+  EXPECT_TRUE(test::holdsInAnotherProcess([&] {
+    const bool was_there = holds(volumes_.getLocalVolumes(), path);
+    std::filesystem::permissions(world_.directory("closed"), std::filesystem::perms(0700));
+    if (!was_there || ::setuid(4711) != 0) return false;
+    const auto samples = volumes_.sampleLocalVolumes();
+    return std::ranges::find(samples, path, &VolumeSample::volume) == samples.end();
+  }));
 }
 
 TEST_P(OnFileSystem, WhatIsDeletedCountsAsPurgedOnlyOnceTheBlocksAreBack) {

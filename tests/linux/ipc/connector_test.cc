@@ -131,45 +131,5 @@ TEST_F(Declared, ADirectoryBehindASymbolicLinkIsNotTrusted) {
   EXPECT_EQ(through_link.connectionToDeclared("svc", testInterface()), nullptr);
 }
 
-TEST(BindListeningSocket, TakesThePlaceOfASocketThatNobodyServes) {
-  const spacekeep::test::TemporaryDirectory directory;
-  std::string why;
-  ASSERT_NE(bindListeningSocket(directory / "s", 0600, why), nullptr);
-  EXPECT_NE(bindListeningSocket(directory / "s", 0600, why), nullptr) << why;
-}
-
-TEST(BindListeningSocket, LeavesASocketThatIsServedAlone) {
-  const spacekeep::test::TemporaryDirectory directory;
-  std::string why;
-  const auto first = bindListeningSocket(directory / "s", 0600, why);
-  ASSERT_NE(first, nullptr);
-  EXPECT_EQ(bindListeningSocket(directory / "s", 0600, why), nullptr);
-  EXPECT_EQ(why, directory / "s" + " is served by another process already");
-  EXPECT_NE(connectSocket(directory / "s", why), nullptr);
-}
-
-TEST(BindListeningSocket, LeavesAFileAlone) {
-  const spacekeep::test::TemporaryDirectory directory;
-  const std::string file = directory.write("s", "content");
-  std::string why;
-  EXPECT_EQ(bindListeningSocket(file, 0600, why), nullptr);
-  EXPECT_EQ(why, file + " exists and is not a socket; remove it");
-}
-
-TEST(BindListeningSocket, GivesTheSocketExactlyItsMode) {
-  const spacekeep::test::TemporaryDirectory directory;
-  std::string why;
-  const auto listening = bindListeningSocket(directory / "s", 0666, why);
-  struct stat status {};
-  ASSERT_EQ(::stat((directory / "s").c_str(), &status), 0);
-  EXPECT_EQ(status.st_mode & 07777U, 0666U);
-}
-
-TEST(BindListeningSocket, RefusesAPathThatIsTooLong) {
-  std::string why;
-  EXPECT_EQ(bindListeningSocket("/tmp/" + std::string(200, 'x'), 0600, why), nullptr);
-  EXPECT_NE(why.find("1 to 107 bytes"), std::string::npos);
-}
-
 }  // namespace
 }  // namespace spacekeep::ipc::test

@@ -3,7 +3,6 @@
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <unistd.h>
 
 #include <string>
 #include <utility>
@@ -51,27 +50,6 @@ class ListenerTest : public ::testing::Test {
   ServerOptions options;
   SharedDescriptor listening = bindListeningSocket(directory / "s", 0600, why);
 };
-
-TEST(BindListeningSocket, TakesThePlaceOfASocketThatNobodyServesAnyMore) {
-  const spacekeep::test::TemporaryDirectory directory;
-  std::string why;
-  ASSERT_NE(bindListeningSocket(directory / "s", 0600, why), nullptr);  // and is closed at once
-  EXPECT_NE(bindListeningSocket(directory / "s", 0600, why), nullptr) << why;
-}
-
-TEST(BindListeningSocket, LeavesASocketAloneThatAnotherServesHoweverBusyItIs) {
-  const spacekeep::test::TemporaryDirectory directory;
-  std::string why;
-  const auto served = bindListeningSocket(directory / "s", 0600, why);
-  ASSERT_NE(served, nullptr) << why;
-  EXPECT_EQ(bindListeningSocket(directory / "s", 0600, why), nullptr);
-  EXPECT_EQ(why, directory / "s" + " is served by another process already");
-  ASSERT_EQ(::listen(served->fd(), 0), 0);
-  std::vector<SharedDescriptor> waiting;
-  while (auto socket = connectSocket(directory / "s", why)) waiting.push_back(std::move(socket));
-  EXPECT_EQ(bindListeningSocket(directory / "s", 0600, why), nullptr);
-  EXPECT_EQ(why, directory / "s" + " is served by another process already");
-}
 
 TEST_F(ListenerTest, RefusesPeersWithoutTheRequiredEntitlement) {
   spacekeep::test::LogCapture log;

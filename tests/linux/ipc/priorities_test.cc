@@ -1,12 +1,17 @@
 // Who is read first when many connections have something to say at once.
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 
 #include <algorithm>
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <memory>
+#include <string>
+#include <string_view>
 #include <vector>
 
+#include "tests/linux/ipc/bus_world.h"
 #include "tests/linux/ipc/busy_loop.h"
 #include "tests/linux/ipc/ipc_world.h"
 
@@ -59,9 +64,9 @@ TEST(Priorities, NoConnectionIsReadForMoreThanItsTurnWhileAnotherOneWaits) {
   }
 }
 
-/// Where in the order of serving a call of `quiet` comes that is sent once each of ten busy connections
-/// has had its turn and has most of its backlog left, counted from there.
-std::ptrdiff_t placeBehindBacklogs(TestServer& server, BareClient& quiet) {
+/// Where in the order of serving the call of kQuiet comes that `send` sends once each of ten busy
+/// connections has had its turn and has most of its backlog left, counted from there.
+std::ptrdiff_t placeBehindBacklogs(TestServer& server, const std::function<void()>& send) {
   std::vector<std::unique_ptr<BareClient>> clients;
   for (int i = 0; i < 10; ++i) clients.push_back(connected(server));
   const std::size_t served_first = server.numbers().size();
@@ -70,7 +75,7 @@ std::ptrdiff_t placeBehindBacklogs(TestServer& server, BareClient& quiet) {
   BusyLoop busy_again(server.loop, &busy);
   const std::size_t served_before = server.numbers().size();
   EXPECT_EQ(served_before, served_first + 10 * kTurn);
-  sendBriefly(quiet, kQuiet);
+  send();
   busy_again.letGo();
   EXPECT_TRUE(eventually([&] { return server.numbers().size() == served_first + 601; }));
   const std::vector<std::int32_t> numbers = server.numbers();
@@ -81,7 +86,7 @@ std::ptrdiff_t placeBehindBacklogs(TestServer& server, BareClient& quiet) {
 TEST(Priorities, AQuietConnectionIsReadBeforeTheBacklogsOfBusyOnes) {
   TestServer server;
   const auto quiet = connected(server);
-  EXPECT_LE(placeBehindBacklogs(server, *quiet), kTurn);
+  EXPECT_LE(placeBehindBacklogs(server, [&] { sendBriefly(*quiet, kQuiet); }), kTurn);
 }
 
 TEST(Priorities, ABusyConnectionThatWasServedToTheLastCountsAsQuietAgain) {
@@ -92,7 +97,26 @@ TEST(Priorities, ABusyConnectionThatWasServedToTheLastCountsAsQuietAgain) {
     for (int i = 0; i < kBacklog; ++i) sendBriefly(*once_busy, i);
   }
   ASSERT_TRUE(eventually([&] { return server.numbers().size() == kBacklog; }));
-  EXPECT_LE(placeBehindBacklogs(server, *once_busy), kTurn);
+  EXPECT_LE(placeBehindBacklogs(server, [&] { sendBriefly(*once_busy, kQuiet); }), kTurn);
+}
+
+TEST(Priorities, AConnectionWhoseCallComesInPiecesCountsAsQuiet) {
+  TestServer server;
+  const auto quiet = connected(server);
+  std::string body;
+  for (unsigned shift = 0; shift < 32; shift += 8)
+    body += static_cast<char>(kQuiet >> shift & 0xff);
+  const std::string call =
+      RawMessage().callOf("numberBriefly").text(8, 'g', "i").bytes(1, 1000, body);
+  const auto send = [fd = sd_bus_get_fd(quiet->bus())](std::string_view bytes) {
+    ASSERT_EQ(::send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL), bytes.size());
+  };
+  {
+    BusyLoop busy(server.loop);
+    send(std::string_view(call).substr(0, 40));
+    const BusyLoop after_one_look(server.loop, &busy);
+  }
+  EXPECT_LE(placeBehindBacklogs(server, [&] { send(std::string_view(call).substr(40)); }), kTurn);
 }
 
 TEST(Priorities, ACallOfAQuietClientDoesNotWaitForEverythingThatIsPosted) {

@@ -120,6 +120,17 @@ TEST(LowSpacePace, InodesAreAMeasureOfTheirOwn) {
   EXPECT_EQ(pauseOf(measures[1]), 20 * kSecond);  // 400,000 to spare at 20,000 a second
 }
 
+TEST(LowSpacePace, QuietEndsWithAChangeOfOneSixtyFourthOfTheThreshold) {
+  const auto measure = [](std::uint64_t available) {
+    return SpaceMeasure{.available = available, .total = 1'000'000, .low = 64'000};
+  };
+  MeasureHistory history = historyFrom(measure(500'000), 0);
+  recordLook(history, measure(500'999), kSecond, kSecond, {});
+  EXPECT_EQ(history.quiet_since_ns, 0U);
+  recordLook(history, measure(501'000), kSecond, 2 * kSecond, {});
+  EXPECT_EQ(history.quiet_since_ns, 2 * kSecond);
+}
+
 TEST(LowSpacePace, WhatWasUsedAndGainedAddsUp) {
   const SpaceMeasure before = bytes(2 * kGiB, 100 * kMiB);
   MeasureHistory history = historyFrom(before, 0);

@@ -226,22 +226,34 @@ TEST_F(FakeBrokerTest, WhoASenderIsIsAskedOnce) {
   EXPECT_EQ(asked, 2);
 }
 
-TEST_F(FakeBrokerTest, WhoWasQuietForLongestIsForgottenForANewCaller) {
-  callers = 2;
-  serve();
-  int asked = 0;
-  broker.setCredentials([&asked](sd_bus_message* answer) {
-    ++asked;
-    EXPECT_GE(sd_bus_message_append(answer, "a{sv}", 1, "UnixUserID", "u", 0), 0);
-  });
-  for (const char* caller : {":1.7", ":1.8", ":1.7", ":1.9"}) {
-    EXPECT_EQ(broker.numberFrom(caller), "") << caller;
+/// There is room for two callers: `first` and `second` call, `first` again, then a third one.
+class RoomForTwoCallers : public FakeBrokerTest {
+ protected:
+  void expectThatTheSecondIsForgotten(const char* first, const char* second) {
+    callers = 2;
+    serve();
+    int asked = 0;
+    broker.setCredentials([&asked](sd_bus_message* answer) {
+      ++asked;
+      EXPECT_GE(sd_bus_message_append(answer, "a{sv}", 1, "UnixUserID", "u", 0), 0);
+    });
+    for (const char* caller : {first, second, first, ":1.9"}) {
+      EXPECT_EQ(broker.numberFrom(caller), "") << caller;
+    }
+    EXPECT_EQ(asked, 3);
+    EXPECT_EQ(broker.numberFrom(first), "");
+    EXPECT_EQ(asked, 3);
+    EXPECT_EQ(broker.numberFrom(second), "");
+    EXPECT_EQ(asked, 4);
   }
-  EXPECT_EQ(asked, 3);
-  EXPECT_EQ(broker.numberFrom(":1.7"), "");
-  EXPECT_EQ(asked, 3);
-  EXPECT_EQ(broker.numberFrom(":1.8"), "");
-  EXPECT_EQ(asked, 4);
+};
+
+TEST_F(RoomForTwoCallers, WhoWasQuietForLongestIsForgottenForANewOne) {
+  expectThatTheSecondIsForgotten(":1.7", ":1.8");
+}
+
+TEST_F(RoomForTwoCallers, WhoWasQuietForLongestIsForgottenInWhicheverOrderTheirNamesStand) {
+  expectThatTheSecondIsForgotten(":1.8", ":1.7");
 }
 
 TEST_F(FakeBrokerTest, AnAnswerThatSomebodyElseSendsCountsForNothing) {

@@ -394,6 +394,22 @@ TEST(PlistBinary, CyclesAndUnfoldingAreBounded) {
   EXPECT_EQ(refusal(document(shared_text)), "not a property list: it unfolds to too many bytes");
 }
 
+/// An array that names one text 512 times.
+Bytes textNamedOften(std::size_t text_bytes) {
+  std::vector<Bytes> objects{{0xaf, 0x11, 0x02, 0x00}, {0x5f, 0x11}};
+  objects[0].insert(objects[0].end(), 512, 1);
+  objects[1].push_back(static_cast<std::uint8_t>(text_bytes >> 8));
+  objects[1].push_back(static_cast<std::uint8_t>(text_bytes & 0xff));
+  objects[1].insert(objects[1].end(), text_bytes, 'x');
+  return document(objects);
+}
+
+TEST(PlistBinary, UnfoldsToSixteenMebibytesAndNotAByteMore) {
+  // With the byte that each name takes: 512 times 32 KiB.
+  EXPECT_EQ(refusal(textNamedOften(32'767)), "accepted");
+  EXPECT_EQ(refusal(textNamedOften(32'768)), "not a property list: it unfolds to too many bytes");
+}
+
 TEST(PlistBinary, EveryPrefixOfADocumentIsRefused) {
   const Bytes whole =
       binaryPlist(Dictionary{{"a", Array{1, UINT64_MAX, "text"}}, {"b", Date{5}}, {"c", 0.5}});

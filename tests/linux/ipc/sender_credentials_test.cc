@@ -93,6 +93,27 @@ TEST_F(Credentials, TheLabelComesWithoutItsZero) {
   EXPECT_FALSE(peer->unclear().label);
 }
 
+/// With a label of that many letters.
+std::function<void(sd_bus_message*)> labelOf(std::size_t letters) {
+  return [letters](sd_bus_message* answer) {
+    add(answer, "UnixUserID", "u", 7);
+    const std::string label(letters, 'l');
+    EXPECT_GE(sd_bus_message_open_container(answer, 'e', "sv"), 0);
+    EXPECT_GE(sd_bus_message_append(answer, "s", "LinuxSecurityLabel"), 0);
+    EXPECT_GE(sd_bus_message_open_container(answer, 'v', "ay"), 0);
+    EXPECT_GE(sd_bus_message_append_array(answer, 'y', label.data(), label.size()), 0);
+    EXPECT_GE(sd_bus_message_close_container(answer), 0);
+    EXPECT_GE(sd_bus_message_close_container(answer), 0);
+  };
+}
+
+TEST_F(Credentials, ALabelHasAtMostFourKibibytes) {
+  const auto peer = identity(labelOf(4096));
+  ASSERT_NE(peer, nullptr);
+  EXPECT_EQ(peer->label(), std::string(4096, 'l'));
+  EXPECT_EQ(identity(labelOf(4097)), nullptr);
+}
+
 TEST_F(Credentials, FactsThatNobodyKnowsAreSkipped) {
   const auto peer = identity([](sd_bus_message* answer) {
     add(answer, "Containers", "a{sv}", 1, "Name", "s", "box");

@@ -53,6 +53,36 @@ TEST(HostilePeer, ClaimingToBeSomebodyElseIsRejected) {
   expectHonestClientIsServed(server);
 }
 
+/// What comes next, up to a line end.
+std::string nextLine(const RawPeer& peer) {
+  std::string line;
+  EXPECT_TRUE(eventually([&] {
+    char byte = 0;
+    while (::recv(peer.fd(), &byte, 1, MSG_DONTWAIT) == 1) {
+      line += byte;
+      if (byte == '\n') return true;
+    }
+    return false;
+  })) << line;
+  return line;
+}
+
+TEST(HostilePeer, WhoWasRejectedOrHasCancelledHasToBeginAnew) {
+  TestServer server;
+  for (const std::string_view ends_it : {"DATA 34323934393637323934\r\n"sv, "CANCEL\r\n"sv}) {
+    RawPeer peer(server.path());
+    ASSERT_TRUE(peer.send("\0AUTH EXTERNAL\r\n"sv));
+    EXPECT_EQ(nextLine(peer), "DATA\r\n");
+    ASSERT_TRUE(peer.send(ends_it));
+    EXPECT_EQ(nextLine(peer), "REJECTED EXTERNAL\r\n");
+    ASSERT_TRUE(peer.send("DATA\r\n"sv));
+    EXPECT_EQ(nextLine(peer), "ERROR\r\n") << ends_it;
+    ASSERT_TRUE(peer.send("AUTH EXTERNAL\r\nDATA\r\n"sv));
+    EXPECT_EQ(nextLine(peer), "DATA\r\n");
+    EXPECT_EQ(nextLine(peer).substr(0, 3), "OK ");
+  }
+}
+
 TEST(HostilePeer, HalfAnAuthenticationIsCutOffInTime) {
   spacekeep::test::LogCapture log;
   ServerOptions short_limit = options();

@@ -20,7 +20,7 @@ void LateChanges::forget(const std::string& key) { changes_.erase(key); }
 void LateChanges::wereWritten() {
   for (auto change = changes_.begin(); change != changes_.end();) {
     Change& written = change->second;
-    if (hasNoBytes(written)) {
+    if (hasNoBytes(written) || (written.record && !written.value)) {
       ++change;
       continue;
     }

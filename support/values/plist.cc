@@ -169,11 +169,22 @@ std::optional<Value> valueOf(plist_t node, int depth) {
   return std::nullopt;
 }
 
+bool isPlainCharacter(char character) {
+  const auto byte = static_cast<unsigned char>(character);
+  return byte > 0 && byte < 0x80;
+}
+
 // The library takes C strings and drops what is not UTF-8; this way the place of what cannot be
-// kept stays visible.
+// kept stays visible. Nearly all text is ASCII and goes in runs: others wait while the state is
+// written.
 std::string storable(std::string_view text) {
   std::string out;
+  out.reserve(text.size());
   while (!text.empty()) {
+    const std::string_view plain(text.begin(), std::ranges::find_if_not(text, isPlainCharacter));
+    out += plain;
+    text.remove_prefix(plain.size());
+    if (text.empty()) break;
     const std::size_t length = utf8SequenceLength(text);
     const bool keep = length > 0 && text[0] != '\0';
     out += keep ? text.substr(0, length) : "\xef\xbf\xbd";

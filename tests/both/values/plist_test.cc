@@ -295,6 +295,8 @@ TEST(PlistBinary, CharactersThatCannotBeKeptAreMarked) {
   EXPECT_EQ(roundTrip(Value(std::string("a\0b", 3))), Value("a\xef\xbf\xbd"
                                                             "b"));
   EXPECT_EQ(roundTrip(Value("x\xff")), Value("x\xef\xbf\xbd"));
+  EXPECT_EQ(roundTrip(Value("plain, d\xc3\xa9j\xc3\xa0 vu, \xff\xc3, plain again\x7f")),
+            Value("plain, d\xc3\xa9j\xc3\xa0 vu, \xef\xbf\xbd\xef\xbf\xbd, plain again\x7f"));
 }
 
 TEST(PlistBinary, WhatCouldNotBeReadBackIsNotWritten) {

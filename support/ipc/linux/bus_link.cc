@@ -271,7 +271,8 @@ bool BusLink::readJudged() {
   const int progress = sd_bus_process(bus_, nullptr);
   if (ended_) return false;
   if (progress < 0) {
-    end(LinkEnd::kRefused, std::string("its messages cannot be read: ") + std::strerror(-progress));
+    // It may have been writing just then.
+    end(LinkEnd::kRefused, std::string("it cannot be spoken with: ") + std::strerror(-progress));
     return false;
   }
   if (sd_bus_is_open(bus_) <= 0) {
